@@ -1,0 +1,22 @@
+# fileindex_add_test(NAME <name> SOURCES <files...> [LABELS <labels...>] [LIBS <libs...>])
+# Builds one GoogleTest binary and registers each of its tests with ctest, so
+# ctest -j runs them in parallel. Labels: "unit" runs in the sanitizer build
+# too; "integration" starts real processes; "slow" marks the few long ones.
+find_package(GTest REQUIRED)
+include(GoogleTest)
+
+function(fileindex_add_test)
+  cmake_parse_arguments(T "" "NAME;TIMEOUT" "SOURCES;LABELS;LIBS" ${ARGN})
+  add_executable(${T_NAME} ${T_SOURCES})
+  target_link_libraries(${T_NAME} PRIVATE fileindex GTest::gtest GTest::gmock GTest::gtest_main ${T_LIBS})
+  if(NOT T_LABELS)
+    set(T_LABELS unit)
+  endif()
+  if(NOT T_TIMEOUT)
+    set(T_TIMEOUT 120)
+  endif()
+  gtest_discover_tests(${T_NAME}
+    DISCOVERY_MODE PRE_TEST
+    PROPERTIES LABELS "${T_LABELS}" TIMEOUT ${T_TIMEOUT}
+      ENVIRONMENT "FILEINDEX_BUILD_DIR=${PROJECT_BINARY_DIR};FILEINDEX_SOURCE_DIR=${PROJECT_SOURCE_DIR}")
+endfunction()

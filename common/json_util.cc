@@ -1,0 +1,148 @@
+#include "common/json_util.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <fstream>
+#include <memory>
+#include <sstream>
+
+#include "common/error.h"
+#include "common/file_util.h"
+
+namespace corvlumex {
+
+template <>
+bool isJsonType<std::string>(const Json::Value& value) { return value.isConvertibleTo(Json::stringValue); }
+template <>
+bool isJsonType<bool>(const Json::Value& value) { return value.isConvertibleTo(Json::booleanValue); }
+template <>
+bool isJsonType<int>(const Json::Value& value) { return value.isConvertibleTo(Json::intValue); }
+template <>
+bool isJsonType<unsigned int>(const Json::Value& value) { return value.isConvertibleTo(Json::uintValue); }
+// Deliberately strict: reals and strings are never 64-bit integers.
+template <>
+bool isJsonType<long long>(const Json::Value& value) {
+  return value.type() == Json::intValue || value.type() == Json::uintValue;
+}
+template <>
+bool isJsonType<double>(const Json::Value& value) { return value.isConvertibleTo(Json::realValue); }
+
+template <>
+std::string asJsonType<std::string>(const Json::Value& value) { return value.asString(); }
+template <>
+bool asJsonType<bool>(const Json::Value& value) { return value.asBool(); }
+template <>
+int asJsonType<int>(const Json::Value& value) { return value.asInt(); }
+template <>
+unsigned int asJsonType<unsigned int>(const Json::Value& value) { return value.asUInt(); }
+template <>
+long long asJsonType<long long>(const Json::Value& value) { return value.asInt64(); }
+template <>
+double asJsonType<double>(const Json::Value& value) { return value.asDouble(); }
+
+std::string AppendData(const Json::Value& data) { return ", data=" + JsonToString(data); }
+
+namespace {
+
+// Steps shared by every instance: the object test and the required-key test.
+// Returns false when a non-required key is absent.
+bool CheckMember(const Json::Value& data, const std::string& key, bool required) {
+  if (!data.isObject() && !data.isNull()) throw Error(kErrorBadArgument, "Not an object" + AppendData(data));
+  const bool present = data.isMember(key);
+  if (required && !present) throw Error(kErrorBadArgument, "Missing property: " + key + AppendData(data));
+  return present;
+}
+
+}  // namespace
+
+template <typename T>
+void GetJsonValue(T& out, const Json::Value& data, const std::string& key, bool required) {
+  if (!CheckMember(data, key, required)) return;
+  const Json::Value& member = data[key];
+  if (!isJsonType<T>(member)) {
+    // One text for every type, numbers and booleans included.
+    if (required) throw Error(kErrorBadArgument, "Not a string" + AppendData(data));
+    return;
+  }
+  out = asJsonType<T>(member);
+}
+
+template <>
+void GetJsonValue<Json::Value>(Json::Value& out, const Json::Value& data, const std::string& key, bool required) {
+  if (!CheckMember(data, key, required)) return;
+  out = data[key];
+}
+
+template void GetJsonValue<std::string>(std::string&, const Json::Value&, const std::string&, bool);
+template void GetJsonValue<bool>(bool&, const Json::Value&, const std::string&, bool);
+template void GetJsonValue<int>(int&, const Json::Value&, const std::string&, bool);
+template void GetJsonValue<unsigned int>(unsigned int&, const Json::Value&, const std::string&, bool);
+template void GetJsonValue<long long>(long long&, const Json::Value&, const std::string&, bool);
+template void GetJsonValue<double>(double&, const Json::Value&, const std::string&, bool);
+
+void JsonApplyChanges(Json::Value& target, const Json::Value& changes) {
+  for (auto it = changes.begin(); it != changes.end(); ++it) {
+    const std::string key = it.name();
+    const Json::Value& change = *it;
+    if (change.isNull()) {
+      if (target.isObject()) target.removeMember(key);
+    } else if (change.isObject()) {
+      // The member is created before the recursion, so {"o": {}} leaves "o": null.
+      JsonApplyChanges(target[key], change);
+    } else {
+      target[key] = change;
+    }
+  }
+}
+
+template <>
+Json::Value Vec2JsonArr<std::string>(const std::vector<std::string>& values) {
+  Json::Value array(Json::arrayValue);
+  for (const std::string& value : values) array.append(value);
+  return array;
+}
+
+template <>
+std::vector<std::string> JsonArr2Vec<std::string>(const Json::Value& array) {
+  std::vector<std::string> values;
+  if (!array.isArray()) return values;
+  for (const Json::Value& element : array) {
+    if (isJsonType<std::string>(element)) values.push_back(element.asString());
+  }
+  return values;
+}
+
+bool JsonFromString(Json::Value& value, const std::string& text) {
+  Json::CharReaderBuilder builder;
+  builder["collectComments"] = false;
+  const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
+  Json::Value parsed;
+  std::string errors;
+  if (!reader->parse(text.data(), text.data() + text.size(), &parsed, &errors)) return false;
+  value.swap(parsed);
+  return true;
+}
+
+bool JsonFromFile(Json::Value& value, const std::string& path) {
+  std::ifstream input(path, std::ios::binary);
+  if (!input) return false;
+  std::ostringstream content;
+  content << input.rdbuf();
+  if (input.bad()) return false;
+  return JsonFromString(value, content.str());
+}
+
+bool JsonToFile(const Json::Value& value, const std::string& path, mode_t mode) {
+  return WriteFileAtomically(path, JsonToString(value) + "\n", mode);
+}
+
+std::string JsonToString(const Json::Value& value) {
+  Json::StreamWriterBuilder builder;
+  builder["indentation"] = "";
+  builder["emitUTF8"] = true;
+  return Json::writeString(builder, value);
+}
+
+}  // namespace corvlumex

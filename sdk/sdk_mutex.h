@@ -1,0 +1,13 @@
+// The one process-wide mutex that serialises calls into the platform's share
+// and user services, which are not thread-safe.
+#pragma once
+
+#include "common/mutex.h"
+
+namespace corvlumex {
+namespace sdk {
+
+Mutex& SDKMutex();
+
+}  // namespace sdk
+}  // namespace corvlumex

@@ -1,0 +1,92 @@
+#include <gtest/gtest.h>
+
+#include <cerrno>
+
+#include "common/error.h"
+#include "common/log.h"
+#include "tests/support/log_capture.h"
+
+namespace corvlumex {
+namespace {
+
+using testing_support::LogCapture;
+
+TEST(ErrorTest, MessageWithoutReasonHasNoBrackets) {
+  EXPECT_STREQ(Error(kErrorSystem).what(), "CorvLumex error, code=502");
+  EXPECT_TRUE(Error(kErrorSystem).reason.empty());
+  EXPECT_STREQ(Error(kErrorUnexpected).what(), "CorvLumex error, code=9999");
+}
+
+TEST(ErrorTest, ReasonIsCopiedUnchangedInsideBrackets) {
+  const Error error(kErrorMalformedEvent, "Malformed event_raw: a]b");
+  EXPECT_STREQ(error.what(), "CorvLumex error, code=906, reason=[Malformed event_raw: a]b]");
+  const Error copy(error);
+  EXPECT_EQ(copy.code, kErrorMalformedEvent);
+  EXPECT_EQ(copy.reason, "Malformed event_raw: a]b");
+  EXPECT_STREQ(copy.what(), error.what());
+}
+
+void FailWhen(bool condition) { CORV_CHECK_THROW(condition, kErrorNoSpace, "Share (s) space not enough"); }
+
+TEST(CheckThrowTest, LogsOnceThenThrowsWithoutErrnoPart) {
+  LogCapture log;
+  errno = 0;
+  FailWhen(false);
+  EXPECT_TRUE(log.Lines().empty());
+  try {
+    FailWhen(true);
+    FAIL() << "no throw";
+  } catch (const Error& error) {
+    EXPECT_EQ(error.code, kErrorNoSpace);
+  }
+  ASSERT_EQ(log.Lines().size(), 1u);
+  const std::string line = log.Lines()[0];
+  EXPECT_NE(line.find("error_log_test.cc:"), std::string::npos) << line;
+  EXPECT_NE(line.find(") (FailWhen) Failed [condition], reason: Share (s) space not enough"), std::string::npos)
+      << line;
+  EXPECT_EQ(line.find("[err:"), std::string::npos) << line;
+}
+
+TEST(CheckThrowTest, ErrnoIsShownAndCleared) {
+  LogCapture log;
+  errno = ENOENT;
+  EXPECT_THROW(FailWhen(true), Error);
+  EXPECT_EQ(errno, 0);
+  ASSERT_EQ(log.Lines().size(), 1u);
+  const std::string line = log.Lines()[0];
+  EXPECT_NE(line.find(" [err: No such file or directory]"), std::string::npos) << line;
+  EXPECT_EQ(line.rfind("]"), line.size() - 1);
+}
+
+void FailWithText() { CORV_CHECK_THROW_TEXT(true, "0 > Something(x)", kErrorSystem); }
+
+TEST(CheckThrowTest, ExplicitConditionTextAndCodeOnlyError) {
+  LogCapture log;
+  errno = 0;
+  try {
+    FailWithText();
+  } catch (const Error& error) {
+    EXPECT_STREQ(error.what(), "CorvLumex error, code=502");
+  }
+  ASSERT_EQ(log.Lines().size(), 1u);
+  EXPECT_NE(log.Lines()[0].find("(FailWithText) Failed [0 > Something(x)], reason: "), std::string::npos);
+}
+
+TEST(LogTest, PlainAndFunctionLinesFollowTheErrnoRule) {
+  LogCapture log;
+  errno = 0;
+  CORV_LOG("Remove share %s from folder mgr", "music");
+  errno = EACCES;
+  CORV_LOG_FAILED("KLIBServiceStart(x)");
+  EXPECT_EQ(errno, 0);
+  const auto lines = log.Lines();
+  ASSERT_EQ(lines.size(), 2u);
+  EXPECT_NE(lines[0].find("error_log_test.cc:"), std::string::npos);
+  EXPECT_NE(lines[0].find(" Remove share music from folder mgr"), std::string::npos);
+  EXPECT_NE(lines[1].find("Failed [KLIBServiceStart(x)] [err: Permission denied]"), std::string::npos) << lines[1];
+}
+
+TEST(LogTest, LogLevelStartsAtDebug) { EXPECT_EQ(fileindex::log_level, 7); }
+
+}  // namespace
+}  // namespace corvlumex
