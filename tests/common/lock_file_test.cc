@@ -1,0 +1,124 @@
+#include <dirent.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <thread>
+
+#include "common/error.h"
+#include "common/lock_file.h"
+#include "common/sys.h"
+#include "tests/support/log_capture.h"
+
+namespace corvlumex {
+namespace {
+
+using testing_support::LogCapture;
+using testing_support::SandboxRoot;
+using testing_support::SleepRecorder;
+
+int OpenDescriptors() {
+  int count = 0;
+  DIR* dir = opendir("/proc/self/fd");
+  while (readdir(dir) != nullptr) ++count;
+  closedir(dir);
+  return count;
+}
+
+TEST(LockFileTest, MissingFileIsCreatedAndKept) {
+  SandboxRoot root(false);
+  const std::string path = root.path() + "/cfg.lock";
+  { LockFile lock(path, true); }
+  struct stat st;
+  ASSERT_EQ(stat(path.c_str(), &st), 0);
+  EXPECT_TRUE(S_ISREG(st.st_mode));
+}
+
+TEST(LockFileTest, SharedLocksCoexist) {
+  SandboxRoot root(false);
+  const std::string path = root.path() + "/cfg.lock";
+  SleepRecorder sleeps;
+  LockFile first(path, false);
+  LockFile second(path, false);
+  EXPECT_TRUE(sleeps.Sleeps().empty());
+}
+
+// Not reentrant: a second exclusive lock in the same process retries 64
+// times, sleeping after every attempt (also the last), then gives up.
+TEST(LockFileTest, GivesUpAfter64AttemptsWithoutLeakingDescriptors) {
+  SandboxRoot root(false);
+  const std::string path = root.path() + "/cfg.lock";
+  SleepRecorder sleeps;
+  LockFile held(path, true);
+  const int before = OpenDescriptors();
+  try {
+    LockFile again(path, true);
+    FAIL() << "second exclusive lock succeeded";
+  } catch (const Error& error) {
+    EXPECT_EQ(error.code, kErrorLockFile);
+    EXPECT_EQ(error.reason, "Exceed max retry, path=" + path);
+  }
+  EXPECT_EQ(OpenDescriptors(), before);
+  const auto recorded = sleeps.Sleeps();
+  ASSERT_EQ(recorded.size(), 64u);
+  for (auto duration : recorded) {
+    EXPECT_EQ(duration.count() % 100000, 0);
+    EXPECT_LE(duration.count(), 900000);
+  }
+}
+
+TEST(LockFileTest, OpenFailureIsLoggedAndThrown) {
+  SandboxRoot root(false);
+  LogCapture log;
+  const std::string path = root.path() + "/no/such/dir/cfg.lock";
+  try {
+    LockFile lock(path, true);
+    FAIL();
+  } catch (const Error& error) {
+    EXPECT_EQ(error.code, kErrorLockFile);
+    EXPECT_EQ(error.reason, "open failed, path=" + path + ", reason=No such file or directory");
+  }
+  const auto lines = log.Lines();
+  ASSERT_EQ(lines.size(), 1u);
+  EXPECT_NE(lines[0].find("(LockFile) Failed [0 > (fd_ = open(path_.c_str(), O_RDONLY | O_CREAT, 0644))], "
+                          "reason: open failed, path="),
+            std::string::npos)
+      << lines[0];
+  EXPECT_NE(lines[0].find(" [err: No such file or directory]"), std::string::npos);
+}
+
+// Two processes: the second waits (really sleeping) until the first lets go.
+TEST(LockFileTest, SecondProcessGetsTheLockOnceTheFirstReleasesIt) {
+  SandboxRoot root(false);
+  const std::string path = root.path() + "/cfg.lock";
+  const std::string marker = root.path() + "/marker";
+  int ready[2];
+  ASSERT_EQ(pipe(ready), 0);
+  const pid_t holder = fork();
+  ASSERT_GE(holder, 0);
+  if (holder == 0) {
+    LockFile lock(path, true);
+    if (write(ready[1], "x", 1) != 1) _exit(2);
+    std::this_thread::sleep_for(std::chrono::milliseconds(300));
+    FILE* file = fopen(marker.c_str(), "w");
+    if (file) fclose(file);
+    _exit(0);
+  }
+  char byte;
+  ASSERT_EQ(read(ready[0], &byte, 1), 1);
+  {
+    LockFile lock(path, true);
+    // The holder wrote the marker before releasing: we cannot be earlier.
+    EXPECT_EQ(access(marker.c_str(), F_OK), 0);
+  }
+  int status = 0;
+  waitpid(holder, &status, 0);
+  EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
+  close(ready[0]);
+  close(ready[1]);
+}
+
+}  // namespace
+}  // namespace corvlumex
