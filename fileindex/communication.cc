@@ -1,11 +1,14 @@
 #include "fileindex/communication.h"
 
+#include <signal.h>
 #include <sys/socket.h>
 #include <sys/un.h>
+#include <time.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <chrono>
+#include <cstdint>
 #include <cstring>
 #include <vector>
 
@@ -38,6 +41,7 @@ void TransferAll(int fd, unsigned int size, Transfer transfer, const char* what)
   }
 }
 
+// Closes the descriptor on every way out of SendCommandToDaemon.
 class Socket {
  public:
   explicit Socket(int fd) : fd_(fd) {}
@@ -48,6 +52,43 @@ class Socket {
 
  private:
   int fd_;
+};
+
+// The library is called from programs that may not ignore SIGPIPE (a web
+// handler, a hook). A daemon that drops the connection must give them an
+// Error 502 "write failed", not kill them: SIGPIPE is blocked in this thread
+// while the command is sent, and one raised meanwhile is consumed.
+class SigpipeBlock {
+ public:
+  SigpipeBlock() {
+    sigemptyset(&pipe_set_);
+    sigaddset(&pipe_set_, SIGPIPE);
+    sigset_t pending;
+    sigpending(&pending);
+    was_pending_ = sigismember(&pending, SIGPIPE) == 1;
+    blocked_ = pthread_sigmask(SIG_BLOCK, &pipe_set_, &old_mask_) == 0;
+  }
+  ~SigpipeBlock() {
+    if (!blocked_) return;
+    const int saved_errno = errno;
+    sigset_t pending;
+    sigpending(&pending);
+    if (!was_pending_ && sigismember(&pending, SIGPIPE) == 1) {
+      const struct timespec no_wait = {0, 0};
+      while (sigtimedwait(&pipe_set_, nullptr, &no_wait) < 0 && errno == EINTR) {
+      }
+    }
+    pthread_sigmask(SIG_SETMASK, &old_mask_, nullptr);
+    errno = saved_errno;
+  }
+  SigpipeBlock(const SigpipeBlock&) = delete;
+  SigpipeBlock& operator=(const SigpipeBlock&) = delete;
+
+ private:
+  sigset_t pipe_set_;
+  sigset_t old_mask_;
+  bool was_pending_ = false;
+  bool blocked_ = false;
 };
 
 }  // namespace
@@ -90,7 +131,9 @@ void SendCommandToDaemon(const std::string& command, const Json::Value& data) {
   memset(&address, 0, sizeof(address));
   address.sun_family = AF_UNIX;
   const std::string path = SysPath("/var/run/fileindexd.sock");
-  strncpy(address.sun_path, path.c_str(), sizeof(address.sun_path) - 1);
+  // A cut path would reach some other socket, or none: say so instead.
+  CORV_CHECK_THROW(path.size() >= sizeof(address.sun_path), kErrorSystem, "socket path too long, path=" + path);
+  memcpy(address.sun_path, path.c_str(), path.size());
   // The daemon may not be listening yet; a failed connect is not an error of
   // its own: the first write reports it.
   for (int attempt = 1; attempt <= kConnectAttempts; ++attempt) {
@@ -105,6 +148,7 @@ void SendCommandToDaemon(const std::string& command, const Json::Value& data) {
                         "0 > setsockopt(fd_socket, SOL_SOCKET, SO_SNDTIMEO, (char *)&timeout, sizeof(timeout))",
                         kErrorSystem, std::string("setsockopt failed, reason=") + strerror(errno));
 
+  const SigpipeBlock no_sigpipe;
   Json::Value request(Json::objectValue);
   request["type"] = command;
   request["data"] = data;

@@ -1,0 +1,389 @@
+#include <dirent.h>
+#include <signal.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <gtest/gtest.h>
+
+#include <cerrno>
+#include <cstring>
+#include <string>
+#include <vector>
+
+#include "common/error.h"
+#include "common/json_util.h"
+#include "common/sys.h"
+#include "fileindex/communication.h"
+#include "tests/state/fake_daemon.h"
+#include "tests/state/syscall_script.h"
+#include "tests/support/log_capture.h"
+
+namespace corvlumex {
+namespace fileindex {
+namespace {
+
+using testing_support::FakeDaemon;
+using testing_support::LogCapture;
+using testing_support::SandboxRoot;
+using testing_support::ScopedSyscallScript;
+using testing_support::SleepRecorder;
+using testing_support::SyscallScript;
+
+constexpr int P = SyscallScript::kPass;
+constexpr int E = -EINTR;
+
+int OpenDescriptors() {
+  int count = 0;
+  DIR* dir = opendir("/proc/self/fd");
+  while (readdir(dir) != nullptr) ++count;
+  closedir(dir);
+  return count;
+}
+
+std::string DaemonSocket() { return SysPath("/var/run/fileindexd.sock"); }
+
+// Error reason of `fn`, or "no throw".
+template <typename Fn>
+std::string ReasonOf(Fn fn, int expected_code = kErrorSystem) {
+  try {
+    fn();
+  } catch (const Error& error) {
+    EXPECT_EQ(error.code, expected_code) << error.what();
+    return error.reason;
+  }
+  return "no throw";
+}
+
+class Pipe {
+ public:
+  Pipe() {
+    int fds[2];
+    EXPECT_EQ(socketpair(AF_UNIX, SOCK_STREAM, 0, fds), 0);
+    read_end = fds[0];
+    write_end = fds[1];
+  }
+  ~Pipe() {
+    close(read_end);
+    close(write_end);
+  }
+  int read_end, write_end;
+};
+
+// --- BufferRead / BufferWrite ---
+
+TEST(BufferTransfer, ChunksOfAtMost1024Bytes) {
+  Pipe pipe;
+  const std::vector<unsigned char> data(3000, 'x');
+  SyscallScript script;
+  {
+    ScopedSyscallScript scope(&script);
+    BufferWrite(pipe.write_end, data.size(), data.data());
+  }
+  EXPECT_EQ(script.write_sizes, (std::vector<unsigned long>{1024, 1024, 952}));
+  std::vector<unsigned char> back(3000);
+  {
+    ScopedSyscallScript scope(&script);
+    BufferRead(pipe.read_end, back.size(), back.data());
+  }
+  EXPECT_EQ(back, data);
+  ASSERT_GE(script.read_sizes.size(), 3u);
+  for (unsigned long size : script.read_sizes) EXPECT_LE(size, 1024u);
+}
+
+TEST(BufferTransfer, SizeZeroMakesNoCall) {
+  SyscallScript script;
+  ScopedSyscallScript scope(&script);
+  BufferRead(-1, 0, nullptr);
+  BufferWrite(-1, 0, nullptr);
+  EXPECT_TRUE(script.read_sizes.empty());
+  EXPECT_TRUE(script.write_sizes.empty());
+}
+
+TEST(BufferTransfer, TenInterruptionsAreRetriedTheEleventhFails) {
+  Pipe pipe;
+  const unsigned char byte = 'a';
+  unsigned char got = 0;
+  SyscallScript script;
+  script.reads.assign(10, E);
+  script.writes.assign(10, E);
+  {
+    ScopedSyscallScript scope(&script);
+    BufferWrite(pipe.write_end, 1, &byte);
+    BufferRead(pipe.read_end, 1, &got);
+  }
+  EXPECT_EQ(got, 'a');
+  EXPECT_EQ(script.write_sizes.size(), 11u);
+
+  LogCapture log;
+  script.reads.assign(11, E);
+  script.writes.assign(11, E);
+  ScopedSyscallScript scope(&script);
+  EXPECT_EQ(ReasonOf([&] { BufferRead(pipe.read_end, 1, &got); }),
+            std::string("read failed, reason=") + strerror(EINTR));
+  EXPECT_EQ(ReasonOf([&] { BufferWrite(pipe.write_end, 1, &byte); }),
+            std::string("write failed, reason=") + strerror(EINTR));
+  EXPECT_TRUE(log.Lines().empty()) << "the transfer functions never log";
+}
+
+TEST(BufferTransfer, InterruptionBudgetIsNotResetByProgress) {
+  Pipe pipe;
+  const std::vector<unsigned char> data(3000, 'y');
+  SyscallScript script;
+  // Ten interruptions spread between the three chunks: still fine.
+  script.writes = {E, E, E, E, P, E, E, E, E, P, E, E, P};
+  {
+    ScopedSyscallScript scope(&script);
+    BufferWrite(pipe.write_end, data.size(), data.data());
+  }
+  std::vector<unsigned char> back(3000);
+  BufferRead(pipe.read_end, back.size(), back.data());
+  // Eleven, spread the same way, fail although each chunk saw fewer.
+  script.writes = {E, E, E, E, P, E, E, E, E, P, E, E, E};
+  ScopedSyscallScript scope(&script);
+  EXPECT_EQ(ReasonOf([&] { BufferWrite(pipe.write_end, data.size(), data.data()); }),
+            std::string("write failed, reason=") + strerror(EINTR));
+}
+
+TEST(BufferTransfer, ZeroResultIsRetriedAndOtherErrorsFailAtOnce) {
+  Pipe pipe;
+  const unsigned char text[] = "abc";
+  SyscallScript script;
+  script.writes = {0, 0, P};
+  {
+    ScopedSyscallScript scope(&script);
+    BufferWrite(pipe.write_end, 3, text);
+  }
+  EXPECT_EQ(script.write_sizes, (std::vector<unsigned long>{3, 3, 3}));
+  unsigned char back[3];
+  BufferRead(pipe.read_end, 3, back);
+  EXPECT_EQ(0, memcmp(back, text, 3));
+
+  script.reads = {-ECONNRESET};
+  ScopedSyscallScript scope(&script);
+  EXPECT_EQ(ReasonOf([&] { BufferRead(pipe.read_end, 3, back); }),
+            std::string("read failed, reason=") + strerror(ECONNRESET));
+}
+
+TEST(BufferTransfer, BadDescriptorFails) {
+  unsigned char byte = 0;
+  EXPECT_EQ(ReasonOf([&] { BufferRead(-1, 1, &byte); }), std::string("read failed, reason=") + strerror(EBADF));
+  EXPECT_EQ(ReasonOf([&] { BufferWrite(-1, 1, &byte); }), std::string("write failed, reason=") + strerror(EBADF));
+}
+
+TEST(Frames, LengthCountsTheNulAndReaderDropsIt) {
+  Pipe pipe;
+  WriteFrame(pipe.write_end, "{\"a\":1}");
+  uint32_t length = 0;
+  ASSERT_EQ(read(pipe.read_end, &length, 4), 4);
+  EXPECT_EQ(length, 8u);
+  char body[8];
+  ASSERT_EQ(read(pipe.read_end, body, 8), 8);
+  EXPECT_EQ(std::string(body, 8), std::string("{\"a\":1}\0", 8));
+
+  WriteFrame(pipe.write_end, "");
+  EXPECT_EQ(ReadFrame(pipe.read_end), "");
+  // A body sent without its NUL is accepted as it stands.
+  const uint32_t bare = 2;
+  ASSERT_EQ(write(pipe.write_end, &bare, 4), 4);
+  ASSERT_EQ(write(pipe.write_end, "{}", 2), 2);
+  EXPECT_EQ(ReadFrame(pipe.read_end), "{}");
+}
+
+// --- SendCommandToDaemon against a fake fileindexd ---
+
+class DaemonChannel : public ::testing::Test {
+ protected:
+  SandboxRoot root_;
+  SleepRecorder sleeps_;
+};
+
+TEST_F(DaemonChannel, SendsOneFrameAndWaitsForTheReply) {
+  FakeDaemon daemon(DaemonSocket());
+  Json::Value data;
+  data["resume_time"] = 0;
+  SendCommandToDaemon("pause", data);
+  const auto frames = daemon.Frames();
+  ASSERT_EQ(frames.size(), 1u);
+  const std::string text = "{\"data\":{\"resume_time\":0},\"type\":\"pause\"}";
+  EXPECT_EQ(frames[0].length, text.size() + 1);
+  EXPECT_EQ(frames[0].body, text + std::string(1, '\0'));
+  EXPECT_TRUE(sleeps_.Sleeps().empty());
+}
+
+TEST_F(DaemonChannel, NullDataIsStillPresent) {
+  FakeDaemon daemon(DaemonSocket());
+  SendCommandToDaemon("resume", Json::Value());
+  SendCommandToDaemon("worker_create", Json::Value(Json::objectValue));
+  const auto frames = daemon.Frames();
+  ASSERT_EQ(frames.size(), 2u);
+  Json::Value request;
+  ASSERT_TRUE(JsonFromString(request, frames[0].body.substr(0, frames[0].length - 1)));
+  EXPECT_TRUE(request.isMember("data"));
+  EXPECT_TRUE(request["data"].isNull());
+  EXPECT_EQ(request["type"], "resume");
+  ASSERT_TRUE(JsonFromString(request, frames[1].body.substr(0, frames[1].length - 1)));
+  EXPECT_TRUE(request["data"].isObject());
+}
+
+TEST_F(DaemonChannel, LongRequestGoesOutInChunksAndSendTimeoutIsTheOnlyOption) {
+  FakeDaemon daemon(DaemonSocket(), std::string(5000, 'r'));
+  // A body (text + NUL) of exactly 3000 bytes.
+  Json::Value probe(Json::objectValue);
+  probe["data"] = "";
+  probe["type"] = "x";
+  const std::string padding(3000 - 1 - JsonToString(probe).size(), 'p');
+  SyscallScript script;
+  {
+    ScopedSyscallScript scope(&script);
+    SendCommandToDaemon("x", padding);
+  }
+  EXPECT_EQ(script.write_sizes, (std::vector<unsigned long>{4, 1024, 1024, 952}));
+  ASSERT_EQ(script.options.size(), 1u);
+  EXPECT_EQ(script.options[0].level, SOL_SOCKET);
+  EXPECT_EQ(script.options[0].name, SO_SNDTIMEO);
+  EXPECT_EQ(script.options[0].seconds, 1);
+  EXPECT_EQ(script.options[0].microseconds, 0);
+  // The 5000-byte reply was read whole, in chunks.
+  unsigned long read_total = 0;
+  for (unsigned long size : script.read_sizes) EXPECT_LE(size, 1024u);
+  for (unsigned long size : script.read_sizes) read_total += size;
+  EXPECT_GE(read_total, 5004u);
+  ASSERT_EQ(daemon.Frames().size(), 1u);
+  EXPECT_EQ(daemon.Frames()[0].length, 3000u);
+}
+
+TEST_F(DaemonChannel, EmptyReplyIsAccepted) {
+  FakeDaemon daemon(DaemonSocket(), "");
+  SyscallScript script;
+  {
+    ScopedSyscallScript scope(&script);
+    SendCommandToDaemon("notify_setting_changed", "share1");
+  }
+  // Only the 4-byte length is read.
+  EXPECT_EQ(script.read_sizes, (std::vector<unsigned long>{4}));
+  EXPECT_EQ(daemon.Frames().size(), 1u);
+}
+
+TEST_F(DaemonChannel, MissingSocketIsRetriedFiveTimesThenWriteFails) {
+  const int before = OpenDescriptors();
+  LogCapture log;
+  const std::string reason = ReasonOf([] { SendCommandToDaemon("pause", Json::Value()); });
+  EXPECT_EQ(reason.rfind("write failed, reason=", 0), 0u) << reason;
+  EXPECT_EQ(sleeps_.Sleeps(), std::vector<std::chrono::microseconds>(4, std::chrono::seconds(1)));
+  EXPECT_EQ(OpenDescriptors(), before);
+  EXPECT_TRUE(log.Lines().empty());
+}
+
+TEST_F(DaemonChannel, SocketThatNobodyListensOnFailsWithoutRetry) {
+  // Bound but never listening: connect is refused, which is not retried.
+  const std::string path = root_.MakeDir("var/run") + "/fileindexd.sock";
+  const int fd = socket(AF_UNIX, SOCK_STREAM, 0);
+  struct sockaddr_un address;
+  memset(&address, 0, sizeof(address));
+  address.sun_family = AF_UNIX;
+  memcpy(address.sun_path, path.c_str(), path.size());
+  ASSERT_EQ(bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)), 0);
+  const std::string reason = ReasonOf([] { SendCommandToDaemon("resume", Json::Value()); });
+  close(fd);
+  EXPECT_EQ(reason.rfind("write failed, reason=", 0), 0u) << reason;
+  EXPECT_TRUE(sleeps_.Sleeps().empty());
+}
+
+TEST_F(DaemonChannel, DaemonThatStartsDuringTheRetriesGetsTheCommand) {
+  std::unique_ptr<FakeDaemon> daemon;
+  int sleeps = 0;
+  SetSleepHook([&](std::chrono::microseconds) {
+    if (++sleeps == 2) daemon = std::make_unique<FakeDaemon>(DaemonSocket());
+  });
+  SendCommandToDaemon("worker_delete", "music");
+  SetSleepHook(nullptr);
+  EXPECT_EQ(sleeps, 2);
+  ASSERT_TRUE(daemon);
+  EXPECT_EQ(daemon->Frames().size(), 1u);
+}
+
+TEST_F(DaemonChannel, SocketFailureIsLoggedAndThrown) {
+  LogCapture log;
+  SyscallScript script;
+  script.fail_socket = true;
+  ScopedSyscallScript scope(&script);
+  EXPECT_EQ(ReasonOf([] { SendCommandToDaemon("pause", Json::Value()); }),
+            std::string("socket failed, reason=") + strerror(EMFILE));
+  ASSERT_EQ(log.Lines().size(), 1u);
+  EXPECT_NE(log.Lines()[0].find("(SendCommandToDaemon) Failed [0 > (fd_socket = socket(PF_UNIX, SOCK_STREAM, 0))], "
+                                "reason: socket failed, reason="),
+            std::string::npos)
+      << log.Lines()[0];
+}
+
+TEST_F(DaemonChannel, EveryFailureAfterTheSocketClosesIt) {
+  FakeDaemon daemon(DaemonSocket());
+  const int before = OpenDescriptors();
+  {
+    LogCapture log;
+    SyscallScript script;
+    script.fail_setsockopt = true;
+    ScopedSyscallScript scope(&script);
+    EXPECT_EQ(ReasonOf([] { SendCommandToDaemon("pause", Json::Value()); }),
+              std::string("setsockopt failed, reason=") + strerror(ENOPROTOOPT));
+    ASSERT_EQ(log.Lines().size(), 1u);
+    EXPECT_NE(log.Lines()[0].find("(SendCommandToDaemon) Failed [0 > setsockopt(fd_socket, SOL_SOCKET, SO_SNDTIMEO, "
+                                  "(char *)&timeout, sizeof(timeout))]"),
+              std::string::npos)
+        << log.Lines()[0];
+  }
+  ASSERT_TRUE(daemon.WaitForClosedConnections(1));
+  EXPECT_EQ(OpenDescriptors(), before);
+  {
+    SyscallScript script;
+    script.writes = {-EIO};
+    ScopedSyscallScript scope(&script);
+    EXPECT_EQ(ReasonOf([] { SendCommandToDaemon("pause", Json::Value()); }),
+              std::string("write failed, reason=") + strerror(EIO));
+  }
+  ASSERT_TRUE(daemon.WaitForClosedConnections(2));
+  EXPECT_EQ(OpenDescriptors(), before);
+  {
+    SyscallScript script;
+    script.reads = {-ECONNRESET};
+    ScopedSyscallScript scope(&script);
+    EXPECT_EQ(ReasonOf([] { SendCommandToDaemon("pause", Json::Value()); }),
+              std::string("read failed, reason=") + strerror(ECONNRESET));
+  }
+  ASSERT_TRUE(daemon.WaitForClosedConnections(3));
+  EXPECT_EQ(OpenDescriptors(), before);
+}
+
+TEST_F(DaemonChannel, PeerThatHangsUpGivesAnErrorNotASignal) {
+  // Accepts and closes at once, without reading: the write meets a closed
+  // peer. The caller did not ignore SIGPIPE and must survive.
+  const std::string path = root_.MakeDir("var/run") + "/fileindexd.sock";
+  const int listener = socket(AF_UNIX, SOCK_STREAM, 0);
+  struct sockaddr_un address;
+  memset(&address, 0, sizeof(address));
+  address.sun_family = AF_UNIX;
+  memcpy(address.sun_path, path.c_str(), path.size());
+  ASSERT_EQ(bind(listener, reinterpret_cast<sockaddr*>(&address), sizeof(address)), 0);
+  ASSERT_EQ(listen(listener, 4), 0);
+  std::thread closer([listener] { close(accept(listener, nullptr, nullptr)); });
+  ASSERT_EQ(signal(SIGPIPE, SIG_DFL), SIG_DFL);
+  const std::string reason = ReasonOf([] { SendCommandToDaemon("x", std::string(200000, 'z')); });
+  closer.join();
+  close(listener);
+  EXPECT_EQ(reason.rfind("write failed, reason=", 0), 0u) << reason;
+  sigset_t pending;
+  sigpending(&pending);
+  EXPECT_EQ(sigismember(&pending, SIGPIPE), 0);
+}
+
+TEST_F(DaemonChannel, OverlongSocketPathIsRefused) {
+  setenv("CORVLUMEX_ROOT", (root_.path() + "/" + std::string(120, 'd')).c_str(), 1);
+  const std::string reason = ReasonOf([] { SendCommandToDaemon("pause", Json::Value()); });
+  setenv("CORVLUMEX_ROOT", root_.path().c_str(), 1);
+  EXPECT_EQ(reason.rfind("socket path too long, path=", 0), 0u) << reason;
+}
+
+}  // namespace
+}  // namespace fileindex
+}  // namespace corvlumex
