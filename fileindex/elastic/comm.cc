@@ -1,0 +1,151 @@
+#include "fileindex/elastic/comm.h"
+
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <chrono>
+#include <cstring>
+
+#include "common/error.h"
+#include "common/json_util.h"
+#include "common/log.h"
+#include "common/sys.h"
+#include "fileindex/communication.h"
+
+namespace corvlumex {
+namespace {
+
+// The daemon may still be starting: wait for its socket file at most this
+// many seconds, then try to connect all the same.
+constexpr int kSocketFileWaits = 15;
+
+void WaitForSocketFile(const std::string& path) {
+  for (int attempt = 1; access(path.c_str(), F_OK) != 0; ++attempt) {
+    if (attempt > kSocketFileWaits) break;
+    CORV_LOG("elastic socket is not ready, retry ... %d", attempt);
+    SleepFor(std::chrono::seconds(1));
+  }
+}
+
+// Text of a member for log lines, whatever its type.
+std::string MemberText(const Json::Value& value) {
+  return value.isString() ? value.asString() : JsonToString(value);
+}
+
+// A compound answer whose sub-answers must be looked at.
+bool CompoundHasFailure(const Json::Value& req, const Json::Value& res) {
+  if (!req.isMember("compound") || !res.isMember("has_fail")) return false;
+  const Json::Value& has_fail = res["has_fail"];
+  return has_fail.isBool() && has_fail.asBool() && res["data"].isArray();
+}
+
+bool SubAnswerSucceeded(const Json::Value& sub_answer) {
+  const Json::Value& success = sub_answer["success"];
+  return success.isBool() && success.asBool();
+}
+
+int SubAnswerCode(const Json::Value& sub_answer) {
+  const Json::Value& code = sub_answer["error"]["code"];
+  return code.isConvertibleTo(Json::intValue) ? code.asInt() : 0;
+}
+
+}  // namespace
+
+bool IsElasticBusyCode(int code) { return code == kElasticBusy || code == kElasticNotReady; }
+
+std::string ElasticSocketPath() { return SysPath("/var/run/corvelasticd.sock"); }
+
+bool WaitForFrame(int fd) {
+  char first = 0;
+  for (;;) {
+    const ssize_t n = recv(fd, &first, 1, MSG_PEEK);
+    if (n > 0) return true;
+    if (n == 0) return false;
+    if (errno != EINTR) return false;
+  }
+}
+
+DomainSockConnection::DomainSockConnection(const std::string& path) : path_(path) {}
+
+DomainSockConnection::~DomainSockConnection() {
+  if (fd_ >= 0) close(fd_);
+}
+
+bool DomainSockConnection::Connect() {
+  struct sockaddr_un address;
+  memset(&address, 0, sizeof(address));
+  address.sun_family = AF_UNIX;
+  if (path_.size() >= sizeof(address.sun_path)) {
+    errno = ENAMETOOLONG;
+    return false;
+  }
+  memcpy(address.sun_path, path_.c_str(), path_.size());
+  if (fd_ < 0) fd_ = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  if (fd_ < 0) return false;
+  return connect(fd_, reinterpret_cast<struct sockaddr*>(&address), sizeof(address)) == 0;
+}
+
+bool DomainSockConnection::Send(const std::string& text) {
+  if (fd_ < 0) return false;
+  try {
+    fileindex::WriteFrame(fd_, text);
+  } catch (const Error&) {
+    return false;
+  }
+  return true;
+}
+
+bool DomainSockConnection::Recv(std::string& text) {
+  if (fd_ < 0 || !WaitForFrame(fd_)) return false;
+  try {
+    text = fileindex::ReadFrame(fd_);
+  } catch (const Error&) {
+    return false;
+  }
+  return true;
+}
+
+void SendRequestImpl(Json::Value& res, const Json::Value& req) {
+  const std::string path = ElasticSocketPath();
+  WaitForSocketFile(path);
+
+  DomainSockConnection conn(path);
+  CORV_CHECK_THROW(!conn.Connect(), kErrorSearchRequest, "Connect failed");
+  CORV_CHECK_THROW_TEXT(!conn.Send(JsonToString(req)), "!conn.Send(req.toString())", kErrorSearchRequest,
+                        "Send failed");
+  std::string resp_raw;
+  CORV_CHECK_THROW_TEXT(!conn.Recv(resp_raw) || !JsonFromString(res, resp_raw) || !res.isObject() ||
+                            !res.isMember("success") || !res["success"].isBool(),
+                        "!conn.Recv(resp_raw) || !res.fromString(resp_raw) || !res.isMember(\"success\") || "
+                        "!res[\"success\"].isBool()",
+                        kErrorSearchRequest, "Recv failed, res=" + resp_raw);
+
+  const Json::Value& answer = res;
+  if (!answer["success"].asBool()) {
+    // The daemon's own code travels on, so that callers can tell busy from
+    // failed; a failure that does not say what it was is a bad argument.
+    int code = 0;
+    std::string msg;
+    GetJsonValue(code, answer["error"], "code", true);
+    GetJsonValue(msg, answer["error"], "msg", true);
+    throw Error(static_cast<ErrorCode>(code), "Request failed, msg=" + msg);
+  }
+  if (!CompoundHasFailure(req, answer)) return;
+
+  // A busy sub-request fails the whole request, so that it is sent again;
+  // any other failed sub-request is only logged.
+  const Json::Value& answers = answer["data"];
+  const Json::Value& requests = req["compound"];
+  for (Json::ArrayIndex i = 0; i < answers.size(); ++i) {
+    if (SubAnswerSucceeded(answers[i])) continue;
+    const int code = SubAnswerCode(answers[i]);
+    const std::string msg = MemberText(answers[i]["error"]["msg"]);
+    if (IsElasticBusyCode(code)) throw Error(static_cast<ErrorCode>(code), msg);
+    const Json::Value& sub_request = requests.isArray() && i < requests.size() ? requests[i] : Json::Value::nullSingleton();
+    CORV_LOG_FN("Compound failed: %s (%d) %s", JsonToString(sub_request).c_str(), code, msg.c_str());
+  }
+}
+
+}  // namespace corvlumex

@@ -1,0 +1,53 @@
+// The request channel to the search daemon corvelasticd: one JSON request and
+// one JSON answer per connection, over the frame every Unix-socket peer of the
+// system uses.
+#pragma once
+
+#include <json/json.h>
+
+#include <string>
+
+namespace corvlumex {
+
+// Codes with which corvelasticd says it cannot take a request now; callers
+// treat both alike and ask again later.
+constexpr int kElasticBusy = 1400;
+constexpr int kElasticNotReady = 1401;
+bool IsElasticBusyCode(int code);
+
+// corvelasticd's socket, relocated by the system root.
+std::string ElasticSocketPath();
+
+// Waits until a frame starts to arrive on `fd`. False when the peer hung up
+// first (or the socket failed): the frame reader keeps asking on end of file,
+// so callers must not start reading a frame that will never come.
+bool WaitForFrame(int fd);
+
+// A client connection on a Unix stream socket; the descriptor is closed on
+// destruction. Each call reports success as true.
+class DomainSockConnection {
+ public:
+  explicit DomainSockConnection(const std::string& path);
+  ~DomainSockConnection();
+  DomainSockConnection(const DomainSockConnection&) = delete;
+  DomainSockConnection& operator=(const DomainSockConnection&) = delete;
+
+  bool Connect();
+  // One frame each way. A peer that has gone away makes Send fail with
+  // EPIPE only when the process ignores SIGPIPE, as the programs do.
+  bool Send(const std::string& text);
+  bool Recv(std::string& text);
+
+ private:
+  std::string path_;
+  int fd_ = -1;
+};
+
+// One exchange with corvelasticd. On return `res` holds the answer, an object
+// with a bool "success" that is true. Throws Error: 913 when the daemon cannot
+// be reached or its answer is not such an object, the daemon's own code when
+// it reports a failure (1400/1401 when busy, also for a busy sub-request of a
+// compound request), 120 when that failure lacks its "code" or "msg".
+void SendRequestImpl(Json::Value& res, const Json::Value& req);
+
+}  // namespace corvlumex
