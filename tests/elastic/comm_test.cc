@@ -16,25 +16,15 @@ namespace {
 
 using testing_support::FakeAnswer;
 using testing_support::FakeSearchDaemon;
+using testing_support::JsonOf;
 using testing_support::LogCapture;
 using testing_support::SandboxRoot;
 using testing_support::SleepRecorder;
 
-Json::Value Parse(const std::string& text) {
-  Json::Value value;
-  EXPECT_TRUE(JsonFromString(value, text)) << text;
-  return value;
-}
-
 // Runs one exchange and returns the Error it threw (code 0 when none).
 Error ExchangeError(const Json::Value& req) {
   Json::Value res;
-  try {
-    SendRequestImpl(res, req);
-  } catch (const Error& error) {
-    return error;
-  }
-  return Error(static_cast<ErrorCode>(0));
+  return testing_support::ErrorOf([&] { SendRequestImpl(res, req); });
 }
 
 class SendRequestTest : public ::testing::Test {
@@ -42,12 +32,12 @@ class SendRequestTest : public ::testing::Test {
   SandboxRoot root_;
   SleepRecorder sleeps_;
   LogCapture log_;
-  Json::Value req_ = Parse(R"({"command": "index_delete", "data": {"id": "fileindex_music"}})");
+  Json::Value req_ = JsonOf(R"({"command": "index_delete", "data": {"id": "fileindex_music"}})");
 };
 
 TEST_F(SendRequestTest, OneFramedRequestPerConnectionAndTheAnswerIsReturned) {
   FakeSearchDaemon daemon;
-  daemon.Enqueue(FakeAnswer::Success(Parse(R"({"hits": 2})")), 2);
+  daemon.Enqueue(FakeAnswer::Success(JsonOf(R"({"hits": 2})")), 2);
   Json::Value res;
   SendRequestImpl(res, req_);
   SendRequestImpl(res, req_);
@@ -163,7 +153,7 @@ TEST_F(SendRequestTest, FailureAnswerWithoutItsKeysIsABadArgument) {
 
 class CompoundTest : public SendRequestTest {
  protected:
-  Json::Value compound_ = Parse(R"({"compound": [
+  Json::Value compound_ = JsonOf(R"({"compound": [
       {"command": "document_set_by_id", "data": {"id": "fileindex_s", "doc_id": "/v/s/a"}},
       {"command": "document_set_by_id", "data": {"id": "fileindex_s", "doc_id": "/v/s/b"}},
       {"command": "document_set_by_id", "data": {"id": "fileindex_s", "doc_id": "/v/s/c"}}]})");

@@ -19,6 +19,21 @@
 namespace corvlumex {
 namespace testing_support {
 
+Json::Value JsonOf(const std::string& text) {
+  Json::Value value;
+  if (!JsonFromString(value, text)) throw std::runtime_error("not JSON: " + text);
+  return value;
+}
+
+Error ErrorOf(const std::function<void()>& action) {
+  try {
+    action();
+  } catch (const Error& error) {
+    return error;
+  }
+  return Error(static_cast<ErrorCode>(0));
+}
+
 FakeAnswer FakeAnswer::Json(const Json::Value& value) { return Raw(JsonToString(value)); }
 
 FakeAnswer FakeAnswer::Success(const Json::Value& data) {

@@ -13,6 +13,8 @@
 #include <thread>
 #include <vector>
 
+#include "common/error.h"
+
 namespace corvlumex {
 namespace testing_support {
 
@@ -33,6 +35,12 @@ struct FakeAnswer {
   // Closes the connection without reading the request.
   static FakeAnswer CloseUnread();
 };
+
+// Test conveniences for the search client's tests: the value of a JSON text
+// (std::runtime_error when it is not JSON), and the Error that `action`
+// throws (code 0 when it throws none).
+Json::Value JsonOf(const std::string& text);
+Error ErrorOf(const std::function<void()>& action);
 
 // The default handler's answer: success, and for a compound request one
 // successful sub-answer per element with "has_fail": false.
