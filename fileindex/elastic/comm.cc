@@ -31,23 +31,31 @@ void WaitForSocketFile(const std::string& path) {
 
 // Text of a member for log lines, whatever its type.
 std::string MemberText(const Json::Value& value) {
+  if (value.isNull()) return std::string();
   return value.isString() ? value.asString() : JsonToString(value);
+}
+
+// Member `key` of `value`, or null when `value` is no object or lacks it:
+// a malformed sub-answer must not make the JSON library throw.
+const Json::Value& Member(const Json::Value& value, const char* key) {
+  if (!value.isObject() || !value.isMember(key)) return Json::Value::nullSingleton();
+  return value[key];
 }
 
 // A compound answer whose sub-answers must be looked at.
 bool CompoundHasFailure(const Json::Value& req, const Json::Value& res) {
-  if (!req.isMember("compound") || !res.isMember("has_fail")) return false;
-  const Json::Value& has_fail = res["has_fail"];
-  return has_fail.isBool() && has_fail.asBool() && res["data"].isArray();
+  if (!req.isObject() || !req.isMember("compound")) return false;
+  const Json::Value& has_fail = Member(res, "has_fail");
+  return has_fail.isBool() && has_fail.asBool() && Member(res, "data").isArray();
 }
 
 bool SubAnswerSucceeded(const Json::Value& sub_answer) {
-  const Json::Value& success = sub_answer["success"];
+  const Json::Value& success = Member(sub_answer, "success");
   return success.isBool() && success.asBool();
 }
 
 int SubAnswerCode(const Json::Value& sub_answer) {
-  const Json::Value& code = sub_answer["error"]["code"];
+  const Json::Value& code = Member(Member(sub_answer, "error"), "code");
   return code.isConvertibleTo(Json::intValue) ? code.asInt() : 0;
 }
 
@@ -141,7 +149,7 @@ void SendRequestImpl(Json::Value& res, const Json::Value& req) {
   for (Json::ArrayIndex i = 0; i < answers.size(); ++i) {
     if (SubAnswerSucceeded(answers[i])) continue;
     const int code = SubAnswerCode(answers[i]);
-    const std::string msg = MemberText(answers[i]["error"]["msg"]);
+    const std::string msg = MemberText(Member(Member(answers[i], "error"), "msg"));
     if (IsElasticBusyCode(code)) throw Error(static_cast<ErrorCode>(code), msg);
     const Json::Value& sub_request = requests.isArray() && i < requests.size() ? requests[i] : Json::Value::nullSingleton();
     CORV_LOG_FN("Compound failed: %s (%d) %s", JsonToString(sub_request).c_str(), code, msg.c_str());

@@ -185,6 +185,16 @@ TEST_F(CompoundTest, BusySubRequestFailsTheWholeRequestWithTheBareMessage) {
   EXPECT_EQ(log_.Matching("Compound failed").size(), 1u) << "stops at the busy element";
 }
 
+TEST_F(CompoundTest, MalformedSubAnswersCountAsFailedWithoutThrowing) {
+  daemon_.Enqueue(FakeAnswer::Raw(R"({"success": true, "has_fail": true, "data": [
+      5, {"success": "no"}, {"success": false, "error": "oops"}, {"success": false, "error": {"code": "x"}}]})"));
+  EXPECT_EQ(ExchangeError(compound_).code, 0);
+  const auto lines = log_.Matching("Compound failed: ");
+  ASSERT_EQ(lines.size(), 4u);
+  EXPECT_NE(lines[2].find(JsonToString(compound_["compound"][2]) + " (0) "), std::string::npos) << lines[2];
+  EXPECT_NE(lines[3].find("null (0) "), std::string::npos) << "more answers than sub-requests: " << lines[3];
+}
+
 TEST_F(CompoundTest, SubAnswersAreOnlyReadWhenTheDaemonReportsAFailure) {
   const std::string failing_data = R"("data": [{"success": false, "error": {"code": 1400, "msg": "busy"}}])";
   daemon_.Enqueue(FakeAnswer::Raw(R"({"success": true, "has_fail": false, )" + failing_data + "}"));
