@@ -16,6 +16,7 @@
 #include "common/json_util.h"
 #include "common/log.h"
 #include "common/sys.h"
+#include "fileindex/constants.h"
 
 namespace corvlumex {
 namespace fileindex {
@@ -130,7 +131,7 @@ void SendCommandToDaemon(const std::string& command, const Json::Value& data) {
   struct sockaddr_un address;
   memset(&address, 0, sizeof(address));
   address.sun_family = AF_UNIX;
-  const std::string path = SysPath("/var/run/fileindexd.sock");
+  const std::string path = SysPath(kFileIndexDaemonSocketPath);
   // A cut path would reach some other socket, or none: say so instead.
   CORV_CHECK_THROW(path.size() >= sizeof(address.sun_path), kErrorSystem, "socket path too long, path=" + path);
   memcpy(address.sun_path, path.c_str(), path.size());
