@@ -1,0 +1,114 @@
+// corvnotifyd: watches the folders named by the monitor-queue configurations
+// and appends one line per file-system change to each share's queue.
+//
+//   corvnotifyd [--foreground] [--config-dir DIR]
+//
+// SIGTERM or SIGINT stops it after every event read so far is written.
+#include <pthread.h>
+#include <signal.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <string>
+#include <thread>
+
+#include "common/error.h"
+#include "common/log.h"
+#include "common/sys.h"
+#include "programs/corvnotifyd/notifier.h"
+
+namespace {
+
+using corvlumex::notifyd::NotifierOptions;
+
+void Usage(FILE* out) {
+  fprintf(out,
+          "usage: corvnotifyd [--foreground] [--config-dir DIR]\n"
+          "  --foreground    stay attached to the terminal and log to standard error\n"
+          "  --config-dir    folder of the monitor-queue configurations (default %s)\n",
+          corvlumex::SysPath("/etc/corvlumex/monitor.d").c_str());
+}
+
+// Test hooks, honoured only inside a sandbox root so that a stray variable
+// cannot change a real server's behaviour.
+void ApplyTestHooks(NotifierOptions* options) {
+  if (!corvlumex::InSandbox()) return;
+  if (const char* pause = getenv("CORVNOTIFYD_TEST_PAUSE_FILE")) options->pause_file = pause;
+  if (const char* backoff = getenv("CORVNOTIFYD_TEST_BACKOFF_MS")) {
+    options->backoff_base = std::chrono::milliseconds(atol(backoff));
+  }
+  if (const char* limit = getenv("CORVNOTIFYD_TEST_WATCH_LIMIT")) options->watch_limit = strtoul(limit, nullptr, 10);
+  if (const char* retry = getenv("CORVNOTIFYD_TEST_ROOT_RETRY_MS")) {
+    options->missing_root_retry = std::chrono::milliseconds(atol(retry));
+  }
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  bool foreground = false;
+  NotifierOptions options;
+  options.config_dir = corvlumex::SysPath("/etc/corvlumex/monitor.d");
+  for (int i = 1; i < argc; ++i) {
+    const std::string arg = argv[i];
+    if (arg == "--foreground") {
+      foreground = true;
+    } else if (arg == "--config-dir" && i + 1 < argc && argv[i + 1][0] != '\0') {
+      options.config_dir = argv[++i];
+    } else if (arg == "--help" || arg == "-h") {
+      Usage(stdout);
+      return 0;
+    } else {
+      fprintf(stderr, "corvnotifyd: %s: %s\n", arg == "--config-dir" ? "--config-dir needs a folder" : "unknown option",
+              arg.c_str());
+      Usage(stderr);
+      return 2;
+    }
+  }
+  while (options.config_dir.size() > 1 && options.config_dir.back() == '/') options.config_dir.pop_back();
+  ApplyTestHooks(&options);
+
+  if (foreground) {
+    corvlumex::SetLogSink([](int, const std::string& line) { fprintf(stderr, "corvnotifyd: %s\n", line.c_str()); });
+  } else {
+    openlog("corvnotifyd", LOG_PID, LOG_DAEMON);
+    if (daemon(0, 0) != 0) {
+      perror("corvnotifyd: daemon");
+      return 1;
+    }
+  }
+
+  // The signals are taken by one thread, synchronously; every other thread
+  // inherits the block.
+  sigset_t stop_signals;
+  sigemptyset(&stop_signals);
+  sigaddset(&stop_signals, SIGTERM);
+  sigaddset(&stop_signals, SIGINT);
+  pthread_sigmask(SIG_BLOCK, &stop_signals, nullptr);
+  signal(SIGPIPE, SIG_IGN);
+
+  try {
+    corvlumex::notifyd::Notifier notifier(options);
+    notifier.Start();
+    std::thread signal_thread([&] {
+      int received = 0;
+      sigwait(&stop_signals, &received);
+      CORV_LOG("stopping on signal %d: writing what is pending", received);
+      notifier.Stop();
+    });
+    CORV_LOG("watching as configured in %s", options.config_dir.c_str());
+    notifier.Run();
+    // Run() also ends when the reader fails: release the signal thread.
+    pthread_kill(signal_thread.native_handle(), SIGTERM);
+    signal_thread.join();
+    CORV_LOG("stopped");
+  } catch (const corvlumex::Error& e) {
+    CORV_LOG("cannot run: %s", e.what());
+    if (!foreground) fprintf(stderr, "corvnotifyd: %s\n", e.what());
+    return 1;
+  }
+  return 0;
+}
