@@ -138,9 +138,16 @@ void Notifier::ReloadConfig() {
 }
 
 void Notifier::OnLoss(const std::string& queue, LossKind kind, const std::string& detail) {
-  auto it = backoff_.try_emplace(queue, options_.backoff_base, options_.backoff_max).first;
-  it->second.OnLoss(Clock::now());
+  CrashBackoff& backoff = backoff_.try_emplace(queue, options_.backoff_base, options_.backoff_max).first->second;
+  const Clock::time_point now = Clock::now();
+  const bool was_pending = backoff.Pending();
+  backoff.OnLoss(now);
   loss_kinds_[queue].insert(kind);
+  if (!was_pending && !backoff.Due(now)) {
+    CORV_LOG("events of queue %s lost again inside its back-off window: its next crash marker is written in %lld s",
+             queue.c_str(),
+             static_cast<long long>(std::chrono::duration_cast<std::chrono::seconds>(*backoff.NextDue() - now).count()));
+  }
   if (!detail.empty()) CORV_LOG("no inotify watch left for %s (queue %s)", detail.c_str(), queue.c_str());
   TellAdministrators(kind);
 }
