@@ -1,29 +1,68 @@
-// Content extraction of the Linux platform. For now it fills the
-// file-system fields of a document; what a file holds comes later.
-#include <grp.h>
-#include <pwd.h>
+// Content extraction of the Linux platform: the file-system fields come from
+// the file's status in this process; everything read from inside the file
+// comes from a confined worker process (worker_client.h).
+#include <fcntl.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
-#include "common/file_util.h"
+#include <cerrno>
+#include <cstring>
+
 #include "common/error.h"
+#include "common/json_util.h"
+#include "platform/linux/extract/file_fields.h"
+#include "platform/linux/extract/worker_client.h"
 #include "platform/linux/linux_platform.h"
 
 namespace corvlumex {
 namespace platform {
 
-void LinuxPlatform::ParseFile(const std::string& path, const Json::Value&, Json::Value& document) {
-  struct stat st;
-  if (lstat(path.c_str(), &st) != 0) throw Error(kErrorParseDocument, "Parse failed, path=" + path);
-  document = Json::Value(Json::objectValue);
-  document["CORVMDPath"] = path;
-  document["CORVMDParent"] = Dirname(path);
-  document["CORVMDFSName"] = Basename(path);
-  document["CORVMDIsDir"] = S_ISDIR(st.st_mode);
-  document["CORVMDFSSize"] = static_cast<Json::Int64>(st.st_size);
-  document["CORVMDFSContentChangeDate"] = static_cast<Json::Int64>(st.st_mtime);
-  document["CORVMDFSAttrChangeDate"] = static_cast<Json::Int64>(st.st_ctime);
-  document["CORVMDFSOwnerUid"] = static_cast<Json::UInt>(st.st_uid);
-  document["CORVMDFSOwnerGid"] = static_cast<Json::UInt>(st.st_gid);
+namespace {
+
+[[noreturn]] void FailWithErrno(const std::string& what, const std::string& path) {
+  const std::string reason = what + " " + path + ": " + strerror(errno);
+  errno = 0;
+  throw Error(kErrorParseDocument, reason);
+}
+
+// Closes the descriptor on every way out.
+class OpenFile {
+ public:
+  explicit OpenFile(int fd) : fd_(fd) {}
+  ~OpenFile() {
+    if (fd_ >= 0) close(fd_);
+  }
+  OpenFile(const OpenFile&) = delete;
+  OpenFile& operator=(const OpenFile&) = delete;
+  int fd() const { return fd_; }
+
+ private:
+  int fd_;
+};
+
+}  // namespace
+
+void LinuxPlatform::ParseFile(const std::string& path, const Json::Value& options, Json::Value& document) {
+  bool need_meta = false;
+  GetJsonValue(need_meta, options, "need_meta", false);
+
+  extract::FileStatus status;
+  if (!extract::ReadFileStatus(path, &status)) FailWithErrno("cannot read the status of", path);
+  Json::Value fields(Json::objectValue);
+  extract::FillFileFields(path, status, fields);
+
+  // Only a regular file's own bytes are read: a link's target may lie outside
+  // the share, and a device or a pipe is no document.
+  if (S_ISREG(status.mode) && status.size > 0) {
+    const OpenFile file(open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+    if (file.fd() < 0) FailWithErrno("cannot open", path);
+    struct stat opened;
+    if (fstat(file.fd(), &opened) != 0) FailWithErrno("cannot read the status of", path);
+    if (!S_ISREG(opened.st_mode)) throw Error(kErrorParseDocument, "no longer a regular file: " + path);
+    const Json::Value content = extract::ExtractInWorker(file.fd(), path, need_meta);
+    for (const std::string& name : content.getMemberNames()) fields[name] = content[name];
+  }
+  document = fields;
 }
 
 }  // namespace platform

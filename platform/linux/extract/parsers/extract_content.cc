@@ -1,0 +1,159 @@
+#include "platform/linux/extract/parsers/extract_content.h"
+
+#include <magic.h>
+#include <unistd.h>
+
+#include <map>
+
+#include "common/file_util.h"
+#include "platform/linux/extract/document_fields.h"
+#include "platform/linux/extract/parsers/file_bytes.h"
+#include "platform/linux/extract/parsers/formats.h"
+#include "platform/linux/extract/parsers/text_sink.h"
+
+namespace corvlumex {
+namespace platform {
+namespace extract {
+namespace {
+
+enum class Family { kText, kHtml, kXml, kPdf, kOffice, kAudio, kPhoto, kVideo };
+
+struct Format {
+  Family family;
+  OfficeFormat office;
+};
+
+const std::map<std::string, Format>& FormatsByExtension() {
+  static const auto* formats = [] {
+    auto* table = new std::map<std::string, Format>();
+    for (const char* ext : {"txt", "text", "log", "md", "markdown", "rst", "csv", "tsv", "json", "yaml", "yml",
+                            "ini", "conf", "cfg", "toml", "tex", "srt", "vtt", "sub", "nfo", "c", "h", "cc", "cpp",
+                            "cxx", "hpp", "hh", "java", "py", "sh", "bash", "js", "ts", "css", "go", "rs", "rb",
+                            "pl", "php", "sql", "lua", "swift", "kt", "cs", "properties", "diff", "patch"}) {
+      (*table)[ext] = {Family::kText, OfficeFormat::kDocx};
+    }
+    for (const char* ext : {"html", "htm", "xhtml", "shtml"}) (*table)[ext] = {Family::kHtml, OfficeFormat::kDocx};
+    for (const char* ext : {"xml", "svg", "rss", "atom", "plist"}) (*table)[ext] = {Family::kXml, OfficeFormat::kDocx};
+    (*table)["pdf"] = {Family::kPdf, OfficeFormat::kDocx};
+    (*table)["docx"] = {Family::kOffice, OfficeFormat::kDocx};
+    (*table)["docm"] = {Family::kOffice, OfficeFormat::kDocx};
+    (*table)["xlsx"] = {Family::kOffice, OfficeFormat::kXlsx};
+    (*table)["xlsm"] = {Family::kOffice, OfficeFormat::kXlsx};
+    (*table)["pptx"] = {Family::kOffice, OfficeFormat::kPptx};
+    (*table)["pptm"] = {Family::kOffice, OfficeFormat::kPptx};
+    (*table)["odt"] = {Family::kOffice, OfficeFormat::kOdt};
+    (*table)["ods"] = {Family::kOffice, OfficeFormat::kOds};
+    (*table)["odp"] = {Family::kOffice, OfficeFormat::kOdp};
+    (*table)["epub"] = {Family::kOffice, OfficeFormat::kEpub};
+    for (const char* ext : {"mp3", "flac", "ogg", "oga", "opus", "spx", "m4a", "m4b", "aac", "wav", "aif", "aiff",
+                            "wma", "ape", "wv", "mpc", "tta", "dsf"}) {
+      (*table)[ext] = {Family::kAudio, OfficeFormat::kDocx};
+    }
+    for (const char* ext : {"jpg", "jpeg", "jpe", "tif", "tiff", "png", "webp", "gif", "bmp", "psd", "jp2", "dng",
+                            "cr2", "crw", "nef", "arw", "orf", "rw2", "pef", "srw", "raf", "mrw"}) {
+      (*table)[ext] = {Family::kPhoto, OfficeFormat::kDocx};
+    }
+    for (const char* ext : {"mp4", "m4v", "mov", "mkv", "webm", "avi", "wmv", "asf", "flv", "mpg", "mpeg", "m2v",
+                            "ts", "mts", "m2ts", "vob", "3gp", "3g2", "ogv", "divx", "rm", "rmvb"}) {
+      (*table)[ext] = {Family::kVideo, OfficeFormat::kDocx};
+    }
+    return table;
+  }();
+  return *formats;
+}
+
+magic_t& Magic() {
+  static magic_t magic = nullptr;
+  return magic;
+}
+
+std::string MediaType(int fd) {
+  if (Magic() == nullptr) InitContentDetection();
+  if (Magic() == nullptr) return std::string();
+  // libmagic reads from the descriptor's offset and leaves it moved.
+  lseek(fd, 0, SEEK_SET);
+  const char* type = magic_descriptor(Magic(), fd);
+  lseek(fd, 0, SEEK_SET);
+  return type != nullptr ? type : std::string();
+}
+
+bool StartsWith(const std::string& text, const char* head) { return text.rfind(head, 0) == 0; }
+
+// The family for a name whose extension we do not know, from the content.
+bool FamilyByMediaType(const std::string& type, Format* format) {
+  if (type == "application/pdf") {
+    *format = {Family::kPdf, OfficeFormat::kDocx};
+  } else if (type == "text/html") {
+    *format = {Family::kHtml, OfficeFormat::kDocx};
+  } else if (type == "text/xml") {
+    *format = {Family::kXml, OfficeFormat::kDocx};
+  } else if (StartsWith(type, "text/")) {
+    *format = {Family::kText, OfficeFormat::kDocx};
+  } else {
+    return false;
+  }
+  return true;
+}
+
+}  // namespace
+
+void InitContentDetection() {
+  if (Magic() != nullptr) return;
+  // No decompression (MAGIC_COMPRESS would start helper programs).
+  magic_t magic = magic_open(MAGIC_MIME_TYPE | MAGIC_NO_CHECK_COMPRESS | MAGIC_ERROR);
+  if (magic == nullptr) return;
+  if (magic_load(magic, nullptr) != 0) {
+    magic_close(magic);
+    return;
+  }
+  Magic() = magic;
+}
+
+Json::Value ExtractContent(int fd, const std::string& name, bool need_meta) {
+  Json::Value fields(Json::objectValue);
+  const std::string media_type = MediaType(fd);
+  if (!media_type.empty()) fields[kFieldMediaTypes] = media_type;
+
+  Format format;
+  const auto known = FormatsByExtension().find(GetFileExtension(name, true));
+  if (known != FormatsByExtension().end()) {
+    format = known->second;
+  } else if (!FamilyByMediaType(media_type, &format)) {
+    return fields;  // a file we have nothing to read from: its name and status suffice
+  }
+
+  TextSink text;
+  switch (format.family) {
+    case Family::kText:
+      ExtractPlainText(fd, text);
+      break;
+    case Family::kHtml:
+      ExtractHtml(fd, text, fields);
+      break;
+    case Family::kXml:
+      ExtractXml(fd, text);
+      break;
+    case Family::kPdf:
+      ExtractPdf(fd, text, fields);
+      break;
+    case Family::kOffice:
+      ExtractOffice(fd, format.office, text, fields);
+      break;
+    case Family::kAudio:
+      if (need_meta) ExtractAudio(fd, name, fields);
+      break;
+    case Family::kPhoto:
+      if (need_meta) ExtractPhoto(fd, fields);
+      break;
+    case Family::kVideo:
+      if (need_meta) ExtractVideo(fd, fields);
+      break;
+  }
+  const std::string content = text.Trimmed();
+  if (!content.empty()) fields[kFieldTextContent] = content;
+  return fields;
+}
+
+}  // namespace extract
+}  // namespace platform
+}  // namespace corvlumex

@@ -1,0 +1,48 @@
+// Collects the text content of one document as valid UTF-8, up to a fixed
+// cap, so no file can make the index entry (or the worker's reply) grow
+// without bound.
+#pragma once
+
+#include <cstddef>
+#include <string>
+
+namespace corvlumex {
+namespace platform {
+namespace extract {
+
+// The text content kept per document: 1 MiB of UTF-8.
+constexpr size_t kTextContentCap = 1u << 20;
+
+class TextSink {
+ public:
+  explicit TextSink(size_t cap = kTextContentCap) : cap_(cap) {}
+
+  // Appends text: invalid UTF-8 becomes U+FFFD, control characters other
+  // than tab and line breaks become blanks, and a character that would cross
+  // the cap is dropped together with everything after it.
+  void Append(const char* data, size_t size);
+  void Append(const std::string& text) { Append(text.data(), text.size()); }
+  // Separates blocks (paragraphs, cells, pages) with one line break.
+  void Break();
+  // Separates words with one blank.
+  void Space();
+
+  bool full() const { return full_; }
+  const std::string& text() const { return text_; }
+  // The text without blanks and line breaks at either end.
+  std::string Trimmed() const;
+
+ private:
+  void Put(const char* bytes, size_t size);
+
+  size_t cap_;
+  bool full_ = false;
+  std::string text_;
+};
+
+// Text made valid UTF-8 the same way and trimmed (for metadata values).
+std::string CleanUtf8(const std::string& text);
+
+}  // namespace extract
+}  // namespace platform
+}  // namespace corvlumex

@@ -1,0 +1,148 @@
+#include "platform/linux/extract/worker_main.h"
+
+#include <fcntl.h>
+#include <signal.h>
+#include <sys/socket.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <new>
+#include <vector>
+
+#include "common/error.h"
+#include "common/json_util.h"
+#include "common/log.h"
+#include "fileindex/communication.h"
+#include "platform/linux/extract/parsers/extract_content.h"
+#include "platform/linux/extract/parsers/file_bytes.h"
+#include "platform/linux/extract/parsers/formats.h"
+#include "platform/linux/extract/worker_protocol.h"
+
+namespace corvlumex {
+namespace platform {
+namespace extract {
+namespace {
+
+// Test-only misbehaviour, so the tests can show what the indexer does when a
+// parser loops, crashes or eats memory without needing such a file:
+// CORVLUMEX_EXTRACT_TEST_HOOK=spin|crash|hog|probe.
+std::string Outcome(const char* what, bool succeeded) {
+  std::string text = std::string(what) + ": " + (succeeded ? "allowed" : strerror(errno));
+  errno = 0;
+  return text;
+}
+
+// What the confinement lets this process do, as the failure text.
+[[noreturn]] void ProbeConfinement() {
+  std::string report = "probe: ";
+  const int sock = socket(AF_INET, SOCK_STREAM, 0);
+  report += Outcome("socket", sock >= 0) + "; ";
+  if (sock >= 0) close(sock);
+  const pid_t child = fork();
+  if (child == 0) _exit(0);
+  report += Outcome("fork", child > 0) + "; ";
+  if (child > 0) waitpid(child, nullptr, 0);
+  char* const argv[] = {const_cast<char*>("/bin/true"), nullptr};
+  report += Outcome("exec", execv("/bin/true", argv) == 0) + "; ";
+  const std::string scratch = "/tmp/corvcontentextractd-probe-" + std::to_string(getpid());
+  const int file = open(scratch.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0600);
+  bool written = false;
+  if (file >= 0) {
+    written = write(file, "x", 1) == 1;
+    if (!written) report += Outcome("write file", false) + "; ";
+    close(file);
+    unlink(scratch.c_str());
+  } else {
+    report += Outcome("open file", false) + "; ";
+  }
+  if (written) report += "write file: allowed; ";
+  report += "uid " + std::to_string(geteuid());
+  throw ExtractError(report);
+}
+
+void RunTestHook(const WorkerLimits& limits) {
+  const char* hook = std::getenv("CORVLUMEX_EXTRACT_TEST_HOOK");
+  if (hook == nullptr) return;
+  if (strcmp(hook, "spin") == 0) {
+    volatile unsigned long counter = 0;
+    for (;;) counter = counter + 1;
+  }
+  if (strcmp(hook, "crash") == 0) raise(SIGSEGV);
+  if (strcmp(hook, "probe") == 0) ProbeConfinement();
+  if (strcmp(hook, "hog") == 0) {
+    // Stops by itself at four times the limit, should the limit be missing.
+    std::vector<char*> blocks;
+    const size_t block = 16u << 20;
+    for (size_t total = 0; total < (static_cast<size_t>(limits.memory_mb) << 22); total += block) {
+      char* memory = new char[block];
+      memset(memory, 1, block);
+      blocks.push_back(memory);
+    }
+    for (char* memory : blocks) delete[] memory;
+  }
+}
+
+Json::Value Answer(int fd, const Json::Value& request, const WorkerLimits& limits) {
+  Json::Value reply(Json::objectValue);
+  try {
+    RunTestHook(limits);
+    reply["fields"] = ExtractContent(fd, request["name"].asString(), request["need_meta"].asBool());
+    reply["ok"] = true;
+  } catch (const std::bad_alloc&) {
+    reply["ok"] = false;
+    reply["error"] = "out of memory (the worker may use " + std::to_string(limits.memory_mb) + " MiB)";
+  } catch (const std::exception& error) {
+    reply["ok"] = false;
+    reply["error"] = error.what();
+  } catch (...) {
+    reply["ok"] = false;
+    reply["error"] = "the parser failed";
+  }
+  return reply;
+}
+
+}  // namespace
+
+int RunWorker(int socket, const WorkerLimits& limits) {
+  signal(SIGPIPE, SIG_IGN);
+  // Nothing of ours goes to syslog from inside the confinement (no sockets):
+  // problems travel back in the replies.
+  SetLogSink([](int, const std::string& line) { fprintf(stderr, "corvcontentextractd: %s\n", line.c_str()); });
+  SilenceParserLibraries();
+  InitContentDetection();
+  try {
+    ConfineWorker(limits);
+  } catch (const std::exception& error) {
+    fprintf(stderr, "corvcontentextractd: %s\n", error.what());
+    return 1;
+  }
+  for (;;) {
+    const int fd = ReceiveDescriptor(socket);
+    if (fd < 0) return errno == 0 ? 0 : 1;
+    Json::Value request;
+    try {
+      if (!JsonFromString(request, fileindex::ReadFrame(socket)) || !request.isObject()) {
+        close(fd);
+        return 1;
+      }
+    } catch (const Error&) {
+      close(fd);
+      return 1;
+    }
+    RenewCpuAllowance(limits);
+    const Json::Value reply = Answer(fd, request, limits);
+    close(fd);
+    try {
+      fileindex::WriteFrame(socket, JsonToString(reply));
+    } catch (const Error&) {
+      return 1;
+    }
+  }
+}
+
+}  // namespace extract
+}  // namespace platform
+}  // namespace corvlumex

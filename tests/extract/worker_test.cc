@@ -1,0 +1,255 @@
+// Extraction through the platform hook, as the indexer calls it: a confined
+// worker process per call site, failures as errors for one file, and the
+// next file always served.
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <cstdlib>
+
+#include "common/error.h"
+#include "platform/linux/extract/document_fields.h"
+#include "platform/linux/extract/worker_client.h"
+#include "platform/linux/linux_platform.h"
+#include "tests/extract/samples.h"
+#include "tests/support/log_capture.h"
+
+namespace corvlumex {
+namespace platform {
+namespace extract {
+namespace {
+
+using testing_support::MakeOffice;
+using testing_support::MakePdf;
+using testing_support::RunTool;
+using testing_support::SandboxRoot;
+using testing_support::Truncate;
+using testing_support::WriteBytes;
+
+class WorkerTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    const char* build = std::getenv("FILEINDEX_BUILD_DIR");
+    ASSERT_NE(nullptr, build) << "the tests run from ctest, which names the build folder";
+    setenv("CORVLUMEX_EXTRACT_WORKER",
+           (std::string(build) + "/programs/corvcontentextractd/corvcontentextractd").c_str(), 1);
+    unsetenv("CORVLUMEX_EXTRACT_TEST_HOOK");
+    unsetenv("CORVLUMEX_EXTRACT_TIMEOUT_MS");
+    StopIdleExtractWorkers();
+  }
+  void TearDown() override {
+    unsetenv("CORVLUMEX_EXTRACT_TEST_HOOK");
+    unsetenv("CORVLUMEX_EXTRACT_TIMEOUT_MS");
+    StopIdleExtractWorkers();
+  }
+
+  std::string PathOf(const std::string& name) const { return root_.path() + "/" + name; }
+
+  Json::Value Parse(const std::string& name, bool need_meta = true) {
+    Json::Value options(Json::objectValue);
+    options["need_meta"] = need_meta;
+    Json::Value document;
+    platform_.ParseFile(PathOf(name), options, document);
+    return document;
+  }
+
+  // The reason of the Error a parse gives; fails the test when it succeeds.
+  std::string FailureOf(const std::string& name) {
+    try {
+      Parse(name);
+    } catch (const Error& error) {
+      EXPECT_EQ(kErrorParseDocument, error.code);
+      return error.reason;
+    }
+    ADD_FAILURE() << name << " was expected to fail";
+    return std::string();
+  }
+
+  // Switches the worker's behaviour for the workers started from now on.
+  void UseHook(const char* hook) {
+    setenv("CORVLUMEX_EXTRACT_TEST_HOOK", hook, 1);
+    StopIdleExtractWorkers();
+  }
+
+  SandboxRoot root_{false};
+  LinuxPlatform platform_;
+  testing_support::LogCapture log_;
+};
+
+TEST_F(WorkerTest, DocumentHasFileFieldsAndContentFields) {
+  MakePdf(PathOf("report.pdf"), {"Budget for the year"}, "Budget", "Finance Team");
+  const Json::Value document = Parse("report.pdf", false);
+  EXPECT_EQ(PathOf("report.pdf"), document[kFieldPath].asString());
+  EXPECT_EQ(root_.path(), document[kFieldParent].asString());
+  EXPECT_EQ("report.pdf", document[kFieldFSName].asString());
+  EXPECT_EQ("pdf", document[kFieldExtension].asString());
+  EXPECT_EQ("Budget for the year", document[kFieldTextContent].asString());
+  EXPECT_EQ("Budget", document[kFieldTitle].asString());
+  EXPECT_EQ("application/pdf", document[kFieldMediaTypes].asString());
+}
+
+TEST_F(WorkerTest, EveryFormatThroughTheWorker) {
+  MakeOffice(PathOf("a.docx"), "docx", {"docx words"}, "T", "A");
+  MakeOffice(PathOf("a.epub"), "epub", {"epub words"}, "T", "A");
+  WriteBytes(PathOf("a.txt"), "text words");
+  RunTool("ffmpeg -nostdin -loglevel error -y -f lavfi -i sine=duration=1 -metadata title=Tune " + PathOf("a.ogg"));
+  RunTool("ffmpeg -nostdin -loglevel error -y -f lavfi -i testsrc=size=32x32:rate=5:duration=1 -c:v mpeg4 " +
+          PathOf("a.mkv"));
+  RunTool("ffmpeg -nostdin -loglevel error -y -f lavfi -i testsrc=size=32x32 -frames:v 1 " + PathOf("a.tif"));
+  RunTool("exiftool -q -overwrite_original -Make=Nikon " + PathOf("a.tif"));
+  EXPECT_EQ("docx words", Parse("a.docx")[kFieldTextContent].asString());
+  EXPECT_EQ(0u, Parse("a.epub")[kFieldTextContent].asString().find("epub words"));
+  EXPECT_EQ("text words", Parse("a.txt")[kFieldTextContent].asString());
+  EXPECT_EQ("Tune", Parse("a.ogg")[kFieldTitle].asString());
+  EXPECT_EQ("mpeg4", Parse("a.mkv")[kFieldCodecs].asString());
+  EXPECT_EQ("Nikon", Parse("a.tif")[kFieldMake].asString());
+}
+
+TEST_F(WorkerTest, TruncatedAndGarbageFilesOfEveryTypeFailAloneOrGiveWhatTheyHold) {
+  MakePdf(PathOf("whole.pdf"), {"Some words"}, "T", "A");
+  MakeOffice(PathOf("whole.docx"), "docx", {"words"}, "T", "A");
+  MakeOffice(PathOf("whole.odt"), "odt", {"words"}, "T", "A");
+  MakeOffice(PathOf("whole.epub"), "epub", {"words"}, "T", "A");
+  RunTool("ffmpeg -nostdin -loglevel error -y -f lavfi -i sine=duration=1 " + PathOf("whole.mp3"));
+  RunTool("ffmpeg -nostdin -loglevel error -y -f lavfi -i testsrc=size=32x32:rate=5:duration=1 -c:v mpeg4 " +
+          PathOf("whole.mp4"));
+  RunTool("ffmpeg -nostdin -loglevel error -y -f lavfi -i testsrc=size=32x32 -frames:v 1 " + PathOf("whole.jpg"));
+  RunTool("exiftool -q -overwrite_original -Make=Canon " + PathOf("whole.jpg"));
+  WriteBytes(PathOf("whole.html"), "<html><body><p>words</p></body></html>");
+  std::string noise;
+  unsigned int state = 12345;
+  for (int i = 0; i < 40000; ++i) noise += static_cast<char>((state = state * 1103515245 + 12345) >> 16);
+  for (const char* ext : {"pdf", "docx", "odt", "epub", "mp3", "mp4", "jpg", "html"}) {
+    const std::string whole = std::string("whole.") + ext;
+    const size_t size = testing_support::ReadBytes(PathOf(whole)).size();
+    for (size_t cut : {size / 2, size / 5, static_cast<size_t>(3)}) {
+      const std::string name = "cut" + std::to_string(cut) + "." + ext;
+      Truncate(PathOf(whole), PathOf(name), cut);
+      try {
+        const Json::Value document = Parse(name);
+        EXPECT_EQ(PathOf(name), document[kFieldPath].asString());
+      } catch (const Error& error) {
+        EXPECT_EQ(kErrorParseDocument, error.code) << name;
+        EXPECT_FALSE(error.reason.empty()) << name;
+      }
+    }
+    const std::string garbage = std::string("garbage.") + ext;
+    WriteBytes(PathOf(garbage), noise);
+    try {
+      Parse(garbage);
+    } catch (const Error& error) {
+      EXPECT_EQ(kErrorParseDocument, error.code) << garbage;
+    }
+    // Whatever happened, the next file is served.
+    EXPECT_EQ(PathOf(whole), Parse(whole)[kFieldPath].asString()) << ext;
+  }
+}
+
+TEST_F(WorkerTest, ALoopingParserIsStoppedAtTheTimeLimit) {
+  WriteBytes(PathOf("loop.txt"), "words");
+  setenv("CORVLUMEX_EXTRACT_TIMEOUT_MS", "300", 1);
+  UseHook("spin");
+  const auto start = std::chrono::steady_clock::now();
+  const std::string reason = FailureOf("loop.txt");
+  const auto took = std::chrono::steady_clock::now() - start;
+  EXPECT_NE(std::string::npos, reason.find("longer than 300 ms")) << reason;
+  EXPECT_LT(took, std::chrono::seconds(5));
+  EXPECT_EQ(1u, log_.Matching("loop.txt failed: extraction took longer").size());
+  UseHook("");
+  EXPECT_EQ("words", Parse("loop.txt")[kFieldTextContent].asString());
+}
+
+TEST_F(WorkerTest, ACrashingParserFailsOnlyThatFile) {
+  WriteBytes(PathOf("a.txt"), "alpha");
+  UseHook("crash");
+  const std::string reason = FailureOf("a.txt");
+  EXPECT_NE(std::string::npos, reason.find("signal 11")) << reason;
+  UseHook("");
+  EXPECT_EQ("alpha", Parse("a.txt")[kFieldTextContent].asString());
+}
+
+TEST_F(WorkerTest, AMemoryHungryParserHitsTheLimit) {
+#if defined(__SANITIZE_ADDRESS__)
+  GTEST_SKIP() << "the sanitizer build runs the worker without an address-space limit";
+#endif
+  WriteBytes(PathOf("a.txt"), "alpha");
+  setenv("CORVLUMEX_EXTRACT_MEMORY_MB", "256", 1);
+  UseHook("hog");
+  const std::string reason = FailureOf("a.txt");
+  unsetenv("CORVLUMEX_EXTRACT_MEMORY_MB");
+  EXPECT_NE(std::string::npos, reason.find("out of memory (the worker may use 256 MiB)")) << reason;
+}
+
+TEST_F(WorkerTest, TheWorkerIsConfined) {
+  WriteBytes(PathOf("a.txt"), "alpha");
+  UseHook("probe");
+  const std::string reason = FailureOf("a.txt");
+  EXPECT_NE(std::string::npos, reason.find("socket: Operation not permitted")) << reason;
+  EXPECT_NE(std::string::npos, reason.find("fork: Operation not permitted")) << reason;
+  EXPECT_NE(std::string::npos, reason.find("exec: Operation not permitted")) << reason;
+  EXPECT_NE(std::string::npos, reason.find("write file: File too large")) << reason;
+  if (getuid() == 0) {
+    EXPECT_NE(std::string::npos, reason.find("uid 65534")) << reason;
+  }
+}
+
+TEST_F(WorkerTest, UnreadableFileIsAnErrorNamingTheCause) {
+  WriteBytes(PathOf("secret.txt"), "hidden");
+  ASSERT_EQ(0, chmod(PathOf("secret.txt").c_str(), 0));
+  ASSERT_EQ(0, chmod(root_.path().c_str(), 0755));
+  // Root reads everything: look at the file as an ordinary user would.
+  const bool as_root = geteuid() == 0;
+  if (as_root) {
+    ASSERT_EQ(0, seteuid(65534));
+  }
+  std::string reason;
+  try {
+    Parse("secret.txt");
+  } catch (const Error& error) {
+    reason = error.reason;
+  }
+  if (as_root) {
+    ASSERT_EQ(0, seteuid(0));
+  }
+  EXPECT_NE(std::string::npos, reason.find("cannot open " + PathOf("secret.txt") + ": Permission denied")) << reason;
+  EXPECT_NE(std::string::npos, FailureOf("missing.txt").find("No such file or directory"));
+}
+
+TEST_F(WorkerTest, LinksPipesAndFoldersAreNotOpened) {
+  ASSERT_EQ(0, symlink("/etc/passwd", PathOf("passwd.txt").c_str()));
+  ASSERT_EQ(0, mkfifo(PathOf("pipe.txt").c_str(), 0644));
+  root_.MakeDir("folder");
+  const Json::Value link = Parse("passwd.txt");
+  EXPECT_FALSE(link.isMember(kFieldTextContent));
+  EXPECT_EQ('l', link[kFieldPrivilege].asString()[0]);
+  EXPECT_FALSE(Parse("pipe.txt").isMember(kFieldTextContent));
+  EXPECT_TRUE(Parse("folder")[kFieldIsDir].asBool());
+}
+
+TEST_F(WorkerTest, AMissingWorkerIsAClearError) {
+  WriteBytes(PathOf("a.txt"), "alpha");
+  setenv("CORVLUMEX_EXTRACT_WORKER", PathOf("no-such-worker").c_str(), 1);
+  EXPECT_NE(std::string::npos, FailureOf("a.txt").find("corvcontentextractd was not found"));
+}
+
+TEST_F(WorkerTest, PrintShowsTheDocumentAsJson) {
+  WriteBytes(PathOf("note.txt"), "print me");
+  const std::string out = PathOf("out.json");
+  const std::string program = std::getenv("CORVLUMEX_EXTRACT_WORKER");
+  unsetenv("CORVLUMEX_EXTRACT_WORKER");
+  const int status = std::system((program + " --print " + PathOf("note.txt") + " > " + out).c_str());
+  EXPECT_EQ(0, status);
+  Json::Value printed;
+  Json::Reader().parse(testing_support::ReadBytes(out), printed);
+  EXPECT_EQ("print me", printed[kFieldTextContent].asString());
+  EXPECT_EQ(PathOf("note.txt"), printed[kFieldPath].asString());
+  EXPECT_NE(0, std::system((program + " --print " + PathOf("missing") + " 2>/dev/null").c_str()));
+  EXPECT_NE(0, std::system((program + " --bogus 2>/dev/null").c_str()));
+}
+
+}  // namespace
+}  // namespace extract
+}  // namespace platform
+}  // namespace corvlumex
