@@ -32,6 +32,9 @@ namespace extract {
 namespace {
 
 constexpr size_t kMaxIdleWorkers = 2;
+// How long a worker that hung up may take to exit before it is killed.
+constexpr std::chrono::milliseconds kExitGraceStep(5);
+constexpr int kExitGraceSteps = 100;
 
 long EnvNumber(const char* name, long fallback, long low, long high) {
   const char* text = std::getenv(name);
@@ -175,12 +178,21 @@ class WorkerProcess {
     setsockopt(socket_, SOL_SOCKET, SO_RCVTIMEO, &receive_timeout, sizeof(receive_timeout));
   }
 
-  // Why the worker ended without a reply, from its exit status.
+  // Why the worker ended without a reply, from its exit status. A worker
+  // that hung up but lingers gets a short grace, then is killed.
   std::string DeathReason() {
     int status = 0;
-    pid_t reaped;
-    while ((reaped = waitpid(pid_, &status, 0)) < 0 && errno == EINTR) {
+    pid_t reaped = 0;
+    for (int attempt = 0; attempt < kExitGraceSteps && reaped == 0; ++attempt) {
+      reaped = waitpid(pid_, &status, WNOHANG);
+      if (reaped == 0) SleepFor(kExitGraceStep);
     }
+    if (reaped == 0) {
+      kill(pid_, SIGKILL);
+      while ((reaped = waitpid(pid_, &status, 0)) < 0 && errno == EINTR) {
+      }
+    }
+    errno = 0;
     if (reaped != pid_) return "the extraction worker ended without a reply";
     // Reaped here: the destructor's kill and wait must not touch a reused pid.
     pid_ = -1;
