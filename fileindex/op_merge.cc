@@ -1,0 +1,250 @@
+// Folding events into the tree: the merge rules between a new operation and
+// the ones already pending on its path, and the rename that carries
+// pending work from the old path to the new one.
+#include "common/error.h"
+#include "fileindex/optree.h"
+
+namespace corvlumex {
+namespace fileindex {
+
+// The incoming handler, i.e. the column of the merge table.
+enum class OPTree::Column { kCreate, kModify, kAttr, kDelete, kUpdateCfg, kReindex };
+
+namespace {
+
+
+enum Effect : uint8_t {
+  kDrop,            // the new OP is cancelled
+  kKeep,            // both stay
+  kToDeleteDrop,    // existing becomes a delete, new cancelled
+  kToUpsertDrop,    // existing becomes an upsert, new cancelled
+  kToCfgDrop,       // existing becomes update-settings with the new data, new cancelled
+  kMergeCfgDrop,    // existing ORs in the new settings, new cancelled
+  kToReindexDrop,   // existing becomes a reindex, new cancelled
+};
+
+// Rows: the existing OP's kind (1..6); columns: Create, Modify, Attr,
+// Delete, UpdateCfg, Reindex. The asymmetries are intended: a modify after
+// a delete is dropped while a create after a delete makes it an upsert, and
+// a delete after update-settings or a reindex is kept as a second OP. A
+// pending rename never merges: later work is appended after it.
+constexpr Effect kMergeTable[7][6] = {
+    /* 0 none    */ {kKeep, kKeep, kKeep, kKeep, kKeep, kKeep},
+    /* 1 delete  */ {kToUpsertDrop, kDrop, kDrop, kDrop, kDrop, kDrop},
+    /* 2 upsert  */ {kDrop, kDrop, kDrop, kToDeleteDrop, kToCfgDrop, kToReindexDrop},
+    /* 3 attr    */ {kToUpsertDrop, kToUpsertDrop, kDrop, kToDeleteDrop, kToCfgDrop, kToReindexDrop},
+    /* 4 cfg     */ {kDrop, kDrop, kDrop, kKeep, kMergeCfgDrop, kToReindexDrop},
+    /* 5 rename  */ {kKeep, kKeep, kKeep, kKeep, kKeep, kKeep},
+    /* 6 reindex */ {kDrop, kDrop, kDrop, kKeep, kDrop, kDrop},
+};
+
+void ApplyRule(OP& existing, OP& incoming, int column) {
+  const int row = existing.op_;
+  if (row < 0 || row > 6) return;  // a kind this table does not know is left alone
+  switch (kMergeTable[row][column]) {
+    case kKeep: return;
+    case kDrop: break;
+    case kToDeleteDrop: existing.op_ = kOPDelete; break;
+    case kToUpsertDrop: existing.op_ = kOPUpsert; break;
+    case kToCfgDrop:
+      existing.op_ = kOPUpdateCfg;
+      existing.data_ = incoming.data_;
+      break;
+    case kMergeCfgDrop: existing.MergeData(incoming.data_); break;
+    case kToReindexDrop: existing.op_ = kOPReindex; break;
+  }
+  incoming.op_ = kOPNone;
+}
+
+// Post-order over the strict descendants of `node`, children in creation
+// order, each node's children as they were when the walk entered it.
+// Nodes are never removed while the tree lives, so raw pointers are safe.
+template <typename Fn>
+void ForEachDescendantPostOrder(OPNode* node, Fn fn) {
+  struct Frame {
+    OPNode* node;
+    size_t next;
+    size_t end;
+  };
+  std::vector<Frame> stack{{node, 0, node->Children().size()}};
+  while (!stack.empty()) {
+    Frame& top = stack.back();
+    if (top.next < top.end) {
+      OPNode* child = top.node->Children()[top.next++].get();
+      stack.push_back({child, 0, child->Children().size()});
+      continue;
+    }
+    OPNode* done = top.node;
+    stack.pop_back();
+    if (!stack.empty()) fn(done);
+  }
+}
+
+}  // namespace
+
+void OPTree::InsertEvent(std::shared_ptr<Event> event) {
+  const std::shared_ptr<OPNode> node = Resolve(event->path);
+  const std::shared_ptr<OP> op = std::make_shared<OP>(node, kOPNone, std::string(), Json::Value());
+  // Every bit is tested on its own and the same OP goes to every handler
+  // that fires. Directory creates and deletes become reindexes.
+  if (event->event & kEventCreate) event->is_dir ? HandleReindex(node, op) : HandleCreate(node, op);
+  if (event->event & kEventAttr) HandleAttr(node, op);
+  if (event->event & kEventModify) HandleModify(node, op);
+  if (event->event & kEventDelete) event->is_dir ? HandleReindex(node, op) : HandleDelete(node, op);
+  if (event->event & kEventRename) {
+    op->path_ = event->path_old;
+    HandleRename(node, op);
+  }
+  if (event->event & kEventReindex) HandleReindex(node, op);
+  if (event->event & kEventUpdateCfg) {
+    op->data_ = event->data;
+    HandleUpdateCfg(node, op);
+  }
+  if (event->event & kEventQueueCrash) crashed_ = true;
+}
+
+void OPTree::Append(OPNode* node, const std::shared_ptr<OP>& op) {
+  ops_.push_back(op);
+  node->ops_.push_back(op);
+}
+
+void OPTree::AppendIfLive(OPNode* node, const std::shared_ptr<OP>& op) {
+  if (op->op_ != kOPNone) Append(node, op);
+}
+
+void OPTree::Merge(OPNode* node, OP& op, FileIndexOP kind, Column column) {
+  op.op_ = kind;
+  // The rules only change kinds and data, never the list, so walking it by
+  // index sees exactly the OPs that were there when the walk began.
+  const size_t count = node->ops_.size();
+  for (size_t i = 0; i < count; ++i) {
+    OP& existing = *node->ops_[i];
+    if (existing.op_ != kOPNone) ApplyRule(existing, op, static_cast<int>(column));
+  }
+}
+
+void OPTree::HandleCreate(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  Merge(node.get(), *op, kOPUpsert, Column::kCreate);
+  AppendIfLive(node.get(), op);
+}
+
+void OPTree::HandleModify(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  Merge(node.get(), *op, kOPUpsert, Column::kModify);
+  AppendIfLive(node.get(), op);
+}
+
+void OPTree::HandleAttr(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  Merge(node.get(), *op, kOPAttr, Column::kAttr);
+  AppendIfLive(node.get(), op);
+}
+
+void OPTree::HandleDelete(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  Merge(node.get(), *op, kOPDelete, Column::kDelete);
+  AppendIfLive(node.get(), op);
+}
+
+void OPTree::HandleUpdateCfg(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  Merge(node.get(), *op, kOPUpdateCfg, Column::kUpdateCfg);
+  AppendIfLive(node.get(), op);
+}
+
+void OPTree::HandleReindex(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  Merge(node.get(), *op, kOPReindex, Column::kReindex);
+  // The reindex covers everything below, except renames: documents moved
+  // into this directory from elsewhere still have to leave their old place.
+  ForEachDescendantPostOrder(node.get(), [](OPNode* descendant) {
+    for (const std::shared_ptr<OP>& pending : descendant->ops_) {
+      if (pending->op_ != kOPRename) pending->op_ = kOPNone;
+    }
+  });
+  AppendIfLive(node.get(), op);
+}
+
+void OPTree::MoveOPs(OPNode* from, const std::shared_ptr<OPNode>& to, FileIndexOP min_kind, FileIndexOP* extra) {
+  // Equivalent to: for each live OP of a copy of from->ops_, append it to
+  // to->ops_ and erase its first entry in from->ops_. The erasures are
+  // counted on the OPs and done in one pass, so moving n OPs costs O(n)
+  // even when from and to are the same node.
+  std::vector<std::shared_ptr<OP>>& source = from->ops_;
+  const size_t count = source.size();
+  bool moved = false;
+  for (size_t i = 0; i < count; ++i) {
+    OP& op = *source[i];
+    if (op.op_ == kOPNone || op.op_ < min_kind) continue;
+    if (extra != nullptr && (op.op_ == kOPUpsert || op.op_ == kOPAttr || op.op_ == kOPReindex)) {
+      // Content work of the old path is redone at the new path after the rename.
+      *extra = op.op_;
+      op.op_ = kOPNone;
+    }
+    op.node_ = to;
+    ++op.pending_removals_;
+    to->ops_.push_back(source[i]);
+    moved = true;
+  }
+  if (!moved) return;
+  size_t kept = 0;
+  for (size_t i = 0; i < count; ++i) {
+    OP& op = *source[i];
+    if (op.pending_removals_ > 0) {
+      --op.pending_removals_;
+      continue;
+    }
+    if (kept != i) source[kept] = std::move(source[i]);
+    ++kept;
+  }
+  // When from and to are the same node the moved OPs sit after `count`.
+  std::move(source.begin() + count, source.end(), source.begin() + kept);
+  source.resize(kept + (source.size() - count));
+}
+
+void OPTree::MoveDescendantOPs(OPNode* old_node, const std::shared_ptr<OPNode>& new_node) {
+  // Pending work below the old path follows to the same place below the new
+  // one; deletes stay where they were, their documents are still there.
+  // Post-order like TraverseNodeDescendant. A descendant's target is the new
+  // path followed by its path below the old one; the frames on the stack are
+  // exactly its ancestors, so each keeps its own target once resolved and
+  // no path is ever rebuilt. Targets are created top-down, when first
+  // needed, as resolving the full new path would create them.
+  struct Frame {
+    OPNode* node;
+    size_t next;
+    size_t end;
+    std::shared_ptr<OPNode> target;
+  };
+  std::vector<Frame> stack;
+  stack.push_back({old_node, 0, old_node->children_.size(), new_node});
+  while (!stack.empty()) {
+    Frame& top = stack.back();
+    if (top.next < top.end) {
+      OPNode* child = top.node->children_[top.next++].get();
+      stack.push_back({child, 0, child->children_.size(), nullptr});
+      continue;
+    }
+    if (stack.size() == 1) break;  // the old node itself was handled by the caller
+    size_t resolved = stack.size() - 1;
+    while (!stack[resolved].target) --resolved;
+    for (size_t i = resolved + 1; i < stack.size(); ++i) {
+      stack[i].target = stack[i - 1].target->ChildEntry(stack[i].node->name_);
+    }
+    MoveOPs(top.node, top.target, kOPUpsert, nullptr);
+    stack.pop_back();
+  }
+}
+
+void OPTree::HandleRename(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  const std::string old_path = op->path_;
+  const std::shared_ptr<OPNode> old_node = Resolve(old_path);
+  FileIndexOP extra = kOPNone;
+  op->op_ = kOPRename;
+  // The rename overwrites whatever was pending at the destination.
+  for (const std::shared_ptr<OP>& pending : node->ops_) {
+    if (pending->op_ == kOPDelete || pending->op_ == kOPUpsert || pending->op_ == kOPAttr) pending->op_ = kOPNone;
+  }
+  MoveOPs(old_node.get(), node, kOPDelete, &extra);
+  MoveDescendantOPs(old_node.get(), node);
+  Append(node.get(), op);
+  if (extra != kOPNone) Append(node.get(), std::make_shared<OP>(node, extra, std::string(), Json::Value()));
+}
+
+}  // namespace fileindex
+}  // namespace corvlumex

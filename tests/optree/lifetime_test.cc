@@ -1,0 +1,84 @@
+// Releasing a tree frees it; an OP a caller holds keeps its path.
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "common/log.h"
+#include "tests/optree/queue_fixture.h"
+
+namespace corvlumex {
+namespace fileindex {
+namespace queue_testing {
+namespace {
+
+class LifetimeTest : public ::testing::Test, public QueueTest {
+ protected:
+  void SetUp() override { log_level = 6; }
+  void TearDown() override { log_level = 7; }
+  testing_support::LogCapture log_;
+};
+
+TEST_F(LifetimeTest, ReleasingTheTreeFreesNodesAndOPs) {
+  auto tree = Build({Line(kEventCreate, "/v/s/a/x"), Line(kEventRename, "/v/s/b", true, "/v/s/a"),
+                     Line(kEventReindex, "/v/s/b"), Line(kEventCreate, "/v/s/c")});
+  std::weak_ptr<OPNode> root = tree->Root();
+  std::weak_ptr<OPNode> leaf = tree->GetNodeByPath("/v/s/b/x");
+  std::weak_ptr<OP> op = tree->Ops().front();
+  tree.reset();
+  EXPECT_TRUE(root.expired());
+  EXPECT_TRUE(leaf.expired());
+  EXPECT_TRUE(op.expired());
+}
+
+TEST_F(LifetimeTest, HeldOPKeepsItsNodeChainOnly) {
+  auto tree = Build({Line(kEventCreate, "/v/s/a/x"), Line(kEventCreate, "/v/s/a/y"), Line(kEventCreate, "/v/t")});
+  std::shared_ptr<OP> held;
+  tree->ProcessOP([&](std::shared_ptr<OP> op) {
+    if (!held) held = op;
+  });
+  std::weak_ptr<OPNode> sibling = tree->GetNodeByPath("/v/s/a/y");
+  std::weak_ptr<OPNode> other = tree->GetNodeByPath("/v/t");
+  std::weak_ptr<OP> other_op = tree->Ops().back();
+  tree.reset();
+  EXPECT_TRUE(sibling.expired());
+  EXPECT_TRUE(other.expired());
+  EXPECT_TRUE(other_op.expired());
+  EXPECT_EQ(held->node_->GetPath(), "/v/s/a/x");
+  EXPECT_EQ(Print(held), "[02] /v/s/a/x");
+}
+
+TEST_F(LifetimeTest, FullReindexOPOutlivesACrashedTree) {
+  auto tree = Build({Line(kEventQueueCrash, "/v/s")});
+  std::shared_ptr<OP> held;
+  tree->ProcessOP([&](std::shared_ptr<OP> op) { held = op; });
+  tree.reset();
+  EXPECT_EQ(held->op_, kOPFullReindex);
+  EXPECT_EQ(held->node_->GetPath(), "");
+}
+
+TEST_F(LifetimeTest, VeryDeepPathsBuildAndReleaseWithoutRecursion) {
+  std::string deep = "/v";
+  for (int i = 0; i < 100000; ++i) deep += "/d";
+  auto tree = Build({Line(kEventCreate, deep), Line(kEventDelete, "/v", true),
+                     Line(kEventRename, "/w", true, "/v/d/d")});
+  std::shared_ptr<OP> held = tree->Ops().front();
+  tree.reset();
+  EXPECT_EQ(held->node_->GetPath().size(), deep.size());
+  held.reset();  // the last owner of a 100,000-node chain
+}
+
+TEST_F(LifetimeTest, FailedConstructionLeavesNothingBehind) {
+  // Not an Error: leaves the constructor, which must still free what it built.
+  const std::string path = WriteQueue({Line(kEventCreate, "/v/s/a"), Line(kEventCreate, "/v/s/b")});
+  struct Throwing {};
+  log_level = 7;
+  corvlumex::SetLogSink([](int, const std::string& line) {
+    if (line.find("/v/s/b") != std::string::npos) throw Throwing();
+  });
+  EXPECT_THROW(OPTree tree(path), Throwing);
+  corvlumex::SetLogSink(nullptr);
+}
+
+}  // namespace
+}  // namespace queue_testing
+}  // namespace fileindex
+}  // namespace corvlumex

@@ -1,0 +1,54 @@
+#include "tests/optree/queue_fixture.h"
+
+#include <sstream>
+
+#include "common/json_util.h"
+
+namespace corvlumex {
+namespace fileindex {
+namespace queue_testing {
+
+std::string Line(unsigned mask, const std::string& path, bool is_dir, const std::string& path_old) {
+  Json::Value line(Json::objectValue);
+  line["event"] = mask;
+  line["is_dir"] = is_dir;
+  line["path"] = path;
+  if (!path_old.empty()) line["path_old"] = path_old;
+  return JsonToString(line);
+}
+
+std::string CfgLine(const std::string& path, const std::string& data_json) {
+  return "{\"event\":131072,\"path\":\"" + path + "\",\"data\":" + data_json + "}";
+}
+
+QueueTest::QueueTest() {}
+
+std::string QueueTest::WriteQueue(const std::vector<std::string>& lines, const std::string& name) {
+  std::string content;
+  for (const std::string& line : lines) content += line + "\n";
+  return WriteRaw(content, name);
+}
+
+std::string QueueTest::WriteRaw(const std::string& content, const std::string& name) {
+  return sandbox_.WriteFile(name, content);
+}
+
+std::shared_ptr<OPTree> QueueTest::Build(const std::vector<std::string>& lines) {
+  return std::make_shared<OPTree>(WriteQueue(lines));
+}
+
+std::string Print(const std::shared_ptr<OP>& op) {
+  std::ostringstream out;
+  out << op;
+  return out.str();
+}
+
+Processed Process(OPTree& tree) {
+  Processed processed;
+  processed.count = tree.ProcessOP([&](std::shared_ptr<OP> op) { processed.ops.push_back(Print(op)); });
+  return processed;
+}
+
+}  // namespace queue_testing
+}  // namespace fileindex
+}  // namespace corvlumex
