@@ -8,6 +8,8 @@
 
 #include <chrono>
 #include <cstdlib>
+#include <thread>
+#include <vector>
 
 #include "common/error.h"
 #include "platform/linux/extract/document_fields.h"
@@ -145,6 +147,57 @@ TEST_F(WorkerTest, TruncatedAndGarbageFilesOfEveryTypeFailAloneOrGiveWhatTheyHol
     // Whatever happened, the next file is served.
     EXPECT_EQ(PathOf(whole), Parse(whole)[kFieldPath].asString()) << ext;
   }
+}
+
+TEST_F(WorkerTest, HostileContainersAndMarkupAreRefusedNotExpanded) {
+  // A part that unpacks to 70 MiB from a few hundred KiB.
+  testing_support::MakeZip(PathOf("bomb.docx"), {{"word/document.xml", std::string(70u << 20, ' ')}});
+  EXPECT_NE(std::string::npos, FailureOf("bomb.docx").find("a part unpacks too large: word/document.xml"));
+  // Entities that would expand to gigabytes.
+  std::string laughs = "<?xml version=\"1.0\"?><!DOCTYPE l [<!ENTITY a \"lol\">";
+  char previous = 'a';
+  for (char name = 'b'; name <= 'k'; ++name, ++previous) {
+    laughs += std::string("<!ENTITY ") + name + " \"" + std::string(10, '&') + "\">";
+    std::string refs;
+    for (int i = 0; i < 10; ++i) refs += std::string("&") + previous + ";";
+    laughs.replace(laughs.rfind(std::string(10, '&')), 10, refs);
+  }
+  laughs += "]><l>start &k; end</l>";
+  WriteBytes(PathOf("laughs.xml"), laughs);
+  try {
+    const Json::Value document = Parse("laughs.xml");
+    EXPECT_LT(document[kFieldTextContent].asString().size(), 1000u);
+  } catch (const Error& error) {
+    EXPECT_EQ(kErrorParseDocument, error.code);
+  }
+}
+
+TEST_F(WorkerTest, ThreadsExtractAtTheSameTime) {
+  for (int i = 0; i < 8; ++i) WriteBytes(PathOf("f" + std::to_string(i) + ".txt"), "text " + std::to_string(i));
+  std::vector<std::thread> threads;
+  std::vector<int> wrong(4, 0);
+  for (int t = 0; t < 4; ++t) {
+    threads.emplace_back([this, t, &wrong] {
+      LinuxPlatform platform;
+      for (int round = 0; round < 5; ++round) {
+        for (int i = 0; i < 8; ++i) {
+          Json::Value options(Json::objectValue), document;
+          platform.ParseFile(PathOf("f" + std::to_string(i) + ".txt"), options, document);
+          if (document[kFieldTextContent].asString() != "text " + std::to_string(i)) ++wrong[t];
+        }
+      }
+    });
+  }
+  for (std::thread& thread : threads) thread.join();
+  EXPECT_EQ(std::vector<int>(4, 0), wrong);
+}
+
+TEST_F(WorkerTest, TestRunsFindTheirBuildsWorkerWithoutSetUp) {
+  WriteBytes(PathOf("a.txt"), "alpha");
+  unsetenv("CORVLUMEX_EXTRACT_WORKER");  // FILEINDEX_BUILD_DIR alone, as ctest sets it
+  EXPECT_EQ(std::string(std::getenv("FILEINDEX_BUILD_DIR")) + "/programs/corvcontentextractd/corvcontentextractd",
+            FindWorkerProgram());
+  EXPECT_EQ("alpha", Parse("a.txt")[kFieldTextContent].asString());
 }
 
 TEST_F(WorkerTest, ALoopingParserIsStoppedAtTheTimeLimit) {

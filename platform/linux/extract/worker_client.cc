@@ -254,6 +254,13 @@ ExtractLimits CurrentExtractLimits() {
 std::string FindWorkerProgram() {
   const char* configured = std::getenv("CORVLUMEX_EXTRACT_WORKER");
   if (configured != nullptr && *configured != '\0') return IsExecutable(configured) ? configured : std::string();
+  // A test run names its build folder; every program started by a test then
+  // finds the worker that was built with it.
+  const char* build = std::getenv("FILEINDEX_BUILD_DIR");
+  if (build != nullptr && *build != '\0') {
+    const std::string built = std::string(build) + "/programs/" + kWorkerProgram + "/" + kWorkerProgram;
+    if (IsExecutable(built)) return built;
+  }
   char self[4096];
   const ssize_t length = readlink("/proc/self/exe", self, sizeof(self) - 1);
   if (length > 0) {

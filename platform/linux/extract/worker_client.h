@@ -23,9 +23,10 @@ struct ExtractLimits {
 // CORVLUMEX_EXTRACT_MEMORY_MB (read at each call; bad values are ignored).
 ExtractLimits CurrentExtractLimits();
 
-// The worker program: $CORVLUMEX_EXTRACT_WORKER, else corvcontentextractd
-// beside the running program, else the package's install path (under the
-// system root). Empty when none is executable.
+// The worker program: $CORVLUMEX_EXTRACT_WORKER, else the one built in
+// $FILEINDEX_BUILD_DIR (test runs), else corvcontentextractd beside the
+// running program, else the package's install path (under the system root).
+// Empty when none is executable.
 std::string FindWorkerProgram();
 
 // Extracts the content fields of the regular file open on `fd` (its full

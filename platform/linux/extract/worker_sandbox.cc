@@ -125,8 +125,10 @@ std::vector<std::string> ConfineWorker(const WorkerLimits& limits) {
   RenewCpuAllowance(limits);
 
   DropRoot();
-  // After the identity change, which clears it: end with the indexer.
-  if (prctl(PR_SET_PDEATHSIG, SIGKILL) != 0) Fail("PR_SET_PDEATHSIG");
+  // No parent-death signal: it follows the thread that started the worker,
+  // not the indexer, and idle workers outlive their starting threads. An
+  // idle worker sees end of stream when the indexer goes; a busy one meets
+  // its CPU limit.
   if (prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) Fail("PR_SET_NO_NEW_PRIVS");
   if (prctl(PR_SET_DUMPABLE, 0) != 0) Fail("PR_SET_DUMPABLE");
   InstallSyscallFilter();
