@@ -62,7 +62,8 @@ void GetShareNamePathByFullPath(std::string& share_name, std::string& share_path
 std::string ReplacePathShare(const std::string& path, const std::string& new_share, const std::string& old_share) {
   // The appended "/" lets a path that ends with the share's name match.
   const size_t pos = (path + "/").find("/" + old_share + "/");
-  CORV_CHECK_THROW(std::string::npos == pos, kErrorBadArgument, "Cannot find share: " + old_share);
+  CORV_CHECK_THROW_TEXT(std::string::npos == pos, "string::npos == pos", kErrorBadArgument,
+                        "Cannot find share: " + old_share);
   const size_t rest = pos + 1 + old_share.size();
   return path.substr(0, pos + 1) + new_share + (rest < path.size() ? path.substr(rest) : std::string());
 }

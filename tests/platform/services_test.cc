@@ -1,0 +1,223 @@
+// Services, programs, the SMB Spotlight switch and the notifier's queue
+// configuration of the Linux platform.
+#include <gtest/gtest.h>
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cstdlib>
+#include <fstream>
+#include <sstream>
+
+#include "common/file_util.h"
+#include "common/json_util.h"
+#include "platform/linux/linux_platform.h"
+#include "tests/support/log_capture.h"
+
+namespace corvlumex {
+namespace platform {
+namespace {
+
+using testing_support::SandboxRoot;
+
+std::string ReadAll(const std::string& path) {
+  std::ifstream input(path);
+  std::stringstream content;
+  content << input.rdbuf();
+  return content.str();
+}
+
+// Sets an environment variable while alive.
+class ScopedEnv {
+ public:
+  ScopedEnv(const char* name, const std::string& value) : name_(name) { setenv(name, value.c_str(), 1); }
+  ~ScopedEnv() { unsetenv(name_); }
+
+ private:
+  const char* name_;
+};
+
+class ServicesTest : public ::testing::Test {
+ protected:
+  std::string RequestLog() const { return ReadAll(root_.path() + "/var/log/corvlumex/service_requests.log"); }
+  // A service command that appends its arguments to <root>/asked.
+  std::string RecordingCommand(int exit_status) const {
+    const std::string script = root_.WriteFile(
+        "bin/svc", "#!/bin/sh\necho \"$@\" >> " + root_.path() + "/asked\nexit " + std::to_string(exit_status) + "\n");
+    chmod(script.c_str(), 0755);
+    return script;
+  }
+
+  SandboxRoot root_;
+  LinuxPlatform platform_;
+};
+
+TEST_F(ServicesTest, InASandboxRequestsAreOnlyRecorded) {
+  EXPECT_EQ(platform_.ServiceStart("corvcontentextractd", true), 0);
+  EXPECT_EQ(platform_.ServiceStop("corvcontentextractd", false), 0);
+  EXPECT_EQ(platform_.ServiceRestart("samba"), 0);
+  EXPECT_EQ(platform_.ServicectlStart("pkg-CorvLumex-fileindexd", kServicectlUpstart), 0);
+  EXPECT_EQ(platform_.ServicectlStop("pkg-CorvLumex-fileindexd", kServicectlUpstart), 0);
+  EXPECT_EQ(RequestLog(),
+            "start corvcontentextractd.service\n"
+            "--no-block stop corvcontentextractd.service\n"
+            "restart smbd.service\n"
+            "start pkg-CorvLumex-fileindexd.service\n"
+            "stop pkg-CorvLumex-fileindexd.service\n");
+  EXPECT_LT(platform_.ServicectlStart("pkg-CorvLumex-fileindexd", 7), 0);
+  EXPECT_LT(platform_.ServiceStart("../etc/passwd", true), 0);
+  EXPECT_LT(platform_.ServiceStart("", true), 0);
+  EXPECT_EQ(LastError().code, kPlatformErrBadArgument);
+}
+
+TEST_F(ServicesTest, TheConfiguredCommandCarriesTheRequest) {
+  root_.WriteFile("etc/corvlumex/service_command", RecordingCommand(0) + "\n");
+  EXPECT_EQ(platform_.ServiceStart("corvcontentextractd", true), 0);
+  EXPECT_EQ(platform_.ServiceRestart("nginx.socket"), 0);
+  EXPECT_EQ(ReadAll(root_.path() + "/asked"), "start corvcontentextractd.service\nrestart nginx.socket\n");
+  EXPECT_EQ(RequestLog(), "");
+
+  // The environment wins over the file; a failing command is a failure.
+  const std::string failing = RecordingCommand(3);
+  ScopedEnv env("CORVLUMEX_SERVICE_COMMAND", failing);
+  EXPECT_LT(platform_.ServiceStop("samba", true), 0);
+  EXPECT_EQ(LastError().code, kPlatformErrService);
+  EXPECT_NE(LastError().message.find("status 3"), std::string::npos) << LastError().message;
+}
+
+TEST_F(ServicesTest, ExecRunsWithoutAShell) {
+  const std::string odd_name = root_.path() + "/a b; rm -rf $HOME";
+  EXPECT_EQ(platform_.Exec("/usr/bin/touch", {odd_name}, kExecDefault), 0);
+  EXPECT_TRUE(IsFileExist(odd_name));
+  EXPECT_EQ(platform_.Exec("/bin/false", {}, kExecDefault), 1);
+  EXPECT_EQ(LastError().code, kPlatformErrExec);
+  EXPECT_EQ(platform_.Exec("touch", {root_.path() + "/found"}, kExecDefault | kExecSearchPath), 0);
+  EXPECT_TRUE(IsFileExist(root_.path() + "/found"));
+  EXPECT_LT(platform_.Exec("touch", {root_.path() + "/nope"}, kExecDefault), 0);  // no PATH search asked for
+  EXPECT_LT(platform_.Exec(root_.path() + "/missing", {}, kExecDefault), 0);
+  EXPECT_NE(LastError().message.find("No such file"), std::string::npos) << LastError().message;
+  EXPECT_LT(platform_.Exec("/bin/sh", {"-c", "kill -9 $$"}, kExecDefault), 0);
+  EXPECT_NE(LastError().message.find("signal 9"), std::string::npos) << LastError().message;
+  EXPECT_LT(platform_.Exec("", {}, kExecDefault), 0);
+  // Not waited for: started is success, a program that cannot start is still reported.
+  EXPECT_EQ(platform_.Exec("/bin/true", {}, kExecNullStdin | kExecNewSession | 0xBA), 0);
+  EXPECT_LT(platform_.Exec(root_.path() + "/missing", {}, kExecNullStdin), 0);
+}
+
+TEST_F(ServicesTest, ExecClosesDescriptorsAndSilencesOutputWhenAsked) {
+  const std::string out = root_.path() + "/out";
+  const std::string script = root_.WriteFile("bin/fds", "#!/bin/sh\nls /proc/self/fd > " + out + "\necho noise\n");
+  chmod(script.c_str(), 0755);
+  // A descriptor the parent left inheritable must not reach the program.
+  // (Far above the descriptor ls opens for its own listing.)
+  const int opened = open("/dev/null", O_RDONLY);
+  const int inherited = fcntl(opened, F_DUPFD, 100);
+  close(opened);
+  ASSERT_GE(inherited, 100);
+  EXPECT_EQ(platform_.Exec(script, {}, kExecWait | kExecCloseFds | kExecNullStdout | kExecNullStderr), 0);
+  std::istringstream listing(ReadAll(out));
+  std::vector<std::string> fds;
+  for (std::string fd; listing >> fd;) fds.push_back(fd);
+  EXPECT_FALSE(fds.empty());
+  EXPECT_EQ(std::count(fds.begin(), fds.end(), std::to_string(inherited)), 0);
+  EXPECT_EQ(platform_.Exec(script, {}, kExecWait | kExecNullStdout), 0);
+  listing = std::istringstream(ReadAll(out));
+  fds.clear();
+  for (std::string fd; listing >> fd;) fds.push_back(fd);
+  EXPECT_EQ(std::count(fds.begin(), fds.end(), std::to_string(inherited)), 1);  // kept when not asked
+  close(inherited);
+}
+
+TEST_F(ServicesTest, SpotlightIsASambaIncludeFile) {
+  EXPECT_EQ(platform_.SMBIsEnableSpotlight(), 0);
+  ASSERT_EQ(platform_.SMBSetSpotlight(true), 0);
+  const std::string include = root_.path() + "/etc/samba/corvlumex-spotlight.conf";
+  EXPECT_NE(ReadAll(include).find("[global]\n\tspotlight = yes\n"), std::string::npos);
+  EXPECT_EQ(platform_.SMBIsEnableSpotlight(), 1);
+  ASSERT_EQ(platform_.SMBSetSpotlight(false), 0);
+  EXPECT_EQ(platform_.SMBIsEnableSpotlight(), 0);
+  root_.WriteFile("etc/samba/corvlumex-spotlight.conf", "[global]\n  Spotlight =  Yes\n");
+  EXPECT_EQ(platform_.SMBIsEnableSpotlight(), 1);
+}
+
+class MonitorQueueTest : public ServicesTest {
+ protected:
+  std::string ConfigFile() const {
+    return root_.path() + "/etc/corvlumex/monitor.d/fileindex@%2Fvolume1%2Fphoto%2F%40eaDir%2Ffileindex.queue.json";
+  }
+  Json::Value Queue() const {
+    Json::Value queue;
+    queue["queue"] = "/volume1/photo/@eaDir/fileindex.queue";
+    Json::Value entry;
+    entry["path"] = "/volume1/photo/2019";
+    entry["mask"] = 65478;
+    entry["ignore"].append("@eaDir");
+    queue["config"].append(entry);
+    return queue;
+  }
+};
+
+TEST_F(MonitorQueueTest, UpsertWritesOneFilePerQueueAndDeleteRemovesIt) {
+  ASSERT_TRUE(platform_.MonitorQueueUpsert(Queue(), "fileindex", kMonitorQueueTypeApplication));
+  Json::Value written;
+  ASSERT_TRUE(JsonFromFile(written, ConfigFile()));
+  EXPECT_EQ(written["queue"], Queue()["queue"]);
+  EXPECT_EQ(written["config"], Queue()["config"]);
+  EXPECT_EQ(written["application"], "fileindex");
+  EXPECT_EQ(written["type"], 1);
+
+  // Replaced whole; a share without folders keeps its queue with a null config.
+  Json::Value empty;
+  empty["queue"] = Queue()["queue"];
+  empty["config"] = Json::Value();
+  ASSERT_TRUE(platform_.MonitorQueueUpsert(empty, "fileindex", kMonitorQueueTypeApplication));
+  ASSERT_TRUE(JsonFromFile(written, ConfigFile()));
+  EXPECT_TRUE(written.isMember("config"));
+  EXPECT_TRUE(written["config"].isNull());
+
+  ASSERT_TRUE(platform_.MonitorQueueDelete(Queue()["queue"].asString(), "fileindex", kMonitorQueueTypeApplication));
+  EXPECT_FALSE(IsFileExist(ConfigFile()));
+  EXPECT_TRUE(platform_.MonitorQueueDelete(Queue()["queue"].asString(), "fileindex", kMonitorQueueTypeApplication));
+}
+
+TEST_F(MonitorQueueTest, QueuesWithSimilarPathsGetTheirOwnFiles) {
+  Json::Value a = Queue(), b = Queue();
+  a["queue"] = "/v/a_b/q";
+  b["queue"] = "/v/a/b_q";
+  ASSERT_TRUE(platform_.MonitorQueueUpsert(a, "fileindex", kMonitorQueueTypeApplication));
+  ASSERT_TRUE(platform_.MonitorQueueUpsert(b, "fileindex", kMonitorQueueTypeApplication));
+  Json::Value long_path = Queue();
+  long_path["queue"] = "/v/" + std::string(300, 'x') + "/q";
+  ASSERT_TRUE(platform_.MonitorQueueUpsert(long_path, "fileindex", kMonitorQueueTypeApplication));
+  int files = 0;
+  for (const char* name : {"fileindex@%2Fv%2Fa_b%2Fq.json", "fileindex@%2Fv%2Fa%2Fb_q.json"}) {
+    files += IsFileExist(root_.path() + "/etc/corvlumex/monitor.d/" + name);
+  }
+  EXPECT_EQ(files, 2);
+}
+
+TEST_F(MonitorQueueTest, MalformedConfigurationsAreRefused) {
+  Json::Value bad = Queue();
+  bad.removeMember("queue");
+  EXPECT_FALSE(platform_.MonitorQueueUpsert(bad, "fileindex", kMonitorQueueTypeApplication));
+  bad = Queue();
+  bad["queue"] = "relative/queue";
+  EXPECT_FALSE(platform_.MonitorQueueUpsert(bad, "fileindex", kMonitorQueueTypeApplication));
+  bad = Queue();
+  bad["config"][0]["mask"] = "all";
+  EXPECT_FALSE(platform_.MonitorQueueUpsert(bad, "fileindex", kMonitorQueueTypeApplication));
+  EXPECT_NE(LastError().message.find("\"mask\""), std::string::npos);
+  bad = Queue();
+  bad["config"] = Json::Value(Json::objectValue);
+  EXPECT_FALSE(platform_.MonitorQueueUpsert(bad, "fileindex", kMonitorQueueTypeApplication));
+  EXPECT_FALSE(platform_.MonitorQueueUpsert(Queue(), "", kMonitorQueueTypeApplication));
+  EXPECT_FALSE(platform_.MonitorQueueUpsert(Queue(), "../x", kMonitorQueueTypeApplication));
+  EXPECT_FALSE(platform_.MonitorQueueUpsert(Queue(), "fileindex", 2));
+  EXPECT_FALSE(platform_.MonitorQueueDelete("relative", "fileindex", kMonitorQueueTypeApplication));
+  EXPECT_FALSE(IsDirExist(root_.path() + "/etc/corvlumex/monitor.d", false));
+}
+
+}  // namespace
+}  // namespace platform
+}  // namespace corvlumex
