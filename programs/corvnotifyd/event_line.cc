@@ -32,7 +32,7 @@ void AppendJsonString(std::string& out, std::string_view text) {
   out += '"';
 }
 
-void AppendQueueLine(std::string& out, uint32_t event, bool is_dir, std::string_view path,
+void FormatQueueLine(std::string& out, uint32_t event, bool is_dir, std::string_view path,
                      std::string_view path_old) {
   out += "{\"event\":";
   out += std::to_string(event);

@@ -24,7 +24,7 @@ enum QueueEventBit : uint32_t {
 
 // Appends one finished line (with its "\n") to `out`. `path_old` is written
 // only when it is not empty.
-void AppendQueueLine(std::string& out, uint32_t event, bool is_dir, std::string_view path,
+void FormatQueueLine(std::string& out, uint32_t event, bool is_dir, std::string_view path,
                      std::string_view path_old = std::string_view());
 
 // Appends `text` as a JSON string literal (quotes included).

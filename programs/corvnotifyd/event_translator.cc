@@ -47,7 +47,7 @@ void EventTranslator::Emit(const std::vector<Target>& targets, uint32_t event, b
                            const std::string& path, const std::string& path_old) {
   for (const Target& target : targets) {
     if ((target.mask & event) == 0) continue;
-    AppendQueueLine(callbacks_.buffer(*target.queue), event, is_dir, path, path_old);
+    FormatQueueLine(callbacks_.buffer(*target.queue), event, is_dir, path, path_old);
   }
 }
 

@@ -184,7 +184,7 @@ void Notifier::WriteDueMarkers(Clock::time_point now, bool shutting_down) {
     std::string reasons;
     for (LossKind kind : loss_kinds_[queue]) reasons += "; " + Remedy(kind);
     loss_kinds_.erase(queue);
-    AppendQueueLine(writer_.Buffer(queue), kEventQueueCrash, true, MarkerPath(queue));
+    FormatQueueLine(writer_.Buffer(queue), kEventQueueCrash, true, MarkerPath(queue));
     backoff.MarkerWritten(now);
     CORV_LOG("events of queue %s were lost (%u time%s): crash marker written, the share is reindexed whole; "
              "next marker no sooner than in %lld s%s",

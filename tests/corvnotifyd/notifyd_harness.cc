@@ -27,9 +27,10 @@ std::string ReadWholeFile(const std::string& path) {
   return text.str();
 }
 
-std::vector<QueueLine> ReadQueue(const std::string& path) {
+std::vector<QueueLine> ReadQueue(const std::string& path) { return ParseQueueText(ReadWholeFile(path)); }
+
+std::vector<QueueLine> ParseQueueText(const std::string& text) {
   std::vector<QueueLine> lines;
-  const std::string text = ReadWholeFile(path);
   // A line still being written (no "\n" yet) is read next time.
   for (size_t start = 0, end; (end = text.find('\n', start)) != std::string::npos; start = end + 1) {
     const std::string raw = text.substr(start, end - start);

@@ -31,6 +31,7 @@ struct QueueLine {
 std::string ReadWholeFile(const std::string& path);
 // Every line of a queue file, parsed; a line that does not parse fails the test.
 std::vector<QueueLine> ReadQueue(const std::string& path);
+std::vector<QueueLine> ParseQueueText(const std::string& text);
 // Polls `condition` (every 2 ms) until it holds or `timeout` passes.
 bool WaitUntil(const std::function<bool()>& condition,
                std::chrono::milliseconds timeout = std::chrono::milliseconds(15000));
