@@ -77,7 +77,7 @@ TEST_F(SendRequestTest, SocketThatAppearsWhileWaitingIsUsed) {
 }
 
 TEST_F(SendRequestTest, SocketFileWithoutListenerFailsToConnect) {
-  root_.WriteFile("/var/run/corvelasticd.sock", "");
+  root_.WriteFile("var/run/corvelasticd.sock", "");
   const Error error = ExchangeError(req_);
   EXPECT_EQ(error.code, kErrorSearchRequest);
   EXPECT_EQ(error.reason, "Connect failed");
