@@ -1,0 +1,633 @@
+#include "programs/corvelasticd/index_store.h"
+
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+#include <unordered_map>
+
+#include "common/json_util.h"
+#include "programs/corvelasticd/daemon_error.h"
+#include "programs/corvelasticd/index_files.h"
+#include "programs/corvelasticd/text_analysis.h"
+
+namespace corvlumex {
+namespace elasticd {
+namespace {
+
+constexpr const char* kDatabaseName = "corvelasticd.db";
+constexpr int kFormatVersion = 1;
+constexpr size_t kMaxTrackedChanges = 100000;
+constexpr size_t kMaxSuggestionTerms = 100000;
+constexpr size_t kFilterBatch = 64;
+constexpr size_t kMaxReaders = 4;
+// Unmapped fields are stored under their name behind this mark, so they
+// never clash with the numbers of mapped fields.
+constexpr char kUnmappedMark = '~';
+
+[[noreturn]] void BadDocument(const std::string& what) { throw DaemonError(kCodeBadDocument, "Bad document: " + what); }
+
+// Values of a field: an array's elements, or the value itself.
+template <typename Visit>
+void ForEachValue(const Json::Value& value, Visit visit) {
+  if (value.isArray()) {
+    for (const Json::Value& element : value) visit(element);
+  } else if (!value.isNull()) {
+    visit(value);
+  }
+}
+
+std::string ValueText(const Json::Value& value) { return value.isString() ? value.asString() : value.asString(); }
+
+std::string JoinTokens(const std::vector<std::string>& tokens) {
+  std::string out;
+  for (const std::string& token : tokens) {
+    if (!out.empty()) out += ' ';
+    out += token;
+  }
+  return out;
+}
+
+SqlValue ColumnValue(const Statement& stmt, int column) {
+  switch (stmt.Type(column)) {
+    case SQLITE_INTEGER: return stmt.Int(column);
+    case SQLITE_FLOAT: return stmt.Real(column);
+    case SQLITE_NULL: return nullptr;
+    default: return stmt.Text(column);
+  }
+}
+
+}  // namespace
+
+std::string IndexStore::DatabasePath(const std::string& directory) { return directory + "/" + kDatabaseName; }
+
+IndexStore::IndexStore(const std::string& path, std::unique_ptr<Database> writer) : path_(path), writer_(std::move(writer)) {}
+
+IndexStore::~IndexStore() {
+  try {
+    Close(true);
+  } catch (const std::exception&) {
+    // Nothing more can be done at destruction; an uncommitted transaction is dropped.
+  }
+}
+
+std::unique_ptr<IndexStore> IndexStore::Create(const std::string& directory, const Json::Value& mappings,
+                                               const Json::Value& settings) {
+  const IndexSchema schema = IndexSchema::FromMappings(mappings);
+  if (directory.empty() || directory[0] != '/') throw DaemonError(kCodeIndexPath, "The index path must be absolute: \"" + directory + "\"");
+  if (!MakeDirectories(directory)) {
+    throw DaemonError(kCodeIndexPath, "Cannot create the index directory " + directory + ": " + strerror(errno));
+  }
+  const std::string path = DatabasePath(directory);
+  struct stat info;
+  if (stat(path.c_str(), &info) == 0) throw DaemonError(kCodeIndexExists, "An index database already exists at " + path);
+  errno = 0;
+  auto db = std::make_unique<Database>(path, true);
+  db->Exec("PRAGMA journal_mode=WAL");
+  db->Exec("PRAGMA synchronous=NORMAL");
+  std::string text_columns, name_columns;
+  for (const FieldSpec* field : schema.TextFields()) text_columns += (text_columns.empty() ? "" : ", ") + field->Column();
+  for (const FieldSpec* field : schema.NgramFields()) name_columns += (name_columns.empty() ? "" : ", ") + field->NameColumn();
+  // An index must have a column; a schema without such fields gets an unused one.
+  if (text_columns.empty()) text_columns = "unused";
+  if (name_columns.empty()) name_columns = "unused";
+  db->Exec("BEGIN");
+  db->Exec("CREATE TABLE meta(name TEXT PRIMARY KEY, value TEXT NOT NULL) WITHOUT ROWID");
+  db->Exec("CREATE TABLE docs(rowid INTEGER PRIMARY KEY, key TEXT NOT NULL, doc TEXT NOT NULL)");
+  db->Exec("CREATE UNIQUE INDEX docs_key ON docs(key)");
+  db->Exec("CREATE VIRTUAL TABLE fts_text USING fts5(" + text_columns + ", content='', tokenize='corvblank')");
+  db->Exec("CREATE VIRTUAL TABLE fts_name USING fts5(" + name_columns + ", content='', tokenize='trigram case_sensitive 1')");
+  db->Exec("CREATE TABLE suggest(field TEXT NOT NULL, term TEXT NOT NULL, freq INTEGER NOT NULL, PRIMARY KEY(field, term)) WITHOUT ROWID");
+  Statement& meta = db->Cached("INSERT INTO meta(name, value) VALUES(?, ?)");
+  for (const auto& [name, value] : std::vector<std::pair<std::string, std::string>>{
+           {"format", std::to_string(kFormatVersion)}, {"mappings", JsonToString(mappings)}, {"settings", JsonToString(settings)}}) {
+    meta.Reset();
+    meta.BindText(1, name);
+    meta.BindText(2, value);
+    meta.Step();
+  }
+  db->Exec("COMMIT");
+  std::unique_ptr<IndexStore> store(new IndexStore(path, std::move(db)));
+  store->LoadSchema();
+  return store;
+}
+
+std::unique_ptr<IndexStore> IndexStore::Open(const std::string& directory) {
+  const std::string path = DatabasePath(directory);
+  struct stat info;
+  if (stat(path.c_str(), &info) != 0) throw DaemonError(kCodeIndexFailed, "The index database is missing: " + path);
+  std::unique_ptr<IndexStore> store(new IndexStore(path, std::make_unique<Database>(path, false)));
+  store->writer_->Exec("PRAGMA journal_mode=WAL");
+  store->writer_->Exec("PRAGMA synchronous=NORMAL");
+  store->LoadSchema();
+  return store;
+}
+
+void IndexStore::LoadSchema() {
+  writer_->Exec("PRAGMA cache_size=-16384");
+  Statement& stmt = writer_->Cached("SELECT value FROM meta WHERE name = 'mappings'");
+  if (!stmt.Step() || !JsonFromString(mappings_, stmt.Text(0))) {
+    throw DaemonError(kCodeIndexFailed, "The index database " + path_ + " has no readable mappings");
+  }
+  stmt.Reset();
+  schema_ = IndexSchema::FromMappings(mappings_);
+  text_fields_ = schema_.TextFields();
+  ngram_fields_ = schema_.NgramFields();
+  auto statements = [](const std::string& table, const std::vector<std::string>& columns, std::string* insert, std::string* remove) {
+    std::string names, marks;
+    for (const std::string& column : columns) {
+      names += ", " + column;
+      marks += ", ?";
+    }
+    *insert = "INSERT INTO " + table + "(rowid" + names + ") VALUES(?" + marks + ")";
+    *remove = "INSERT INTO " + table + "(" + table + ", rowid" + names + ") VALUES('delete', ?" + marks + ")";
+  };
+  std::vector<std::string> text_columns, name_columns;
+  for (const FieldSpec* field : text_fields_) text_columns.push_back(field->Column());
+  for (const FieldSpec* field : ngram_fields_) name_columns.push_back(field->NameColumn());
+  statements("fts_text", text_columns, &insert_text_sql_, &delete_text_sql_);
+  statements("fts_name", name_columns, &insert_name_sql_, &delete_name_sql_);
+}
+
+// ---------------------------------------------------------------- documents
+
+void IndexStore::ValidateDocument(const Json::Value& document) const {
+  if (!document.isObject()) BadDocument("a document must be a JSON object");
+  for (const FieldSpec& field : schema_.fields()) {
+    const bool present = document.isMember(field.name) && !document[field.name].isNull();
+    if (!present) {
+      if (field.required) BadDocument("the required field \"" + field.name + "\" is missing");
+      continue;
+    }
+    const Json::Value& value = document[field.name];
+    if (field.name == schema_.property_id() && (!value.isString() || value.asString().empty())) {
+      BadDocument("the key field \"" + field.name + "\" must be a non-empty string");
+    }
+    ForEachValue(value, [&](const Json::Value& element) {
+      switch (field.kind) {
+        case FieldKind::kNumber:
+          if (!element.isNumeric() || element.isBool()) BadDocument("the field \"" + field.name + "\" must be a number");
+          break;
+        case FieldKind::kBool:
+          if (!element.isBool()) BadDocument("the field \"" + field.name + "\" must be true or false");
+          break;
+        default:
+          if (!element.isString() && !element.isNumeric() && !element.isBool()) {
+            BadDocument("the field \"" + field.name + "\" must be a string or an array of strings");
+          }
+      }
+    });
+  }
+}
+
+std::string IndexStore::EncodeDocument(const Json::Value& document) const {
+  Json::Value stored(Json::objectValue);
+  for (const std::string& name : document.getMemberNames()) {
+    if (name == schema_.property_id()) continue;  // kept once, as the row's key
+    const FieldSpec* field = schema_.Find(name);
+    stored[field != nullptr ? std::to_string(field->code) : kUnmappedMark + name] = document[name];
+  }
+  return JsonToString(stored);
+}
+
+Json::Value IndexStore::DecodeDocument(const std::string& key, const std::string& text) const {
+  Json::Value stored;
+  Json::Value document(Json::objectValue);
+  if (!JsonFromString(stored, text) || !stored.isObject()) return document;
+  for (const std::string& name : stored.getMemberNames()) {
+    if (!name.empty() && name[0] == kUnmappedMark) {
+      document[name.substr(1)] = stored[name];
+    } else if (const FieldSpec* field = schema_.FindCode(atoi(name.c_str()))) {
+      document[field->name] = stored[name];
+    }
+  }
+  document[schema_.property_id()] = key;
+  return document;
+}
+
+Json::Value IndexStore::VisibleFields(const Json::Value& document, const std::vector<std::string>& fields) const {
+  Json::Value out(Json::objectValue);
+  auto add = [&](const std::string& name) {
+    const FieldSpec* field = schema_.Find(name);
+    if (field != nullptr && !field->stored && name != schema_.property_id()) return;
+    if (document.isMember(name)) out[name] = document[name];
+  };
+  if (fields.empty()) {
+    for (const std::string& name : document.getMemberNames()) add(name);
+  } else {
+    for (const std::string& name : fields) add(name);
+  }
+  return out;
+}
+
+bool IndexStore::FindRow(const std::string& key, Row* row) {
+  Statement& stmt = writer_->Cached("SELECT rowid, doc FROM docs WHERE key = ?");
+  stmt.BindText(1, key);
+  const bool found = stmt.Step();
+  if (found) {
+    row->rowid = stmt.Int(0);
+    row->stored = stmt.Text(1);
+  }
+  stmt.Reset();
+  return found;
+}
+
+void IndexStore::IndexEntries(int64_t rowid, const Json::Value& document, bool remove) {
+  // The values handed to a contentless index on removal must be exactly the
+  // ones it was given, so both directions are built here from the document.
+  std::vector<std::string> columns;
+  bool any = false;
+  for (const FieldSpec* field : text_fields_) {
+    std::vector<std::string> tokens;
+    ForEachValue(document[field->name], [&](const Json::Value& value) { Analyze(field->analyzer, ValueText(value), &tokens); });
+    any = any || !tokens.empty();
+    columns.push_back(JoinTokens(tokens));
+  }
+  auto write = [&](const std::string& sql) {
+    Statement& stmt = writer_->Cached(sql);
+    stmt.Bind(1, rowid);
+    for (size_t i = 0; i < columns.size(); ++i) stmt.BindText(static_cast<int>(i + 2), columns[i]);
+    stmt.Step();
+    stmt.Reset();
+  };
+  if (any) write(remove ? delete_text_sql_ : insert_text_sql_);
+  columns.clear();
+  any = false;
+  for (const FieldSpec* field : ngram_fields_) {
+    std::string names;
+    ForEachValue(document[field->name], [&](const Json::Value& value) {
+      if (!names.empty()) names += '\n';
+      names += Fold(ValueText(value), FoldMode::kSearch);
+    });
+    any = any || !names.empty();
+    columns.push_back(names);
+  }
+  if (any) write(remove ? delete_name_sql_ : insert_name_sql_);
+}
+
+void IndexStore::RemoveRow(int64_t rowid, const std::string& key, const std::string& stored) {
+  IndexEntries(rowid, DecodeDocument(key, stored), true);
+  Statement& stmt = writer_->Cached("DELETE FROM docs WHERE rowid = ?");
+  stmt.Bind(1, rowid);
+  stmt.Step();
+  stmt.Reset();
+  NoteDelete(key);
+}
+
+void IndexStore::NoteUpsert(const std::string& key) {
+  deleted_.erase(key);
+  if (upserted_.size() < kMaxTrackedChanges) {
+    upserted_.insert(key);
+  } else {
+    truncated_ = true;
+  }
+}
+
+void IndexStore::NoteDelete(const std::string& key) {
+  upserted_.erase(key);
+  if (deleted_.size() < kMaxTrackedChanges) {
+    deleted_.insert(key);
+  } else {
+    truncated_ = true;
+  }
+}
+
+void IndexStore::Begin() {
+  if (in_transaction_) return;
+  writer_->Exec("BEGIN IMMEDIATE");
+  in_transaction_ = true;
+}
+
+// One request's writes happen whole or not at all, inside the open transaction.
+template <typename Body>
+void IndexStore::Atomically(Body body) {
+  Begin();
+  writer_->Exec("SAVEPOINT request");
+  try {
+    body();
+  } catch (...) {
+    try {
+      writer_->Exec("ROLLBACK TO request");
+      writer_->Exec("RELEASE request");
+    } catch (const std::exception&) {
+      // The first failure is the one worth reporting.
+    }
+    throw;
+  }
+  writer_->Exec("RELEASE request");
+}
+
+void IndexStore::Upsert(const std::string& doc_id, const Json::Value& input) {
+  if (!input.isObject()) BadDocument("\"data\" must be a JSON object");
+  Json::Value document = input;
+  const std::string& id_field = schema_.property_id();
+  if (!document.isMember(id_field) || document[id_field].isNull()) document[id_field] = doc_id;
+  ValidateDocument(document);
+  const std::string key = document[id_field].asString();
+  Atomically([&] {
+    Row row;
+    // A document sent under an old key with a new key value moves to the new key.
+    if (key != doc_id && FindRow(doc_id, &row)) RemoveRow(row.rowid, doc_id, row.stored);
+    const std::string stored = EncodeDocument(document);
+    if (FindRow(key, &row)) {
+      IndexEntries(row.rowid, DecodeDocument(key, row.stored), true);
+      Statement& update = writer_->Cached("UPDATE docs SET doc = ? WHERE rowid = ?");
+      update.BindText(1, stored);
+      update.Bind(2, row.rowid);
+      update.Step();
+      update.Reset();
+      IndexEntries(row.rowid, document, false);
+    } else {
+      Statement& insert = writer_->Cached("INSERT INTO docs(key, doc) VALUES(?, ?)");
+      insert.BindText(1, key);
+      insert.BindText(2, stored);
+      insert.Step();
+      insert.Reset();
+      IndexEntries(sqlite3_last_insert_rowid(writer_->raw()), document, false);
+    }
+    NoteUpsert(key);
+  });
+}
+
+void IndexStore::SetById(const std::string& doc_id, const Json::Value& changes) {
+  if (!changes.isObject()) BadDocument("\"data\" must be a JSON object");
+  Atomically([&] {
+    Row row;
+    if (!FindRow(doc_id, &row)) throw DaemonError(kCodeDocumentNotFound, "No document with the id " + doc_id);
+    const Json::Value old_document = DecodeDocument(doc_id, row.stored);
+    Json::Value document = old_document;
+    JsonApplyChanges(document, changes);
+    ValidateDocument(document);
+    const std::string key = document[schema_.property_id()].asString();
+    IndexEntries(row.rowid, old_document, true);
+    if (key != doc_id) {
+      // A rename over an existing file: the moved document replaces it.
+      Row target;
+      if (FindRow(key, &target)) RemoveRow(target.rowid, key, target.stored);
+      NoteDelete(doc_id);
+    }
+    Statement& update = writer_->Cached("UPDATE docs SET key = ?, doc = ? WHERE rowid = ?");
+    update.BindText(1, key);
+    update.BindText(2, EncodeDocument(document));
+    update.Bind(3, row.rowid);
+    update.Step();
+    update.Reset();
+    IndexEntries(row.rowid, document, false);
+    NoteUpsert(key);
+  });
+}
+
+bool IndexStore::DeleteById(const std::string& doc_id) {
+  bool found = false;
+  Atomically([&] {
+    Row row;
+    found = FindRow(doc_id, &row);
+    if (found) RemoveRow(row.rowid, doc_id, row.stored);
+  });
+  return found;
+}
+
+int64_t IndexStore::DeleteByQuery(const Query& query) {
+  int64_t deleted = 0;
+  Atomically([&] {
+    std::string condition;
+    std::vector<SqlValue> values;
+    query.Compile(false, &condition, &values);
+    std::vector<int64_t> rowids;
+    {
+      auto select = writer_->Prepare("SELECT d.rowid FROM docs d WHERE " + condition);
+      select->BindAll(values);
+      while (select->Step()) rowids.push_back(select->Int(0));
+    }
+    Statement& load = writer_->Cached("SELECT key, doc FROM docs WHERE rowid = ?");
+    for (const int64_t rowid : rowids) {
+      load.Reset();
+      load.Bind(1, rowid);
+      if (!load.Step()) continue;
+      const std::string key = load.Text(0);
+      const std::string stored = load.Text(1);
+      load.Reset();
+      RemoveRow(rowid, key, stored);
+      ++deleted;
+    }
+  });
+  return deleted;
+}
+
+Json::Value IndexStore::GetByQuery(const Query& query, const std::vector<std::string>& fields) {
+  std::string condition;
+  std::vector<SqlValue> values;
+  query.Compile(false, &condition, &values);
+  auto select = writer_->Prepare("SELECT d.key, d.doc FROM docs d WHERE " + condition + " ORDER BY d.key");
+  select->BindAll(values);
+  Json::Value out(Json::arrayValue);
+  while (select->Step()) out.append(VisibleFields(DecodeDocument(select->Text(0), select->Text(1)), fields));
+  return out;
+}
+
+CommitChanges IndexStore::Commit() {
+  CommitChanges changes;
+  if (in_transaction_) {
+    writer_->Exec("COMMIT");
+    in_transaction_ = false;
+  }
+  changes.upserted.assign(upserted_.begin(), upserted_.end());
+  changes.deleted.assign(deleted_.begin(), deleted_.end());
+  changes.truncated = truncated_;
+  upserted_.clear();
+  deleted_.clear();
+  truncated_ = false;
+  return changes;
+}
+
+void IndexStore::Close(bool keep) {
+  if (writer_ == nullptr) return;
+  if (in_transaction_) {
+    writer_->Exec(keep ? "COMMIT" : "ROLLBACK");
+    in_transaction_ = false;
+  }
+  {
+    std::lock_guard<std::mutex> guard(readers_mutex_);
+    readers_.clear();
+  }
+  writer_.reset();
+}
+
+void IndexStore::UpdateSuggestions(const std::string& name) {
+  const FieldSpec* field = schema_.Find(name);
+  if (field == nullptr || !field->HasTextColumn()) {
+    throw DaemonError(kCodeBadArgument, "Suggestions need a text or keyword field; \"" + name + "\" is not one");
+  }
+  Atomically([&] {
+    std::unordered_map<std::string, int64_t> counts;
+    auto scan = writer_->Prepare("SELECT key, doc FROM docs");
+    const Analyzer analyzer = field->kind == FieldKind::kKeyword ? Analyzer::kKeyword : Analyzer::kStandard;
+    while (scan->Step()) {
+      const Json::Value document = DecodeDocument(scan->Text(0), scan->Text(1));
+      std::vector<std::string> tokens;
+      ForEachValue(document[name], [&](const Json::Value& value) { Analyze(analyzer, ValueText(value), &tokens); });
+      std::sort(tokens.begin(), tokens.end());
+      tokens.erase(std::unique(tokens.begin(), tokens.end()), tokens.end());
+      for (const std::string& token : tokens) ++counts[token];
+    }
+    std::vector<std::pair<std::string, int64_t>> terms(counts.begin(), counts.end());
+    if (terms.size() > kMaxSuggestionTerms) {
+      std::nth_element(terms.begin(), terms.begin() + kMaxSuggestionTerms, terms.end(),
+                       [](const auto& a, const auto& b) { return a.second > b.second; });
+      terms.resize(kMaxSuggestionTerms);
+    }
+    Statement& clear = writer_->Cached("DELETE FROM suggest WHERE field = ?");
+    clear.BindText(1, name);
+    clear.Step();
+    clear.Reset();
+    Statement& insert = writer_->Cached("INSERT INTO suggest(field, term, freq) VALUES(?, ?, ?)");
+    for (const auto& [term, count] : terms) {
+      insert.Reset();
+      insert.BindText(1, name);
+      insert.BindText(2, term);
+      insert.Bind(3, count);
+      insert.Step();
+    }
+    insert.Reset();
+  });
+}
+
+// ---------------------------------------------------------------- readers
+
+std::unique_ptr<Database> IndexStore::TakeReader() {
+  {
+    std::lock_guard<std::mutex> guard(readers_mutex_);
+    if (!readers_.empty()) {
+      std::unique_ptr<Database> reader = std::move(readers_.back());
+      readers_.pop_back();
+      return reader;
+    }
+  }
+  auto reader = std::make_unique<Database>(path_, false);
+  reader->Exec("PRAGMA query_only=1");
+  return reader;
+}
+
+void IndexStore::ReturnReader(std::unique_ptr<Database> reader) {
+  std::lock_guard<std::mutex> guard(readers_mutex_);
+  if (readers_.size() < kMaxReaders) readers_.push_back(std::move(reader));
+}
+
+SearchResult IndexStore::Search(const Query& query, const SortSpec& sort, size_t want, size_t check_budget,
+                                const ReadableFilter& readable) {
+  const bool ranked = sort.by == SortSpec::By::kScore && query.HasRankedClause();
+  std::string condition;
+  std::vector<SqlValue> values;
+  if (ranked) values.push_back(query.RankedExpression());
+  query.Compile(ranked, &condition, &values);
+  const std::string from = ranked ? "(SELECT rowid, rank FROM fts_text WHERE fts_text MATCH ?) s JOIN docs d ON d.rowid = s.rowid"
+                                  : "docs d";
+  std::string sort_expression = "NULL";
+  std::string order = "d.key";
+  if (ranked) {
+    order = "s.rank, d.key";
+  } else if (sort.by == SortSpec::By::kKey) {
+    order = std::string("d.key") + (sort.descending ? " DESC" : "");
+  } else if (sort.by == SortSpec::By::kField) {
+    sort_expression = "json_extract(d.doc, '$.\"" + std::to_string(sort.code) + "\"')";
+    if (sort.text) sort_expression = "corv_fold(" + sort_expression + ")";
+    order = sort_expression + (sort.descending ? " DESC" : "") + ", d.key";
+  }
+  const std::string sql = "SELECT d.rowid, d.key, " + std::string(ranked ? "s.rank" : "0") + ", " + sort_expression +
+                          " FROM " + from + " WHERE " + condition + " ORDER BY " + order;
+
+  std::unique_ptr<Database> reader = TakeReader();
+  SearchResult result;
+  // One read transaction: the hits, their documents and the count come from one snapshot.
+  reader->Exec("BEGIN");
+  try {
+    auto select = reader->Prepare(sql);
+    select->BindAll(values);
+    std::vector<Hit> batch;
+    std::vector<int64_t> rowids;
+    size_t checked_past_page = 0;
+    bool more = true;
+    Statement& load = reader->Cached("SELECT doc FROM docs WHERE rowid = ?");
+    while (more) {
+      batch.clear();
+      rowids.clear();
+      std::vector<std::string> keys;
+      while (batch.size() < kFilterBatch && (more = select->Step())) {
+        Hit hit;
+        rowids.push_back(select->Int(0));
+        hit.key = select->Text(1);
+        hit.score = ranked ? -select->Real(2) : 0.0;
+        hit.sort_value = ColumnValue(*select, 3);
+        keys.push_back(hit.key);
+        batch.push_back(std::move(hit));
+      }
+      if (batch.empty()) break;
+      const std::vector<bool> allowed = readable ? readable(keys) : std::vector<bool>(keys.size(), true);
+      for (size_t i = 0; i < batch.size(); ++i) {
+        if (result.hits.size() >= want) ++checked_past_page;
+        if (!allowed[i]) continue;
+        ++result.total;
+        if (result.hits.size() < want) {
+          // Documents are read only for the hits that make the page.
+          load.Reset();
+          load.Bind(1, rowids[i]);
+          if (load.Step()) batch[i].document = DecodeDocument(batch[i].key, load.Text(0));
+          load.Reset();
+          result.hits.push_back(std::move(batch[i]));
+        }
+      }
+      if (result.hits.size() >= want) {
+        if (!readable) {
+          // Every hit is readable: the count needs no checks.
+          auto count = reader->Prepare("SELECT count(*) FROM " + from + " WHERE " + condition);
+          count->BindAll(values);
+          count->Step();
+          result.total = count->Int(0);
+          break;
+        }
+        if (checked_past_page >= check_budget) {
+          result.total_exact = !select->Step();
+          break;
+        }
+      }
+    }
+  } catch (...) {
+    reader->Exec("ROLLBACK");
+    throw;
+  }
+  reader->Exec("COMMIT");
+  ReturnReader(std::move(reader));
+  return result;
+}
+
+std::vector<Suggestion> IndexStore::Suggest(const std::string& field, const std::string& prefix, size_t limit) {
+  const FieldSpec* spec = schema_.Find(field);
+  const std::string folded = spec != nullptr && spec->kind == FieldKind::kKeyword
+                                 ? [&] { std::vector<std::string> t; Analyze(Analyzer::kKeyword, prefix, &t); return t.empty() ? std::string() : t[0]; }()
+                                 : Fold(prefix, FoldMode::kSearch);
+  const std::string upper = PrefixUpperBound(folded);
+  std::unique_ptr<Database> reader = TakeReader();
+  std::vector<Suggestion> out;
+  {
+    auto select = reader->Prepare(std::string("SELECT term, freq FROM suggest WHERE field = ? AND term >= ?") +
+                                  (upper.empty() ? "" : " AND term < ?") + " ORDER BY freq DESC, term LIMIT ?");
+    int bind = 1;
+    select->BindText(bind++, field);
+    select->BindText(bind++, folded);
+    if (!upper.empty()) select->BindText(bind++, upper);
+    select->Bind(bind, static_cast<int64_t>(limit));
+    while (select->Step()) {
+      Suggestion suggestion;
+      suggestion.term = select->Text(0);
+      std::replace(suggestion.term.begin(), suggestion.term.end(), '\x1F', ' ');
+      suggestion.frequency = select->Int(1);
+      out.push_back(std::move(suggestion));
+    }
+  }
+  ReturnReader(std::move(reader));
+  return out;
+}
+
+}  // namespace elasticd
+}  // namespace corvlumex

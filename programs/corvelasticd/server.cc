@@ -1,0 +1,160 @@
+#include "programs/corvelasticd/server.h"
+
+#include <fcntl.h>
+#include <poll.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+#include <stdexcept>
+#include <thread>
+
+#include "common/error.h"
+#include "common/log.h"
+#include "fileindex/communication.h"
+#include "programs/corvelasticd/daemon_error.h"
+#include "programs/corvelasticd/request_frame.h"
+
+namespace corvlumex {
+namespace elasticd {
+namespace {
+
+sockaddr_un Address(const std::string& path) {
+  sockaddr_un address;
+  memset(&address, 0, sizeof(address));
+  address.sun_family = AF_UNIX;
+  strncpy(address.sun_path, path.c_str(), sizeof(address.sun_path) - 1);
+  return address;
+}
+
+// True when a daemon answers on the socket file.
+bool SomeoneListens(const std::string& path) {
+  const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  if (fd < 0) return false;
+  const sockaddr_un address = Address(path);
+  const bool listening = connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof(address)) == 0;
+  close(fd);
+  errno = 0;
+  return listening;
+}
+
+void SendAnswer(int fd, const std::string& answer) {
+  try {
+    fileindex::WriteFrame(fd, answer);
+  } catch (const Error&) {
+    // The client went away; there is nobody left to tell.
+  }
+}
+
+}  // namespace
+
+Server::Server(ServerOptions options, Dispatcher& dispatcher) : options_(std::move(options)), dispatcher_(dispatcher) {
+  if (pipe2(wake_pipe_, O_CLOEXEC | O_NONBLOCK) != 0) throw std::runtime_error(std::string("pipe: ") + strerror(errno));
+}
+
+Server::~Server() {
+  if (listen_fd_ >= 0) {
+    close(listen_fd_);
+    unlink(options_.socket_path.c_str());
+  }
+  close(wake_pipe_[0]);
+  close(wake_pipe_[1]);
+}
+
+void Server::Listen() {
+  const std::string& path = options_.socket_path;
+  if (path.size() >= sizeof(sockaddr_un::sun_path)) throw std::runtime_error("socket path too long: " + path);
+  struct stat info;
+  if (lstat(path.c_str(), &info) == 0) {
+    if (!S_ISSOCK(info.st_mode)) throw std::runtime_error(path + " exists and is not a socket");
+    if (SomeoneListens(path)) throw std::runtime_error("another daemon already answers on " + path);
+    unlink(path.c_str());
+  }
+  listen_fd_ = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  if (listen_fd_ < 0) throw std::runtime_error(std::string("socket: ") + strerror(errno));
+  const sockaddr_un address = Address(path);
+  // Nobody may connect before the mode below is in place.
+  const mode_t old_mask = umask(0177);
+  const int bound = bind(listen_fd_, reinterpret_cast<const sockaddr*>(&address), sizeof(address));
+  umask(old_mask);
+  if (bound != 0) throw std::runtime_error("bind " + path + ": " + strerror(errno));
+  if (options_.socket_group != static_cast<gid_t>(-1) && chown(path.c_str(), static_cast<uid_t>(-1), options_.socket_group) != 0) {
+    throw std::runtime_error("chown " + path + ": " + strerror(errno));
+  }
+  if (chmod(path.c_str(), options_.socket_mode) != 0) throw std::runtime_error("chmod " + path + ": " + strerror(errno));
+  if (listen(listen_fd_, 128) != 0) throw std::runtime_error(std::string("listen: ") + strerror(errno));
+  errno = 0;
+}
+
+void Server::Stop() {
+  const char byte = 1;
+  if (write(wake_pipe_[1], &byte, 1) < 0) {
+    // The pipe is full: a wake-up is already pending.
+  }
+}
+
+void Server::Run() {
+  for (;;) {
+    struct pollfd pollers[2] = {{listen_fd_, POLLIN, 0}, {wake_pipe_[0], POLLIN, 0}};
+    if (poll(pollers, 2, -1) < 0) {
+      if (errno == EINTR) continue;
+      CORV_LOG_FAILED("poll(listen socket)");
+      break;
+    }
+    if (pollers[1].revents != 0) break;
+    const int fd = accept4(listen_fd_, nullptr, nullptr, SOCK_CLOEXEC);
+    if (fd < 0) {
+      errno = 0;
+      continue;
+    }
+    const struct timeval send_timeout = {options_.stall_ms / 1000, (options_.stall_ms % 1000) * 1000};
+    setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &send_timeout, sizeof(send_timeout));
+    {
+      std::lock_guard<std::mutex> guard(mutex_);
+      if (active_ >= options_.max_clients) {
+        SendAnswer(fd, Dispatcher::ErrorAnswer(kCodeBusy, "Too many clients; try again later"));
+        close(fd);
+        continue;
+      }
+      ++active_;
+      open_fds_.insert(fd);
+    }
+    std::thread([this, fd] {
+      Serve(fd);
+      std::lock_guard<std::mutex> guard(mutex_);
+      open_fds_.erase(fd);
+      close(fd);
+      if (--active_ == 0) idle_.notify_all();
+    }).detach();
+  }
+  // Connections finish the request they are in; no new request is read.
+  std::unique_lock<std::mutex> lock(mutex_);
+  for (const int fd : open_fds_) shutdown(fd, SHUT_RD);
+  idle_.wait(lock, [this] { return active_ == 0; });
+}
+
+void Server::Serve(int fd) {
+  const PeerIdentity peer = ReadPeerIdentity(fd);
+  std::string request;
+  for (;;) {
+    const FrameStatus status = ReadRequestFrame(fd, options_.max_frame_bytes, options_.idle_ms, options_.stall_ms, &request);
+    if (status == FrameStatus::kTooLarge) {
+      // The rest of the frame is not read, so the connection cannot go on.
+      SendAnswer(fd, Dispatcher::ErrorAnswer(kCodeFrameTooLarge, "The request is larger than " +
+                                                                     std::to_string(options_.max_frame_bytes) + " bytes"));
+      return;
+    }
+    if (status == FrameStatus::kTimeout) {
+      SendAnswer(fd, Dispatcher::ErrorAnswer(kCodeBadRequest, "The request did not arrive in time"));
+      return;
+    }
+    if (status != FrameStatus::kOk) return;
+    SendAnswer(fd, dispatcher_.Handle(request, peer));
+  }
+}
+
+}  // namespace elasticd
+}  // namespace corvlumex

@@ -1,0 +1,108 @@
+#include "programs/corvelasticd/sqlite_db.h"
+
+#include "programs/corvelasticd/daemon_error.h"
+#include "programs/corvelasticd/fts_tokenizer.h"
+
+namespace corvlumex {
+namespace elasticd {
+
+void ThrowSqlite(sqlite3* db, int rc, const std::string& what) {
+  const std::string detail = db != nullptr ? sqlite3_errmsg(db) : sqlite3_errstr(rc);
+  if ((rc & 0xff) == SQLITE_FULL) throw DaemonError(kCodeNoSpace, "No space left for the index: " + what + ": " + detail);
+  throw DaemonError(kCodeStorage, "Database failure: " + what + ": " + detail);
+}
+
+void Statement::Bind(int index, const SqlValue& value) {
+  int rc = SQLITE_OK;
+  if (std::holds_alternative<std::nullptr_t>(value)) {
+    rc = sqlite3_bind_null(stmt_, index);
+  } else if (const auto* i = std::get_if<int64_t>(&value)) {
+    rc = sqlite3_bind_int64(stmt_, index, *i);
+  } else if (const auto* d = std::get_if<double>(&value)) {
+    rc = sqlite3_bind_double(stmt_, index, *d);
+  } else {
+    const std::string& text = std::get<std::string>(value);
+    rc = sqlite3_bind_text64(stmt_, index, text.data(), text.size(), SQLITE_TRANSIENT, SQLITE_UTF8);
+  }
+  if (rc != SQLITE_OK) ThrowSqlite(db_, rc, "bind");
+}
+
+void Statement::BindText(int index, std::string_view text) {
+  const int rc = sqlite3_bind_text64(stmt_, index, text.data(), text.size(), SQLITE_TRANSIENT, SQLITE_UTF8);
+  if (rc != SQLITE_OK) ThrowSqlite(db_, rc, "bind");
+}
+
+void Statement::BindAll(const std::vector<SqlValue>& values) {
+  for (size_t i = 0; i < values.size(); ++i) Bind(static_cast<int>(i + 1), values[i]);
+}
+
+bool Statement::Step() {
+  const int rc = sqlite3_step(stmt_);
+  if (rc == SQLITE_ROW) return true;
+  if (rc == SQLITE_DONE) return false;
+  const std::string sql = sqlite3_sql(stmt_) != nullptr ? sqlite3_sql(stmt_) : "";
+  sqlite3_reset(stmt_);
+  ThrowSqlite(db_, rc, "step of " + sql.substr(0, 80));
+}
+
+void Statement::Reset() {
+  sqlite3_reset(stmt_);
+  sqlite3_clear_bindings(stmt_);
+}
+
+std::string Statement::Text(int column) const {
+  const auto* text = reinterpret_cast<const char*>(sqlite3_column_text(stmt_, column));
+  if (text == nullptr) return std::string();
+  return std::string(text, static_cast<size_t>(sqlite3_column_bytes(stmt_, column)));
+}
+
+Database::Database(const std::string& path, bool create) {
+  const int flags = SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX | (create ? SQLITE_OPEN_CREATE : 0);
+  const int rc = sqlite3_open_v2(path.c_str(), &db_, flags, nullptr);
+  if (rc != SQLITE_OK) {
+    const std::string detail = db_ != nullptr ? sqlite3_errmsg(db_) : sqlite3_errstr(rc);
+    sqlite3_close_v2(db_);
+    db_ = nullptr;
+    throw DaemonError(kCodeIndexFailed, "Cannot open the index database " + path + ": " + detail);
+  }
+  sqlite3_extended_result_codes(db_, 1);
+  sqlite3_busy_timeout(db_, 5000);
+  RegisterTokenizer(db_);
+}
+
+Database::~Database() {
+  cache_.clear();  // finalizes the cached statements; the index modules finalize their own
+  sqlite3_close_v2(db_);
+}
+
+void Database::Exec(const std::string& sql) {
+  char* message = nullptr;
+  const int rc = sqlite3_exec(db_, sql.c_str(), nullptr, nullptr, &message);
+  if (rc != SQLITE_OK) {
+    sqlite3_free(message);
+    ThrowSqlite(db_, rc, sql.substr(0, 80));
+  }
+}
+
+Statement& Database::Cached(const std::string& sql) {
+  auto it = cache_.find(sql);
+  if (it == cache_.end()) {
+    sqlite3_stmt* stmt = nullptr;
+    const int rc = sqlite3_prepare_v3(db_, sql.c_str(), static_cast<int>(sql.size()), SQLITE_PREPARE_PERSISTENT, &stmt, nullptr);
+    if (rc != SQLITE_OK) ThrowSqlite(db_, rc, "prepare " + sql.substr(0, 80));
+    it = cache_.emplace(sql, std::make_unique<Statement>(db_, stmt, true)).first;
+  } else {
+    it->second->Reset();
+  }
+  return *it->second;
+}
+
+std::unique_ptr<Statement> Database::Prepare(const std::string& sql) {
+  sqlite3_stmt* stmt = nullptr;
+  const int rc = sqlite3_prepare_v2(db_, sql.c_str(), static_cast<int>(sql.size()), &stmt, nullptr);
+  if (rc != SQLITE_OK) ThrowSqlite(db_, rc, "prepare " + sql.substr(0, 120));
+  return std::make_unique<Statement>(db_, stmt, true);
+}
+
+}  // namespace elasticd
+}  // namespace corvlumex

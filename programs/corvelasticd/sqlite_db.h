@@ -1,0 +1,74 @@
+// A thin owner of SQLite connections and statements that turns every SQLite
+// failure into a DaemonError (a full volume gets its own code).
+#pragma once
+
+#include <sqlite3.h>
+
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <string>
+#include <string_view>
+#include <variant>
+#include <vector>
+
+namespace corvlumex {
+namespace elasticd {
+
+using SqlValue = std::variant<std::nullptr_t, int64_t, double, std::string>;
+
+class Statement {
+ public:
+  Statement(sqlite3* db, sqlite3_stmt* stmt, bool owned = true) : db_(db), stmt_(stmt), owned_(owned) {}
+  ~Statement() {
+    if (owned_) sqlite3_finalize(stmt_);
+  }
+  Statement(const Statement&) = delete;
+  Statement& operator=(const Statement&) = delete;
+
+  void Bind(int index, const SqlValue& value);
+  void BindText(int index, std::string_view text);
+  void BindAll(const std::vector<SqlValue>& values);
+  // True while a row is available.
+  bool Step();
+  void Reset();
+
+  int64_t Int(int column) const { return sqlite3_column_int64(stmt_, column); }
+  double Real(int column) const { return sqlite3_column_double(stmt_, column); }
+  bool IsNull(int column) const { return sqlite3_column_type(stmt_, column) == SQLITE_NULL; }
+  int Type(int column) const { return sqlite3_column_type(stmt_, column); }
+  std::string Text(int column) const;
+
+ private:
+  sqlite3* db_;
+  sqlite3_stmt* stmt_;
+  bool owned_;
+};
+
+class Database {
+ public:
+  // Opens (creating when `create`) the database and registers the daemon's
+  // tokenizer and SQL functions on the connection.
+  Database(const std::string& path, bool create);
+  ~Database();
+  Database(const Database&) = delete;
+  Database& operator=(const Database&) = delete;
+
+  void Exec(const std::string& sql);
+  // A statement kept for the connection's life, reset before it is handed out.
+  Statement& Cached(const std::string& sql);
+  // A statement for one use.
+  std::unique_ptr<Statement> Prepare(const std::string& sql);
+  int64_t Changes() const { return sqlite3_changes64(db_); }
+  sqlite3* raw() { return db_; }
+
+ private:
+  sqlite3* db_ = nullptr;
+  std::map<std::string, std::unique_ptr<Statement>> cache_;
+};
+
+// Throws the DaemonError for a failed SQLite call.
+[[noreturn]] void ThrowSqlite(sqlite3* db, int rc, const std::string& what);
+
+}  // namespace elasticd
+}  // namespace corvlumex

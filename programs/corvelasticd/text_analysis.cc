@@ -1,0 +1,171 @@
+#include "programs/corvelasticd/text_analysis.h"
+
+#include <utf8proc.h>
+
+#include <cstdint>
+
+namespace corvlumex {
+namespace elasticd {
+namespace {
+
+bool IsAscii(std::string_view text) {
+  for (const unsigned char c : text) {
+    if (c >= 0x80) return false;
+  }
+  return true;
+}
+
+std::string AsciiLower(std::string_view text) {
+  std::string out(text);
+  for (char& c : out) {
+    if (c >= 'A' && c <= 'Z') c = static_cast<char>(c - 'A' + 'a');
+  }
+  return out;
+}
+
+// Combining diacritical marks used with Latin, Greek and Cyrillic letters.
+// Marks of other scripts (kana voicing marks, Indic vowel signs) change the
+// letter itself and are kept.
+bool IsStrippableMark(int32_t cp) { return cp >= 0x0300 && cp <= 0x036F; }
+
+bool IsCjkCharacter(int32_t cp) {
+  return (cp >= 0x3040 && cp <= 0x30FF) ||    // hiragana, katakana
+         (cp >= 0x3400 && cp <= 0x4DBF) ||    // CJK extension A
+         (cp >= 0x4E00 && cp <= 0x9FFF) ||    // CJK unified ideographs
+         (cp >= 0xF900 && cp <= 0xFAFF) ||    // compatibility ideographs
+         (cp >= 0x20000 && cp <= 0x3134F);    // CJK extensions B..G
+}
+
+bool IsWordCharacter(int32_t cp) {
+  if (cp == '_') return true;
+  switch (utf8proc_category(cp)) {
+    case UTF8PROC_CATEGORY_LU: case UTF8PROC_CATEGORY_LL: case UTF8PROC_CATEGORY_LT:
+    case UTF8PROC_CATEGORY_LM: case UTF8PROC_CATEGORY_LO:
+    case UTF8PROC_CATEGORY_MN: case UTF8PROC_CATEGORY_MC: case UTF8PROC_CATEGORY_ME:
+    case UTF8PROC_CATEGORY_ND: case UTF8PROC_CATEGORY_NL: case UTF8PROC_CATEGORY_NO:
+      return true;
+    default:
+      return false;
+  }
+}
+
+bool IsBlank(int32_t cp) {
+  if (cp < 0x80) return cp == ' ' || (cp >= 0x09 && cp <= 0x0D) || cp == 0x1F;
+  const utf8proc_category_t category = utf8proc_category(cp);
+  return category == UTF8PROC_CATEGORY_ZS || category == UTF8PROC_CATEGORY_ZL ||
+         category == UTF8PROC_CATEGORY_ZP;
+}
+
+// Next code point at `pos`; an invalid byte is returned as a code point of
+// its own (negative) and consumes one byte, so no input stops the scan.
+int32_t NextCodePoint(std::string_view text, size_t* pos) {
+  utf8proc_int32_t cp = 0;
+  const auto* start = reinterpret_cast<const utf8proc_uint8_t*>(text.data() + *pos);
+  const utf8proc_ssize_t used = utf8proc_iterate(start, static_cast<utf8proc_ssize_t>(text.size() - *pos), &cp);
+  if (used <= 0) {
+    *pos += 1;
+    return -1;
+  }
+  *pos += static_cast<size_t>(used);
+  return cp;
+}
+
+// Splits folded text into runs: `kind(cp)` says 0 = separator, 1 = part of a
+// word, 2 = a word of its own.
+template <typename Kind>
+void SplitRuns(std::string_view text, Kind kind, const std::function<void(size_t, size_t)>& visit) {
+  size_t pos = 0;
+  size_t word_start = std::string_view::npos;
+  while (pos < text.size()) {
+    const size_t here = pos;
+    const int32_t cp = NextCodePoint(text, &pos);
+    const int k = cp < 0 ? 1 : kind(cp);
+    if (k == 1) {
+      if (word_start == std::string_view::npos) word_start = here;
+      continue;
+    }
+    if (word_start != std::string_view::npos) {
+      visit(word_start, here);
+      word_start = std::string_view::npos;
+    }
+    if (k == 2) visit(here, pos);
+  }
+  if (word_start != std::string_view::npos) visit(word_start, text.size());
+}
+
+int StandardKind(int32_t cp) {
+  if (IsCjkCharacter(cp)) return 2;
+  return IsWordCharacter(cp) ? 1 : 0;
+}
+
+int WhitespaceKind(int32_t cp) { return IsBlank(cp) ? 0 : 1; }
+
+}  // namespace
+
+std::string Fold(std::string_view text, FoldMode mode) {
+  if (IsAscii(text)) return AsciiLower(text);
+  const auto* input = reinterpret_cast<const utf8proc_uint8_t*>(text.data());
+  const auto length = static_cast<utf8proc_ssize_t>(text.size());
+  const auto options = static_cast<utf8proc_option_t>(UTF8PROC_STABLE | UTF8PROC_DECOMPOSE | UTF8PROC_CASEFOLD);
+  std::vector<utf8proc_int32_t> buffer(text.size() + 16);
+  utf8proc_ssize_t count = utf8proc_decompose(input, length, buffer.data(), static_cast<utf8proc_ssize_t>(buffer.size()), options);
+  if (count > static_cast<utf8proc_ssize_t>(buffer.size())) {
+    buffer.resize(static_cast<size_t>(count));
+    count = utf8proc_decompose(input, length, buffer.data(), count, options);
+  }
+  if (count < 0) return AsciiLower(text);
+  if (mode == FoldMode::kSearch) {
+    utf8proc_ssize_t kept = 0;
+    for (utf8proc_ssize_t i = 0; i < count; ++i) {
+      if (!IsStrippableMark(buffer[i])) buffer[kept++] = buffer[i];
+    }
+    count = kept;
+  }
+  const utf8proc_ssize_t bytes = utf8proc_reencode(
+      buffer.data(), count, static_cast<utf8proc_option_t>(UTF8PROC_STABLE | UTF8PROC_COMPOSE));
+  if (bytes < 0) return AsciiLower(text);
+  return std::string(reinterpret_cast<const char*>(buffer.data()), static_cast<size_t>(bytes));
+}
+
+void Analyze(Analyzer analyzer, std::string_view text, std::vector<std::string>* tokens) {
+  if (analyzer == Analyzer::kKeyword) {
+    if (text.empty()) return;
+    std::string token = Fold(text, FoldMode::kCase);
+    for (char& c : token) {
+      if (c == ' ') c = '\x1F';
+    }
+    tokens->push_back(std::move(token));
+    return;
+  }
+  const std::string folded = Fold(text, FoldMode::kSearch);
+  const std::string_view view(folded);
+  auto add = [&](size_t begin, size_t end) { tokens->emplace_back(view.substr(begin, end - begin)); };
+  if (analyzer == Analyzer::kWhitespace) {
+    SplitRuns(view, WhitespaceKind, add);
+  } else {
+    SplitRuns(view, StandardKind, add);
+  }
+}
+
+std::vector<std::vector<std::string>> AnalyzeQuery(Analyzer analyzer, std::string_view text) {
+  std::vector<std::vector<std::string>> groups;
+  if (analyzer == Analyzer::kKeyword) {
+    std::vector<std::string> tokens;
+    Analyze(analyzer, text, &tokens);
+    if (!tokens.empty()) groups.push_back(std::move(tokens));
+    return groups;
+  }
+  SplitRuns(text, WhitespaceKind, [&](size_t begin, size_t end) {
+    std::vector<std::string> tokens;
+    Analyze(analyzer, text.substr(begin, end - begin), &tokens);
+    if (!tokens.empty()) groups.push_back(std::move(tokens));
+  });
+  return groups;
+}
+
+void ForEachWord(std::string_view text, const std::function<void(size_t, size_t)>& visit) {
+  SplitRuns(text, StandardKind, visit);
+}
+
+}  // namespace elasticd
+}  // namespace corvlumex
