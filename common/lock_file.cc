@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <sys/file.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -17,6 +18,12 @@ namespace corvlumex {
 namespace {
 constexpr int kLockAttempts = 64;
 constexpr long kLockBaseDelayUs = 100000;
+
+bool LocksTheNamedFile(int fd, const std::string& path) {
+  struct stat held, named;
+  return fstat(fd, &held) == 0 && stat(path.c_str(), &named) == 0 && held.st_dev == named.st_dev &&
+         held.st_ino == named.st_ino;
+}
 }  // namespace
 
 LockFile::LockFile(const std::string& path, bool exclusive) : fd_(-1), path_(path) {
@@ -24,7 +31,16 @@ LockFile::LockFile(const std::string& path, bool exclusive) : fd_(-1), path_(pat
     CORV_CHECK_THROW_TEXT(0 > (fd_ = open(path_.c_str(), O_RDONLY | O_CREAT | O_CLOEXEC, 0644)),
                           "0 > (fd_ = open(path_.c_str(), O_RDONLY | O_CREAT, 0644))", kErrorLockFile,
                           "open failed, path=" + path_ + ", reason=" + strerror(errno));
-    if (flock(fd_, (exclusive ? LOCK_EX : LOCK_SH) | LOCK_NB) == 0) return;
+    if (flock(fd_, (exclusive ? LOCK_EX : LOCK_SH) | LOCK_NB) == 0) {
+      if (LocksTheNamedFile(fd_, path_)) return;
+      // Renamed or removed between our open and our lock (a queue file being
+      // taken over): the next opener of the path gets another file, so this
+      // lock would exclude nobody. Try again on what the path names now.
+      close(fd_);
+      fd_ = -1;
+      if (attempt == kLockAttempts) throw Error(kErrorLockFile, "Exceed max retry, path=" + path_);
+      continue;
+    }
     const int flock_errno = errno;
     close(fd_);
     fd_ = -1;

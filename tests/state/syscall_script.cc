@@ -89,4 +89,10 @@ int setsockopt(int fd, int level, int name, const void* value, unsigned int leng
   return real(fd, level, name, value, length);
 }
 
+int flock(int fd, int operation) noexcept {
+  static const auto real = Real<int (*)(int, int)>("flock");
+  if (active != nullptr && active->before_flock) active->before_flock();
+  return real(fd, operation);
+}
+
 }  // extern "C"

@@ -1,9 +1,10 @@
 // Scripted system calls for the channel tests. The test binary defines
-// read, write, socket and setsockopt itself, so the library's calls reach
+// read, write, socket, setsockopt and flock itself, so the library's calls reach
 // these first; only the thread that installed a script is affected.
 #pragma once
 
 #include <deque>
+#include <functional>
 #include <vector>
 
 namespace corvlumex {
@@ -17,6 +18,7 @@ struct SyscallScript {
   std::deque<int> writes;
   bool fail_socket = false;      // socket() fails with EMFILE
   bool fail_setsockopt = false;  // setsockopt() fails with ENOPROTOOPT
+  std::function<void()> before_flock;  // runs just before each flock()
 
   // What the library asked for, in order.
   std::vector<unsigned long> read_sizes;
