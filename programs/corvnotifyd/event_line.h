@@ -9,18 +9,18 @@
 #include <string>
 #include <string_view>
 
+#include "fileindex/event.h"
+
 namespace corvlumex {
 namespace notifyd {
 
-// Bits of a line's "event" mask.
-enum QueueEventBit : uint32_t {
-  kEventModify = 0x2,
-  kEventAttr = 0x4,
-  kEventCreate = 0x40,
-  kEventDelete = 0x80,
-  kEventRename = 0x100,
-  kEventQueueCrash = 0x200,
-};
+// The event bits this program writes, from the queue line's own definition.
+using fileindex::kEventAttr;
+using fileindex::kEventCreate;
+using fileindex::kEventDelete;
+using fileindex::kEventModify;
+using fileindex::kEventQueueCrash;
+using fileindex::kEventRename;
 
 // Appends one finished line (with its "\n") to `out`. `path_old` is written
 // only when it is not empty.

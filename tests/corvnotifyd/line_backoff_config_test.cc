@@ -6,6 +6,7 @@
 #include <string>
 
 #include "common/json_util.h"
+#include "fileindex/event.h"
 #include "programs/corvnotifyd/crash_backoff.h"
 #include "programs/corvnotifyd/event_line.h"
 #include "programs/corvnotifyd/monitor_config.h"
@@ -37,11 +38,25 @@ TEST(QueueLineTest, AwkwardNamesSurviveTheJsonReaderByteForByte) {
   FormatQueueLine(out, kEventDelete, false, name, "/v/s/\x80old");
   ASSERT_EQ(out.back(), '\n');
   EXPECT_EQ(out.find('\n'), out.size() - 1) << "one line only";
-  Json::Value parsed;
-  ASSERT_TRUE(JsonFromString(parsed, out));
-  EXPECT_EQ(parsed["path"].asString(), name);
-  EXPECT_EQ(parsed["path_old"].asString(), "/v/s/\x80old");
-  EXPECT_EQ(parsed["event"].asUInt(), 128u);
+  // Read back by the indexer's own line parser.
+  out.pop_back();
+  const fileindex::Event event(out);
+  EXPECT_EQ(event.path, name);
+  EXPECT_EQ(event.path_old, "/v/s/\x80old");
+  EXPECT_EQ(event.event, 128u);
+  EXPECT_FALSE(event.is_dir);
+}
+
+TEST(QueueLineTest, EveryLineTheNotifierWritesParsesAsAnEvent) {
+  std::string out;
+  FormatQueueLine(out, kEventRename, true, "/v/s/new", "/v/s/old");
+  out.pop_back();
+  const fileindex::Event event(out);
+  EXPECT_EQ(event.event, static_cast<uint32_t>(kEventRename));
+  EXPECT_TRUE(event.is_dir);
+  EXPECT_EQ(event.path, "/v/s/new");
+  EXPECT_EQ(event.path_old, "/v/s/old");
+  EXPECT_TRUE(event.data.isNull());
 }
 
 // ---- back-off of crash markers ----

@@ -15,7 +15,9 @@
 
 #include <gtest/gtest.h>
 
+#include "common/error.h"
 #include "common/json_util.h"
+#include "fileindex/event.h"
 
 namespace corvlumex {
 namespace testing_support {
@@ -34,14 +36,14 @@ std::vector<QueueLine> ParseQueueText(const std::string& text) {
   // A line still being written (no "\n" yet) is read next time.
   for (size_t start = 0, end; (end = text.find('\n', start)) != std::string::npos; start = end + 1) {
     const std::string raw = text.substr(start, end - start);
-    Json::Value value;
-    EXPECT_TRUE(JsonFromString(value, raw)) << "not JSON: " << raw;
-    QueueLine line;
-    line.event = value["event"].asUInt();
-    line.is_dir = value["is_dir"].asBool();
-    line.path = value["path"].asString();
-    line.path_old = value.get("path_old", "").asString();
-    lines.push_back(line);
+    // Read as the indexer reads it.
+    try {
+      const fileindex::Event event(raw);
+      QueueLine line{event.event, event.is_dir, event.path, event.path_old};
+      lines.push_back(line);
+    } catch (const Error& e) {
+      ADD_FAILURE() << "not a queue line: " << raw << " (" << e.what() << ")";
+    }
   }
   return lines;
 }

@@ -14,19 +14,19 @@
 
 #include <gtest/gtest.h>
 
-#include "programs/corvnotifyd/event_line.h"
+#include "fileindex/event.h"
 #include "tests/corvnotifyd/notifyd_harness.h"
 
 namespace corvlumex {
 namespace testing_support {
 namespace {
 
-using notifyd::kEventAttr;
-using notifyd::kEventCreate;
-using notifyd::kEventDelete;
-using notifyd::kEventModify;
-using notifyd::kEventQueueCrash;
-using notifyd::kEventRename;
+using fileindex::kEventAttr;
+using fileindex::kEventCreate;
+using fileindex::kEventDelete;
+using fileindex::kEventModify;
+using fileindex::kEventQueueCrash;
+using fileindex::kEventRename;
 namespace fs = std::filesystem;
 
 QueueLine L(uint32_t event, const std::string& path, bool is_dir = false, const std::string& path_old = "") {
