@@ -48,6 +48,12 @@ std::vector<QueueLine> ParseQueueText(const std::string& text) {
   return lines;
 }
 
+void PrintTo(const QueueLine& line, std::ostream* out) {
+  *out << "{" << line.event << (line.is_dir ? " dir " : " ") << line.path;
+  if (!line.path_old.empty()) *out << " <- " << line.path_old;
+  *out << "}";
+}
+
 bool WaitUntil(const std::function<bool()>& condition, std::chrono::milliseconds timeout) {
   const auto deadline = std::chrono::steady_clock::now() + timeout;
   while (!condition()) {
@@ -153,7 +159,8 @@ std::unique_ptr<NotifydProcess> NotifydSandbox::Start(const std::map<std::string
 }
 
 bool NotifydSandbox::Sync(const std::string& path, const std::string& queue) {
-  close(open(path.c_str(), O_WRONLY | O_CREAT, 0644));
+  // A folder: its create is the only line it makes, so nothing of it trails behind.
+  mkdir(path.c_str(), 0755);
   const std::string target = queue.empty() ? queue_ : queue;
   return WaitUntil([&] {
     const auto lines = ReadQueue(target);

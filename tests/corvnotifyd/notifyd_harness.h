@@ -10,6 +10,7 @@
 #include <functional>
 #include <map>
 #include <memory>
+#include <ostream>
 #include <string>
 #include <vector>
 
@@ -27,6 +28,7 @@ struct QueueLine {
     return event == other.event && is_dir == other.is_dir && path == other.path && path_old == other.path_old;
   }
 };
+void PrintTo(const QueueLine& line, std::ostream* out);
 
 std::string ReadWholeFile(const std::string& path);
 // Every line of a queue file, parsed; a line that does not parse fails the test.
@@ -76,8 +78,8 @@ class NotifydSandbox {
   // Starts the daemon and waits until its watches are in place.
   std::unique_ptr<NotifydProcess> Start(const std::map<std::string, std::string>& env = {});
   std::vector<QueueLine> Queue() const { return ReadQueue(queue_); }
-  // Creates `path` and waits until its create line is in `queue`: every
-  // event before it has then been written too.
+  // Makes the folder `path` and waits until its create line is in `queue`:
+  // every event before it has then been written too.
   bool Sync(const std::string& path, const std::string& queue = std::string());
   std::string log_path() const { return root_.path() + "/corvnotifyd.log"; }
 

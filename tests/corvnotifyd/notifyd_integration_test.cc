@@ -169,8 +169,7 @@ TEST_F(NotifydTest, IgnoredFoldersAreNeverEntered) {
   for (const QueueLine& line : lines) EXPECT_EQ(line.path.find("@eaDir"), std::string::npos) << line.path;
   const std::vector<QueueLine> expected = {
       L(kEventCreate, box_.share() + "/docs/sub", true),
-      L(kEventCreate, box_.share() + "/sync1"), L(kEventModify, box_.share() + "/sync1"),
-      L(kEventCreate, box_.share() + "/sync2"), L(kEventModify, box_.share() + "/sync2")};
+      L(kEventCreate, box_.share() + "/sync1", true), L(kEventCreate, box_.share() + "/sync2", true)};
   EXPECT_EQ(lines, expected);
 }
 
