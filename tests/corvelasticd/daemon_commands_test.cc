@@ -4,6 +4,7 @@
 #include <sys/stat.h>
 
 #include <fstream>
+#include <sstream>
 
 #include "common/json_util.h"
 #include "tests/corvelasticd/daemon_harness.h"
@@ -323,6 +324,73 @@ TEST_F(BacklogDaemonTest, WritesOverTheBacklogBoundAnswer1400) {
   const Json::Value answer = Run("document_upsert_by_id", data);
   EXPECT_EQ(answer["error"]["code"].asInt(), 1400);
   EXPECT_NE(answer["error"]["msg"].asString().find("too many writes"), std::string::npos);
+}
+
+}  // namespace
+}  // namespace elasticd_test
+}  // namespace corvlumex
+
+namespace corvlumex {
+namespace elasticd_test {
+namespace {
+
+TEST(EventHandlerTest, ThePluginIsLoadedAndToldOfEachCommit) {
+  SandboxRoot root;
+  const std::string out = root.path() + "/events.txt";
+  setenv("CORVELASTICD_TEST_HANDLER_OUT", out.c_str(), 1);
+  Daemon daemon(root.path());
+  daemon.Start();
+  Json::Value data;
+  data["id"] = kIndex;
+  data["path"] = root.path() + "/index";
+  data["mappings"] = LibraryMappings();
+  data["event_handler"]["lib_path"] = CORVELASTICD_TEST_HANDLER;
+  ASSERT_TRUE(Command(daemon.socket_path(), "index_create", data)["success"].asBool());
+  Json::Value doc;
+  doc["id"] = kIndex;
+  doc["doc_id"] = "/v/s/a.txt";
+  doc["data"] = FileDocument("/v/s/a.txt", "", 1);
+  ASSERT_TRUE(Command(daemon.socket_path(), "document_upsert_by_id", doc)["success"].asBool());
+  Json::Value commit;
+  commit["id"] = kIndex;
+  ASSERT_TRUE(Command(daemon.socket_path(), "commit", commit)["success"].asBool());
+  Json::Value del;
+  del["id"] = kIndex;
+  del["doc_id"] = "/v/s/a.txt";
+  ASSERT_TRUE(Command(daemon.socket_path(), "document_del_by_id", del)["success"].asBool());
+  ASSERT_TRUE(Command(daemon.socket_path(), "commit", commit)["success"].asBool());
+  ASSERT_TRUE(Command(daemon.socket_path(), "commit", commit)["success"].asBool());  // nothing changed: no event
+  daemon.Terminate();
+  unsetenv("CORVELASTICD_TEST_HANDLER_OUT");
+  std::ifstream input(out);
+  std::stringstream text;
+  text << input.rdbuf();
+  EXPECT_EQ(text.str(),
+            "open fileindex_share\n"
+            "commit fileindex_share +1 -0 +/v/s/a.txt\n"
+            "commit fileindex_share +0 -1 -/v/s/a.txt\n"
+            "close fileindex_share\n");
+}
+
+TEST(EventHandlerTest, AMissingPluginIsLoggedOnceAndTheIndexWorks) {
+  SandboxRoot root;
+  Daemon daemon(root.path());
+  daemon.Start();
+  for (const char* id : {"fileindex_a", "fileindex_b"}) {
+    Json::Value data;
+    data["id"] = id;
+    data["path"] = root.path() + "/" + id;
+    data["mappings"] = LibraryMappings();
+    data["event_handler"]["lib_path"] = root.path() + "/missing.so";
+    ASSERT_TRUE(Command(daemon.socket_path(), "index_create", data)["success"].asBool());
+    Json::Value commit;
+    commit["id"] = id;
+    EXPECT_TRUE(Command(daemon.socket_path(), "commit", commit)["success"].asBool());
+  }
+  const std::string log = daemon.LogText();
+  const size_t first = log.find("missing.so is not installed");
+  EXPECT_NE(first, std::string::npos) << log;
+  EXPECT_EQ(log.find("missing.so is not installed", first + 1), std::string::npos) << log;
 }
 
 }  // namespace

@@ -1,0 +1,93 @@
+// Folding and tokenizing: the rules every stored value and every query go through.
+#include <gtest/gtest.h>
+
+#include "programs/corvelasticd/daemon_error.h"
+#include "programs/corvelasticd/index_schema.h"
+#include "programs/corvelasticd/query.h"
+#include "programs/corvelasticd/text_analysis.h"
+#include "tests/corvelasticd/daemon_harness.h"
+
+namespace corvlumex {
+namespace elasticd {
+namespace {
+
+std::vector<std::string> Tokens(Analyzer analyzer, const std::string& text) {
+  std::vector<std::string> tokens;
+  Analyze(analyzer, text, &tokens);
+  return tokens;
+}
+
+TEST(FoldTest, DecomposedAndPrecomposedFormsMeet) {
+  EXPECT_EQ(Fold("Cafe\xCC\x81", FoldMode::kCase), Fold("CAF\xC3\x89", FoldMode::kCase));
+  EXPECT_EQ(Fold("Cafe\xCC\x81", FoldMode::kCase), "caf\xC3\xA9");
+  EXPECT_EQ(Fold("Cafe\xCC\x81", FoldMode::kSearch), "cafe");
+  EXPECT_EQ(Fold("Stra\xC3\x9F" "e", FoldMode::kCase), "strasse");
+}
+
+TEST(FoldTest, MarksOfOtherScriptsAreKept) {
+  // A kana voicing mark changes the letter: "が" must not become "か".
+  EXPECT_EQ(Fold("\xE3\x81\x8C", FoldMode::kSearch), "\xE3\x81\x8C");
+}
+
+TEST(FoldTest, InvalidUtf8IsKeptWithAsciiLowered) {
+  EXPECT_EQ(Fold(std::string("AB\xFF\xFE" "C", 5), FoldMode::kSearch), std::string("ab\xFF\xFE" "c", 5));
+}
+
+TEST(AnalyzeTest, KeywordValuesStayWholeWithoutBlanks) {
+  EXPECT_EQ(Tokens(Analyzer::kKeyword, "My File.TXT"), std::vector<std::string>({"my\x1F" "file.txt"}));
+  EXPECT_TRUE(Tokens(Analyzer::kKeyword, "").empty());
+}
+
+TEST(AnalyzeTest, StandardSplitsOnPunctuationAndCjkCharacters) {
+  EXPECT_EQ(Tokens(Analyzer::kStandard, "AC-3 decoder_v2, \xC3\x89t\xC3\xA9!"),
+            std::vector<std::string>({"ac", "3", "decoder_v2", "ete"}));
+  EXPECT_EQ(Tokens(Analyzer::kStandard, "\xE6\x9D\xB1\xE4\xBA\xAC"), std::vector<std::string>({"\xE6\x9D\xB1", "\xE4\xBA\xAC"}));
+}
+
+TEST(AnalyzeTest, WhiteSpaceKeepsPunctuationInsideTokens) {
+  EXPECT_EQ(Tokens(Analyzer::kWhitespace, " Smith,John\tO'Neil "), std::vector<std::string>({"smith,john", "o'neil"}));
+}
+
+TEST(AnalyzeTest, QueryWordsGroupTheirTokens) {
+  const auto groups = AnalyzeQuery(Analyzer::kStandard, "ac-3 tokyo");
+  ASSERT_EQ(groups.size(), 2u);
+  EXPECT_EQ(groups[0], std::vector<std::string>({"ac", "3"}));
+  EXPECT_EQ(groups[1], std::vector<std::string>({"tokyo"}));
+}
+
+TEST(QueryTest, PrefixUpperBoundSkipsTrailingFFBytes) {
+  EXPECT_EQ(PrefixUpperBound("/a/"), "/a0");
+  EXPECT_EQ(PrefixUpperBound(std::string("a\xFF", 2)), "b");
+  EXPECT_EQ(PrefixUpperBound(std::string("\xFF\xFF", 2)), "");
+}
+
+TEST(QueryTest, RankedClauseIsTheFirstRequiredFullTextClause) {
+  const IndexSchema schema = IndexSchema::FromMappings(elasticd_test::LibraryMappings());
+  Json::Value clause;
+  Json::Value text;
+  text["match"]["_all"] = "hello";
+  clause["bool"]["must"].append(text);
+  EXPECT_TRUE(Query::Parse(clause, schema).HasRankedClause());
+  Json::Value should;
+  should["bool"]["should"].append(text);
+  EXPECT_FALSE(Query::Parse(should, schema).HasRankedClause());
+  EXPECT_EQ(Query::Parse(clause, schema).HighlightTokens(), std::set<std::string>({"hello"}));
+}
+
+TEST(SchemaTest, MappingsDecideHowEachFieldIsStored) {
+  const IndexSchema schema = IndexSchema::FromMappings(elasticd_test::LibraryMappings());
+  EXPECT_EQ(schema.property_id(), "CORVMDPath");
+  EXPECT_EQ(schema.Find("CORVMDFSName")->kind, FieldKind::kKeyword);
+  EXPECT_EQ(schema.Find("CORVMDSearchFileName")->kind, FieldKind::kNgram);
+  EXPECT_EQ(schema.Find("CORVMDAuthors")->analyzer, Analyzer::kWhitespace);
+  EXPECT_EQ(schema.Find("CORVMDFSSize")->kind, FieldKind::kNumber);
+  EXPECT_TRUE(schema.Find("CORVMDKeywords")->in_all);
+  EXPECT_FALSE(schema.Find("CORVMDParent")->in_all);
+  Json::Value bad = elasticd_test::LibraryMappings();
+  bad["properties"]["CORVMDTitle"]["analyzer"] = "snowball";
+  EXPECT_THROW(IndexSchema::FromMappings(bad), DaemonError);
+}
+
+}  // namespace
+}  // namespace elasticd
+}  // namespace corvlumex
