@@ -1,0 +1,310 @@
+// End-to-end figures of corvelasticd on a private socket: ingest through the
+// library's path (one connection per request, a commit per 1,000 documents),
+// name-substring and word searches through the socket with the access
+// filter of an ordinary user, a prefix delete of 10% of the documents, the
+// daemon's peak memory and the database size against the text indexed.
+//
+//   corvelasticd_bench --daemon BUILD/programs/corvelasticd/corvelasticd --docs 1000000 --work DIR
+#include <fcntl.h>
+#include <grp.h>
+#include <pwd.h>
+#include <signal.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <chrono>
+#include <cstring>
+#include <fstream>
+#include <iostream>
+#include <random>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include "common/json_util.h"
+#include "fileindex/communication.h"
+#include "programs/corvelasticd/request_frame.h"
+
+namespace {
+
+using Clock = std::chrono::steady_clock;
+using corvlumex::JsonFromString;
+using corvlumex::JsonToString;
+
+struct Options {
+  std::string daemon;
+  std::string work = "/tmp/corvelasticd-bench";
+  long docs = 100000;
+  int queries = 300;
+};
+
+std::string g_socket;
+
+int Connect() {
+  const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  sockaddr_un address;
+  memset(&address, 0, sizeof(address));
+  address.sun_family = AF_UNIX;
+  strncpy(address.sun_path, g_socket.c_str(), sizeof(address.sun_path) - 1);
+  if (connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)) != 0) {
+    close(fd);
+    return -1;
+  }
+  return fd;
+}
+
+Json::Value Request(const Json::Value& request) {
+  const int fd = Connect();
+  if (fd < 0) throw std::runtime_error("connect failed");
+  corvlumex::fileindex::WriteFrame(fd, JsonToString(request));
+  std::string text;
+  corvlumex::elasticd::ReadRequestFrame(fd, 1u << 30, 600000, 600000, &text);
+  close(fd);
+  Json::Value answer;
+  JsonFromString(answer, text);
+  if (!answer["success"].asBool()) throw std::runtime_error("request failed: " + text.substr(0, 300));
+  return answer;
+}
+
+Json::Value Command(const std::string& command, Json::Value data) {
+  data["id"] = "fileindex_bench";
+  Json::Value request;
+  request["command"] = command;
+  request["data"] = data;
+  return Request(request);
+}
+
+// A vocabulary of pronounceable words, drawn with a skewed frequency like real text.
+struct Words {
+  std::vector<std::string> list;
+  std::mt19937_64 random{42};
+  Words() {
+    const char* consonants = "bcdfghklmnprstvz";
+    const char* vowels = "aeiou";
+    std::mt19937_64 g(7);
+    for (int i = 0; i < 50000; ++i) {
+      std::string word;
+      const int syllables = 2 + static_cast<int>(g() % 3);
+      for (int s = 0; s < syllables; ++s) {
+        word += consonants[g() % 16];
+        word += vowels[g() % 5];
+      }
+      list.push_back(word);
+    }
+  }
+  const std::string& Pick() {
+    // Square of a uniform number: low indexes are much more frequent.
+    const double u = std::uniform_real_distribution<double>(0, 1)(random);
+    return list[static_cast<size_t>(u * u * u * (list.size() - 1))];
+  }
+};
+
+std::string PathOf(const std::string& share, long i) {
+  return share + "/g" + std::to_string(i % 10) + "/d" + std::to_string((i / 10) % 100) + "/" + "file-" + std::to_string(i);
+}
+
+double Percentile(std::vector<double> values, double p) {
+  std::sort(values.begin(), values.end());
+  return values[std::min(values.size() - 1, static_cast<size_t>(p * values.size()))];
+}
+
+long PeakMemoryKb(pid_t pid) {
+  std::ifstream status("/proc/" + std::to_string(pid) + "/status");
+  std::string line;
+  while (std::getline(status, line)) {
+    if (line.rfind("VmHWM:", 0) == 0) return atol(line.c_str() + 6);
+  }
+  return -1;
+}
+
+long long FileSize(const std::string& path) {
+  struct stat info;
+  return stat(path.c_str(), &info) == 0 ? info.st_size : 0;
+}
+
+// Runs `body` as an ordinary user when this is root, so the access filter checks every hit.
+template <typename Body>
+std::vector<double> AsOrdinaryUser(Body body) {
+  int pipe_fds[2];
+  if (pipe(pipe_fds) != 0) return {};
+  const pid_t child = fork();
+  if (child == 0) {
+    close(pipe_fds[0]);
+    if (geteuid() == 0) {
+      const struct passwd* nobody = getpwnam("nobody");
+      if (nobody == nullptr || setgroups(0, nullptr) != 0 || setgid(nobody->pw_gid) != 0 || setuid(nobody->pw_uid) != 0) _exit(3);
+    }
+    const std::vector<double> out = body();
+    if (write(pipe_fds[1], out.data(), out.size() * sizeof(double)) < 0) _exit(4);
+    _exit(0);
+  }
+  close(pipe_fds[1]);
+  std::vector<double> out;
+  double value;
+  while (read(pipe_fds[0], &value, sizeof(value)) == sizeof(value)) out.push_back(value);
+  close(pipe_fds[0]);
+  waitpid(child, nullptr, 0);
+  return out;
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  Options options;
+  for (int i = 1; i + 1 < argc; i += 2) {
+    const std::string key = argv[i];
+    if (key == "--daemon") options.daemon = argv[i + 1];
+    else if (key == "--work") options.work = argv[i + 1];
+    else if (key == "--docs") options.docs = atol(argv[i + 1]);
+    else if (key == "--queries") options.queries = atoi(argv[i + 1]);
+  }
+  if (options.daemon.empty()) {
+    std::cerr << "usage: corvelasticd_bench --daemon PATH [--docs N] [--work DIR] [--queries N]\n";
+    return 2;
+  }
+  signal(SIGPIPE, SIG_IGN);
+  if (system(("rm -rf '" + options.work + "' && mkdir -p '" + options.work + "'").c_str()) != 0) return 1;
+  chmod(options.work.c_str(), 0755);
+  g_socket = options.work + "/corvelasticd.sock";
+  const std::string share = options.work + "/share";
+
+  // The files exist, readable by everybody, so an ordinary user's searches find them.
+  std::cerr << "creating " << options.docs << " files...\n";
+  for (long i = 0; i < options.docs; ++i) {
+    const std::string path = PathOf(share, i);
+    const int fd = open(path.c_str(), O_CREAT | O_WRONLY | O_CLOEXEC, 0644);
+    if (fd < 0) {
+      if (system(("mkdir -p '" + path.substr(0, path.rfind('/')) + "'").c_str()) != 0) return 1;
+      close(open(path.c_str(), O_CREAT | O_WRONLY | O_CLOEXEC, 0644));
+    } else {
+      close(fd);
+    }
+  }
+  if (system(("chmod -R a+rX '" + share + "'").c_str()) != 0) return 1;
+
+  const pid_t daemon = fork();
+  if (daemon == 0) {
+    setenv("CORVLUMEX_ROOT", options.work.c_str(), 1);
+    execl(options.daemon.c_str(), options.daemon.c_str(), "--socket", g_socket.c_str(), static_cast<char*>(nullptr));
+    _exit(127);
+  }
+  for (int i = 0; i < 1000 && Connect() < 0; ++i) usleep(5000);
+
+  Json::Value create;
+  create["path"] = options.work + "/index";
+  JsonFromString(create["mappings"], R"({"property_id": "CORVMDPath",
+    "default": {"type": "string", "analyzer": "corvstandard", "required": false, "stored": true, "_all": true},
+    "properties": {"CORVMDPath": {"analyzer": "keyword", "required": true, "_all": false},
+      "CORVMDFSName": {"analyzer": "keyword", "_all": false}, "CORVMDParent": {"analyzer": "keyword", "_all": false},
+      "CORVMDExtension": {"analyzer": "keyword", "_all": false}, "CORVMDFSSize": {"type": "int"},
+      "CORVMDFSContentChangeDate": {"type": "int"}, "CORVMDIsDir": {"type": "bool", "_all": false},
+      "CORVMDTitle": {"type": "text"}, "CORVMDTextContent": {"type": "text"},
+      "CORVMDSearchFileName": {"type": "text", "analyzer": "white space", "preprocess": ["tolower", "ngram"]}}})");
+  Command("index_create", create);
+
+  Words words;
+  std::vector<std::string> names;
+  long long raw_json = 0, raw_text = 0;
+  const auto ingest_start = Clock::now();
+  for (long i = 0; i < options.docs; ++i) {
+    const std::string path = PathOf(share, i);
+    std::string text;
+    const int count = 10 + static_cast<int>(words.random() % 40);
+    for (int w = 0; w < count; ++w) text += (w ? " " : "") + words.Pick();
+    const std::string name = words.Pick() + "-" + words.Pick() + "-" + std::to_string(i) + ".txt";
+    Json::Value doc;
+    doc["CORVMDPath"] = path;
+    doc["CORVMDParent"] = path.substr(0, path.rfind('/'));
+    doc["CORVMDFSName"] = name;
+    doc["CORVMDSearchFileName"] = name;
+    doc["CORVMDExtension"] = "txt";
+    doc["CORVMDFSSize"] = static_cast<Json::Int64>(words.random() % 1000000);
+    doc["CORVMDFSContentChangeDate"] = static_cast<Json::Int64>(1600000000 + i);
+    doc["CORVMDIsDir"] = false;
+    doc["CORVMDTextContent"] = text;
+    raw_json += static_cast<long long>(JsonToString(doc).size());
+    raw_text += static_cast<long long>(path.size() * 2 + name.size() * 2 + 3 + text.size());
+    if (i % 997 == 0) names.push_back(name);
+    Json::Value data;
+    data["doc_id"] = path;
+    data["data"] = doc;
+    Command("document_upsert_by_id", data);
+    if ((i + 1) % 1000 == 0) Command("commit", Json::Value(Json::objectValue));
+  }
+  Command("commit", Json::Value(Json::objectValue));
+  const double ingest_seconds = std::chrono::duration<double>(Clock::now() - ingest_start).count();
+
+  // Queries: substrings from the middle of names, and words of middling frequency.
+  std::vector<std::string> substrings, terms;
+  for (int q = 0; q < options.queries; ++q) {
+    const std::string& name = names[static_cast<size_t>(q) % names.size()];
+    substrings.push_back(name.substr(2, 5));
+    terms.push_back(words.list[1000 + static_cast<size_t>(q) * 37 % 20000]);
+  }
+  auto timed = [&](const std::vector<std::string>& texts, const char* field) {
+    return AsOrdinaryUser([&] {
+      std::vector<double> ms;
+      for (const std::string& text : texts) {
+        Json::Value data;
+        data["query"]["qsl"]["match"][field] = text;
+        data["size"] = 20;
+        data["load_field"].append("CORVMDFSName");
+        Json::Value request;
+        request["command"] = "search";
+        request["data"] = data;
+        request["data"]["id"] = "fileindex_bench";
+        const auto start = Clock::now();
+        const Json::Value answer = Request(request);
+        ms.push_back(std::chrono::duration<double, std::milli>(Clock::now() - start).count());
+        ms.push_back(answer["data"]["total"].asDouble());
+      }
+      return ms;
+    });
+  };
+  std::vector<double> name_raw = timed(substrings, "CORVMDSearchFileName");
+  std::vector<double> word_raw = timed(terms, "_all");
+  auto split = [](const std::vector<double>& raw, std::vector<double>* ms, double* hits) {
+    for (size_t i = 0; i + 1 < raw.size(); i += 2) {
+      ms->push_back(raw[i]);
+      *hits += raw[i + 1];
+    }
+  };
+  std::vector<double> name_ms, word_ms;
+  double name_hits = 0, word_hits = 0;
+  split(name_raw, &name_ms, &name_hits);
+  split(word_raw, &word_ms, &word_hits);
+
+  Json::Value del;
+  del["query"]["qsl"]["prefix"]["CORVMDPath"] = share + "/g3/";
+  const auto delete_start = Clock::now();
+  const Json::Value deleted = Command("document_del_by_query", del);
+  Command("commit", Json::Value(Json::objectValue));
+  const double delete_seconds = std::chrono::duration<double>(Clock::now() - delete_start).count();
+
+  const long peak_kb = PeakMemoryKb(daemon);
+  kill(daemon, SIGTERM);
+  waitpid(daemon, nullptr, 0);
+  const std::string db = options.work + "/index/corvelasticd.db";
+  const long long db_bytes = FileSize(db) + FileSize(db + "-wal");
+
+  std::cout << "documents: " << options.docs << "\n";
+  std::cout << "ingest: " << static_cast<long>(options.docs / ingest_seconds) << " documents/s (" << ingest_seconds << " s)\n";
+  if (!name_ms.empty()) {
+    std::cout << "name substring search: median " << Percentile(name_ms, 0.5) << " ms, p99 " << Percentile(name_ms, 0.99)
+              << " ms (" << name_ms.size() << " queries, " << name_hits / name_ms.size() << " readable hits on average)\n";
+  }
+  if (!word_ms.empty()) {
+    std::cout << "word search: median " << Percentile(word_ms, 0.5) << " ms, p99 " << Percentile(word_ms, 0.99) << " ms ("
+              << word_ms.size() << " queries, " << word_hits / word_ms.size() << " readable hits on average)\n";
+  }
+  std::cout << "prefix delete of " << deleted["data"]["deleted"].asInt64() << " documents: " << delete_seconds << " s\n";
+  std::cout << "peak memory of the daemon: " << peak_kb / 1024 << " MB\n";
+  std::cout << "database: " << db_bytes / 1048576.0 << " MB (after the delete); documents as JSON: " << raw_json / 1048576.0
+            << " MB; text of the indexed fields: " << raw_text / 1048576.0 << " MB; ratio to JSON "
+            << static_cast<double>(db_bytes) / raw_json << "\n";
+  return 0;
+}
