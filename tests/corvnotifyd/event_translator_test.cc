@@ -23,13 +23,10 @@ namespace {
 
 using testing_support::LogCapture;
 using testing_support::ParseQueueText;
+using testing_support::Line;
 using testing_support::QueueLine;
 using testing_support::SandboxRoot;
 namespace fs = std::filesystem;
-
-QueueLine L(uint32_t event, const std::string& path, bool is_dir = false, const std::string& path_old = "") {
-  return QueueLine{event, is_dir, path, path_old};
-}
 
 struct Loss {
   std::string queue;
@@ -94,8 +91,8 @@ TEST_F(TranslatorTest, EachKernelEventBecomesItsLine) {
   Feed(docs_, IN_CLOSE_WRITE | IN_ISDIR, "d");  // never a modify for a folder
   Feed(docs_, IN_CREATE, "@eaDir");              // ignored name
   const std::string f = docs_ + "/f";
-  EXPECT_EQ(Lines(), (std::vector<QueueLine>{L(kEventCreate, f), L(kEventModify, f), L(kEventAttr, f),
-                                             L(kEventDelete, f), L(kEventAttr, docs_ + "/d", true)}));
+  EXPECT_EQ(Lines(), (std::vector<QueueLine>{Line(kEventCreate, f), Line(kEventModify, f), Line(kEventAttr, f),
+                                             Line(kEventDelete, f), Line(kEventAttr, docs_ + "/d", true)}));
 }
 
 TEST_F(TranslatorTest, RenameHalvesArePairedByCookie) {
@@ -105,8 +102,8 @@ TEST_F(TranslatorTest, RenameHalvesArePairedByCookie) {
   // A first half whose second never comes: moved out of the tree.
   Feed(docs_, IN_MOVED_FROM, "c", 8);
   Feed(docs_, IN_MOVED_TO, "d", 9);  // and a second half without first: moved in
-  EXPECT_EQ(Lines(), (std::vector<QueueLine>{L(kEventRename, docs_ + "/b", false, docs_ + "/a"),
-                                             L(kEventDelete, docs_ + "/c"), L(kEventCreate, docs_ + "/d")}));
+  EXPECT_EQ(Lines(), (std::vector<QueueLine>{Line(kEventRename, docs_ + "/b", false, docs_ + "/a"),
+                                             Line(kEventDelete, docs_ + "/c"), Line(kEventCreate, docs_ + "/d")}));
 }
 
 TEST_F(TranslatorTest, AFolderMovedOutLosesItsWatches) {
@@ -116,7 +113,7 @@ TEST_F(TranslatorTest, AFolderMovedOutLosesItsWatches) {
   Feed(docs_, IN_MOVED_FROM | IN_ISDIR, "out", 3);
   EXPECT_TRUE(translator_.HasPendingMove());
   translator_.ResolvePendingMove();
-  EXPECT_EQ(Lines(), (std::vector<QueueLine>{L(kEventDelete, docs_ + "/out", true)}));
+  EXPECT_EQ(Lines(), (std::vector<QueueLine>{Line(kEventDelete, docs_ + "/out", true)}));
   EXPECT_EQ(tree_.FindPath(docs_ + "/out"), nullptr);
   EXPECT_EQ(tree_.FindPath(docs_ + "/out/deep"), nullptr);
 }
@@ -128,12 +125,12 @@ TEST_F(TranslatorTest, ARenamedFolderKeepsItsWatchesUnderTheNewName) {
   fs::rename(docs_ + "/old", docs_ + "/new");
   Feed(docs_, IN_MOVED_FROM | IN_ISDIR, "old", 4);
   Feed(docs_, IN_MOVED_TO | IN_ISDIR, "new", 4);
-  EXPECT_EQ(Lines(), (std::vector<QueueLine>{L(kEventRename, docs_ + "/new", true, docs_ + "/old")}));
+  EXPECT_EQ(Lines(), (std::vector<QueueLine>{Line(kEventRename, docs_ + "/new", true, docs_ + "/old")}));
   ASSERT_NE(tree_.FindPath(docs_ + "/new/sub"), nullptr);
   EXPECT_EQ(tree_.FindPath(docs_ + "/new/sub")->wd, sub_wd);
   EXPECT_EQ(tree_.FindPath(docs_ + "/old/sub"), nullptr);
   Feed(docs_ + "/new/sub", IN_CREATE, "x");
-  EXPECT_EQ(Lines().back(), L(kEventCreate, docs_ + "/new/sub/x"));
+  EXPECT_EQ(Lines().back(), Line(kEventCreate, docs_ + "/new/sub/x"));
 }
 
 TEST_F(TranslatorTest, ANewFolderIsReadAfterItsWatchIsSet) {
@@ -144,9 +141,9 @@ TEST_F(TranslatorTest, ANewFolderIsReadAfterItsWatchIsSet) {
   fs::create_directories(docs_ + "/n/@eaDir/hidden");
   Feed(docs_, IN_CREATE | IN_ISDIR, "n");
   const auto lines = Lines();
-  const std::vector<QueueLine> expected = {L(kEventCreate, docs_ + "/n", true), L(kEventCreate, docs_ + "/n/a", true),
-                                           L(kEventCreate, docs_ + "/n/a/b", true),
-                                           L(kEventCreate, docs_ + "/n/a/b/f")};
+  const std::vector<QueueLine> expected = {Line(kEventCreate, docs_ + "/n", true), Line(kEventCreate, docs_ + "/n/a", true),
+                                           Line(kEventCreate, docs_ + "/n/a/b", true),
+                                           Line(kEventCreate, docs_ + "/n/a/b/f")};
   EXPECT_EQ(lines, expected);
   EXPECT_NE(tree_.FindPath(docs_ + "/n/a/b"), nullptr);
   EXPECT_EQ(tree_.FindPath(docs_ + "/n/@eaDir"), nullptr) << "ignored folders are never entered";
@@ -163,8 +160,8 @@ TEST_F(TranslatorTest, RenamesIntoAndOutOfAnIgnoredName) {
   fs::rename(docs_ + "/@eaDir", docs_ + "/back");
   Feed(docs_, IN_MOVED_FROM | IN_ISDIR, "@eaDir", 6);
   Feed(docs_, IN_MOVED_TO | IN_ISDIR, "back", 6);
-  EXPECT_EQ(Lines(), (std::vector<QueueLine>{L(kEventDelete, docs_ + "/d", true), L(kEventCreate, docs_ + "/back", true),
-                                             L(kEventCreate, docs_ + "/back/inner", true)}));
+  EXPECT_EQ(Lines(), (std::vector<QueueLine>{Line(kEventDelete, docs_ + "/d", true), Line(kEventCreate, docs_ + "/back", true),
+                                             Line(kEventCreate, docs_ + "/back/inner", true)}));
   EXPECT_NE(tree_.FindPath(docs_ + "/back/inner"), nullptr);
 }
 
@@ -175,8 +172,8 @@ TEST_F(TranslatorTest, ARenameBetweenQueuesIsADeleteForOneAndACreateForTheOther)
   fs::rename(docs_ + "/d", music_ + "/d");
   Feed(docs_, IN_MOVED_FROM | IN_ISDIR, "d", 9);
   Feed(music_, IN_MOVED_TO | IN_ISDIR, "d", 9);
-  EXPECT_EQ(Lines("A"), (std::vector<QueueLine>{L(kEventDelete, docs_ + "/d", true)}));
-  EXPECT_EQ(Lines("B"), (std::vector<QueueLine>{L(kEventCreate, music_ + "/d", true), L(kEventCreate, music_ + "/d/f")}));
+  EXPECT_EQ(Lines("A"), (std::vector<QueueLine>{Line(kEventDelete, docs_ + "/d", true)}));
+  EXPECT_EQ(Lines("B"), (std::vector<QueueLine>{Line(kEventCreate, music_ + "/d", true), Line(kEventCreate, music_ + "/d/f")}));
   ASSERT_NE(tree_.FindPath(music_ + "/d"), nullptr);
   EXPECT_EQ(tree_.FindPath(music_ + "/d")->roots, std::vector<int>{1});
 }
@@ -187,14 +184,14 @@ TEST_F(TranslatorTest, TheMaskChoosesWhatIsWritten) {
   Feed(docs_, IN_CLOSE_WRITE, "f");
   Feed(docs_, IN_MOVED_FROM, "a", 1);
   Feed(docs_, IN_MOVED_TO, "b", 1);  // no rename asked: both names are still told
-  EXPECT_EQ(Lines(), (std::vector<QueueLine>{L(kEventDelete, docs_ + "/a"), L(kEventCreate, docs_ + "/b")}));
+  EXPECT_EQ(Lines(), (std::vector<QueueLine>{Line(kEventDelete, docs_ + "/a"), Line(kEventCreate, docs_ + "/b")}));
 }
 
 TEST_F(TranslatorTest, NestedFoldersOfOneQueueWriteEachLineOnce) {
   fs::create_directories(docs_ + "/inner");
   Watch({Root(docs_, "Q"), Root(docs_ + "/inner", "Q")});
   Feed(docs_ + "/inner", IN_CREATE, "f");
-  EXPECT_EQ(Lines(), (std::vector<QueueLine>{L(kEventCreate, docs_ + "/inner/f")}));
+  EXPECT_EQ(Lines(), (std::vector<QueueLine>{Line(kEventCreate, docs_ + "/inner/f")}));
 }
 
 TEST_F(TranslatorTest, AConfiguredFolderReportsItsOwnChangesAndItsDisappearance) {
@@ -202,7 +199,7 @@ TEST_F(TranslatorTest, AConfiguredFolderReportsItsOwnChangesAndItsDisappearance)
   Watch({Root(docs_, "Q")});
   Feed(docs_, IN_ATTRIB | IN_ISDIR);
   Feed(docs_ + "/sub", IN_ATTRIB | IN_ISDIR);  // told by its parent instead
-  EXPECT_EQ(Lines(), (std::vector<QueueLine>{L(kEventAttr, docs_, true)}));
+  EXPECT_EQ(Lines(), (std::vector<QueueLine>{Line(kEventAttr, docs_, true)}));
   EXPECT_FALSE(translator_.AnyRootMissing());
 
   LogCapture log;
@@ -210,13 +207,13 @@ TEST_F(TranslatorTest, AConfiguredFolderReportsItsOwnChangesAndItsDisappearance)
   Feed(docs_, IN_MOVE_SELF);
   translator_.CheckRoots(false);
   EXPECT_TRUE(translator_.AnyRootMissing());
-  EXPECT_EQ(Lines().back(), L(kEventDelete, docs_, true));
+  EXPECT_EQ(Lines().back(), Line(kEventDelete, docs_, true));
   EXPECT_EQ(tree_.size(), 0u);
 
   fs::create_directories(docs_ + "/again");
   translator_.CheckRoots(true);
   EXPECT_FALSE(translator_.AnyRootMissing());
-  EXPECT_EQ(Lines().back(), L(kEventCreate, docs_, true));
+  EXPECT_EQ(Lines().back(), Line(kEventCreate, docs_, true));
   EXPECT_NE(tree_.FindPath(docs_ + "/again"), nullptr);
   EXPECT_EQ(log.Matching("watched folder " + docs_ + " appeared").size(), 1u);
 }
@@ -263,8 +260,8 @@ TEST_F(TranslatorTest, ChunksAreSplitIntoTheirRecords) {
     chunk += padded;
   }
   translator_.ProcessChunk(chunk);
-  EXPECT_EQ(Lines(), (std::vector<QueueLine>{L(kEventCreate, docs_ + "/first"),
-                                             L(kEventCreate, docs_ + "/second-longer-name")}));
+  EXPECT_EQ(Lines(), (std::vector<QueueLine>{Line(kEventCreate, docs_ + "/first"),
+                                             Line(kEventCreate, docs_ + "/second-longer-name")}));
 }
 
 TEST_F(TranslatorTest, RemovedFoldersLoseTheirWatchesOnANewConfiguration) {

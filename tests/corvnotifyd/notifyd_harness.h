@@ -29,6 +29,10 @@ struct QueueLine {
   }
 };
 void PrintTo(const QueueLine& line, std::ostream* out);
+inline QueueLine Line(uint32_t event, const std::string& path, bool is_dir = false,
+                      const std::string& path_old = std::string()) {
+  return QueueLine{event, is_dir, path, path_old};
+}
 
 std::string ReadWholeFile(const std::string& path);
 // Every line of a queue file, parsed; a line that does not parse fails the test.

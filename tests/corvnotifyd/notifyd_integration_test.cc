@@ -21,17 +21,9 @@ namespace corvlumex {
 namespace testing_support {
 namespace {
 
-using fileindex::kEventAttr;
-using fileindex::kEventCreate;
-using fileindex::kEventDelete;
-using fileindex::kEventModify;
-using fileindex::kEventQueueCrash;
-using fileindex::kEventRename;
+// The queue line bits: kEventCreate and the others.
+using namespace fileindex;  // NOLINT
 namespace fs = std::filesystem;
-
-QueueLine L(uint32_t event, const std::string& path, bool is_dir = false, const std::string& path_old = "") {
-  return QueueLine{event, is_dir, path, path_old};
-}
 
 std::vector<QueueLine> About(const std::vector<QueueLine>& lines, const std::string& prefix) {
   std::vector<QueueLine> out;
@@ -81,8 +73,8 @@ TEST_F(NotifydTest, FileChangesBecomeOneLineEach) {
   rename(a.c_str(), b.c_str());
   unlink(b.c_str());
   ASSERT_TRUE(box_.Sync(box_.docs() + "/sync"));
-  const std::vector<QueueLine> expected = {L(kEventCreate, a), L(kEventModify, a), L(kEventAttr, a),
-                                           L(kEventRename, b, false, a), L(kEventDelete, b)};
+  const std::vector<QueueLine> expected = {Line(kEventCreate, a), Line(kEventModify, a), Line(kEventAttr, a),
+                                           Line(kEventRename, b, false, a), Line(kEventDelete, b)};
   std::vector<QueueLine> got = box_.Queue();
   got.erase(std::remove_if(got.begin(), got.end(), [&](const QueueLine& l) { return l.path == box_.docs() + "/sync"; }),
             got.end());
@@ -96,7 +88,7 @@ TEST_F(NotifydTest, LargeCopyIsOneModify) {
   WriteFileInPieces(big, 256, 64 * 1024);  // 16 MiB in 256 writes
   ASSERT_TRUE(box_.Sync(box_.docs() + "/sync"));
   const auto lines = About(box_.Queue(), big);
-  EXPECT_EQ(lines, (std::vector<QueueLine>{L(kEventCreate, big), L(kEventModify, big)}));
+  EXPECT_EQ(lines, (std::vector<QueueLine>{Line(kEventCreate, big), Line(kEventModify, big)}));
 }
 
 TEST_F(NotifydTest, NestedFoldersMadeQuicklyAreAllSeenAndFollowRenames) {
@@ -107,9 +99,9 @@ TEST_F(NotifydTest, NestedFoldersMadeQuicklyAreAllSeenAndFollowRenames) {
   ASSERT_TRUE(box_.Sync(box_.docs() + "/sync1"));
   auto lines = box_.Queue();
   for (const std::string dir : {"/a", "/a/b", "/a/b/c"}) {
-    EXPECT_TRUE(Has(lines, L(kEventCreate, box_.docs() + dir, true))) << dir;
+    EXPECT_TRUE(Has(lines, Line(kEventCreate, box_.docs() + dir, true))) << dir;
   }
-  for (int i = 0; i < 5; ++i) EXPECT_TRUE(Has(lines, L(kEventCreate, a + "/b/c/f" + std::to_string(i))));
+  for (int i = 0; i < 5; ++i) EXPECT_TRUE(Has(lines, Line(kEventCreate, a + "/b/c/f" + std::to_string(i))));
 
   // A renamed folder keeps its watches, under the new name.
   const std::string z = box_.docs() + "/z";
@@ -118,10 +110,10 @@ TEST_F(NotifydTest, NestedFoldersMadeQuicklyAreAllSeenAndFollowRenames) {
   fs::remove_all(z);
   ASSERT_TRUE(box_.Sync(box_.docs() + "/sync2")) << daemon->Log();
   lines = box_.Queue();
-  EXPECT_TRUE(Has(lines, L(kEventRename, z, true, a)));
-  EXPECT_TRUE(Has(lines, L(kEventCreate, z + "/b/c/new")));
-  EXPECT_TRUE(Has(lines, L(kEventDelete, z + "/b/c", true)));
-  EXPECT_TRUE(Has(lines, L(kEventDelete, z, true)));
+  EXPECT_TRUE(Has(lines, Line(kEventRename, z, true, a)));
+  EXPECT_TRUE(Has(lines, Line(kEventCreate, z + "/b/c/new")));
+  EXPECT_TRUE(Has(lines, Line(kEventDelete, z + "/b/c", true)));
+  EXPECT_TRUE(Has(lines, Line(kEventDelete, z, true)));
   EXPECT_TRUE(About(lines, a + "/b/c/new").empty());
 }
 
@@ -145,12 +137,12 @@ TEST_F(NotifydTest, MovesInAndOutOfTheWatchedTree) {
   ASSERT_TRUE(box_.Sync(box_.docs() + "/sync2")) << daemon->Log();
 
   const auto lines = box_.Queue();
-  EXPECT_TRUE(Has(lines, L(kEventCreate, box_.docs() + "/in_file")));
-  EXPECT_TRUE(Has(lines, L(kEventCreate, box_.docs() + "/in_dir", true)));
-  EXPECT_TRUE(Has(lines, L(kEventCreate, box_.docs() + "/in_dir/sub/old")));
-  EXPECT_TRUE(Has(lines, L(kEventCreate, box_.docs() + "/in_dir/sub/fresh")));
-  EXPECT_TRUE(Has(lines, L(kEventDelete, box_.docs() + "/out_file")));
-  EXPECT_TRUE(Has(lines, L(kEventDelete, box_.docs() + "/out_dir", true)));
+  EXPECT_TRUE(Has(lines, Line(kEventCreate, box_.docs() + "/in_file")));
+  EXPECT_TRUE(Has(lines, Line(kEventCreate, box_.docs() + "/in_dir", true)));
+  EXPECT_TRUE(Has(lines, Line(kEventCreate, box_.docs() + "/in_dir/sub/old")));
+  EXPECT_TRUE(Has(lines, Line(kEventCreate, box_.docs() + "/in_dir/sub/fresh")));
+  EXPECT_TRUE(Has(lines, Line(kEventDelete, box_.docs() + "/out_file")));
+  EXPECT_TRUE(Has(lines, Line(kEventDelete, box_.docs() + "/out_dir", true)));
   EXPECT_TRUE(About(lines, outside).empty());
   EXPECT_EQ(Count(lines, kEventRename), 0u);
 }
@@ -168,8 +160,8 @@ TEST_F(NotifydTest, IgnoredFoldersAreNeverEntered) {
   const auto lines = box_.Queue();
   for (const QueueLine& line : lines) EXPECT_EQ(line.path.find("@eaDir"), std::string::npos) << line.path;
   const std::vector<QueueLine> expected = {
-      L(kEventCreate, box_.share() + "/docs/sub", true),
-      L(kEventCreate, box_.share() + "/sync1", true), L(kEventCreate, box_.share() + "/sync2", true)};
+      Line(kEventCreate, box_.share() + "/docs/sub", true),
+      Line(kEventCreate, box_.share() + "/sync1", true), Line(kEventCreate, box_.share() + "/sync2", true)};
   EXPECT_EQ(lines, expected);
 }
 
@@ -241,7 +233,7 @@ TEST_F(NotifydTest, OverflowWritesOneCrashMarkerPerBackOffWindow) {
   ASSERT_NO_FATAL_FAILURE(Overflow(box_, pause, box_.docs() + "/burst1"));
   ASSERT_TRUE(WaitUntil([&] { return Count(box_.Queue(), kEventQueueCrash) >= 1; })) << daemon->Log();
   ASSERT_TRUE(box_.Sync(box_.docs() + "/sync1"));
-  EXPECT_TRUE(Has(box_.Queue(), L(kEventQueueCrash, box_.share(), true)));
+  EXPECT_TRUE(Has(box_.Queue(), Line(kEventQueueCrash, box_.share(), true)));
   EXPECT_NE(daemon->Log().find("sysctl -w fs.inotify.max_queued_events="), std::string::npos) << daemon->Log();
 
   // A second overflow inside the back-off window: no second marker yet.
