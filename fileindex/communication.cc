@@ -55,43 +55,6 @@ class Socket {
   int fd_;
 };
 
-// The library is called from programs that may not ignore SIGPIPE (a web
-// handler, a hook). A daemon that drops the connection must give them an
-// Error 502 "write failed", not kill them: SIGPIPE is blocked in this thread
-// while the command is sent, and one raised meanwhile is consumed.
-class SigpipeBlock {
- public:
-  SigpipeBlock() {
-    sigemptyset(&pipe_set_);
-    sigaddset(&pipe_set_, SIGPIPE);
-    sigset_t pending;
-    sigpending(&pending);
-    was_pending_ = sigismember(&pending, SIGPIPE) == 1;
-    blocked_ = pthread_sigmask(SIG_BLOCK, &pipe_set_, &old_mask_) == 0;
-  }
-  ~SigpipeBlock() {
-    if (!blocked_) return;
-    const int saved_errno = errno;
-    sigset_t pending;
-    sigpending(&pending);
-    if (!was_pending_ && sigismember(&pending, SIGPIPE) == 1) {
-      const struct timespec no_wait = {0, 0};
-      while (sigtimedwait(&pipe_set_, nullptr, &no_wait) < 0 && errno == EINTR) {
-      }
-    }
-    pthread_sigmask(SIG_SETMASK, &old_mask_, nullptr);
-    errno = saved_errno;
-  }
-  SigpipeBlock(const SigpipeBlock&) = delete;
-  SigpipeBlock& operator=(const SigpipeBlock&) = delete;
-
- private:
-  sigset_t pipe_set_;
-  sigset_t old_mask_;
-  bool was_pending_ = false;
-  bool blocked_ = false;
-};
-
 }  // namespace
 
 void BufferRead(int fd, unsigned int size, unsigned char* buffer) {

@@ -97,6 +97,7 @@ bool DomainSockConnection::Connect() {
 
 bool DomainSockConnection::Send(const std::string& text) {
   if (fd_ < 0) return false;
+  const fileindex::SigpipeBlock no_sigpipe;
   try {
     fileindex::WriteFrame(fd_, text);
   } catch (const Error&) {

@@ -33,8 +33,8 @@ class DomainSockConnection {
   DomainSockConnection& operator=(const DomainSockConnection&) = delete;
 
   bool Connect();
-  // One frame each way. A peer that has gone away makes Send fail with
-  // EPIPE only when the process ignores SIGPIPE, as the programs do.
+  // One frame each way. A peer that has gone away makes Send fail; it does
+  // not kill a caller that leaves SIGPIPE at its default.
   bool Send(const std::string& text);
   bool Recv(std::string& text);
 

@@ -89,7 +89,7 @@ TEST_F(SendRequestTest, DaemonThatClosesBeforeReadingFailsTheSend) {
   FakeSearchDaemon daemon;
   daemon.Enqueue(FakeAnswer::CloseUnread());
   // Larger than the socket buffer, so the write is still under way when the
-  // daemon closes.
+  // daemon closes. SIGPIPE keeps its default here: the send must not kill us.
   Json::Value big = req_;
   big["data"]["padding"] = std::string(4 << 20, 'x');
   const Error error = ExchangeError(big);

@@ -2,7 +2,6 @@
 
 #include <fcntl.h>
 #include <poll.h>
-#include <signal.h>
 #include <sys/socket.h>
 #include <sys/un.h>
 #include <unistd.h>
@@ -85,9 +84,6 @@ FakeAnswer AnswerSuccess(const Json::Value& request) {
 
 FakeSearchDaemon::FakeSearchDaemon(const std::string& socket_path)
     : socket_path_(socket_path.empty() ? ElasticSocketPath() : socket_path), handler_(AnswerSuccess) {
-  // A client writing to a connection closed on purpose must see EPIPE, as
-  // in the programs, instead of being killed.
-  signal(SIGPIPE, SIG_IGN);
   std::filesystem::create_directories(std::filesystem::path(socket_path_).parent_path());
   unlink(socket_path_.c_str());
 
@@ -196,6 +192,7 @@ void FakeSearchDaemon::HandleConnection(int fd) {
   }
   const FakeAnswer answer = NextAnswer(request);
   if (answer.action != FakeAnswer::Action::kAnswer) return;
+  const fileindex::SigpipeBlock no_sigpipe;
   try {
     fileindex::WriteFrame(fd, answer.text);
   } catch (const Error&) {
