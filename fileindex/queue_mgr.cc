@@ -1,0 +1,127 @@
+#include "fileindex/queue_mgr.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+#include <fstream>
+
+#include "common/error.h"
+#include "common/file_util.h"
+#include "common/lock_file.h"
+#include "common/log.h"
+#include "fileindex/event.h"
+#include "fileindex/folder_mgr.h"
+#include "fileindex/optree.h"
+
+namespace corvlumex {
+namespace fileindex {
+namespace {
+
+// `text` followed by "/" starts with `prefix` followed by "/": the path
+// itself or something below it, never a sibling with a longer name.
+bool IsSelfOrBelow(const std::string& text, const std::string& prefix) {
+  return StringStartWith(text + "/", prefix + "/");
+}
+
+bool WriteWhole(int fd, const std::string& text) {
+  size_t done = 0;
+  while (done < text.size()) {
+    const ssize_t n = write(fd, text.data() + done, text.size() - done);
+    if (n < 0 && errno == EINTR) continue;
+    if (n <= 0) return false;
+    done += static_cast<size_t>(n);
+  }
+  return true;
+}
+
+}  // namespace
+
+QueueMgr::QueueMgr(const std::string& queue_path) : queue_path_(queue_path), queue_path_tmp_(queue_path + ".tmp") {}
+
+QueueMgr::~QueueMgr() = default;
+
+void QueueMgr::PrepareTmpQueue() {
+  if (!IsFileExist(queue_path_)) return;
+  const LockFile lock(queue_path_, true);
+  // A take-over that was not finished is processed first; the live queue
+  // keeps growing meanwhile. The two files are never joined.
+  if (IsFileExist(queue_path_tmp_)) return;
+  CORV_CHECK_THROW_TEXT(0 > rename(queue_path_.c_str(), queue_path_tmp_.c_str()),
+                        "0 > rename(queue_path_.c_str(), queue_path_tmp_.c_str())", kErrorSystem,
+                        std::string("rename failed, reason=") + strerror(errno));
+}
+
+std::shared_ptr<OPTree> QueueMgr::GetOPTree() const {
+  if (!op_tree_) op_tree_ = std::make_shared<OPTree>(queue_path_);
+  return op_tree_;
+}
+
+std::shared_ptr<OPTree> QueueMgr::GetOPTreeTmp() const {
+  if (!op_tree_tmp_) op_tree_tmp_ = std::make_shared<OPTree>(queue_path_tmp_);
+  return op_tree_tmp_;
+}
+
+int QueueMgr::DeleteTmp() { return unlink(queue_path_tmp_.c_str()); }
+
+unsigned QueueMgr::ProcessOP(std::function<void(std::shared_ptr<OP>)> fn, bool use_tmp) {
+  if (!use_tmp) return IsFileExist(queue_path_) ? GetOPTree()->ProcessOP(fn) : 0;
+  PrepareTmpQueue();
+  return IsFileExist(queue_path_tmp_) ? GetOPTreeTmp()->ProcessOP(fn) : 0;
+}
+
+bool QueueMgr::FindQueue(const std::function<bool(std::shared_ptr<Event>)>& predicate, const std::string& path) {
+  if (!IsFileExist(path)) return false;
+  std::ifstream input_stream(path);
+  CORV_CHECK_THROW(!input_stream, kErrorSystem, std::string("Failed to open queue, reason=") + strerror(errno));
+  std::string line;
+  while (std::getline(input_stream, line)) {
+    if (predicate(std::make_shared<Event>(line))) return true;
+  }
+  return false;
+}
+
+bool QueueMgr::IsFullPathProcessing(const std::string& full_path) {
+  // Loaded for its checks only: an unreadable folder file fails the call.
+  const FolderMgr folder_mgr;
+  const auto mentions = [&full_path](std::shared_ptr<Event> event) {
+    return IsSelfOrBelow(event->path, full_path) || IsSelfOrBelow(event->path_old, full_path);
+  };
+  return FindQueue(mentions, queue_path_) || FindQueue(mentions, queue_path_tmp_);
+}
+
+bool QueueMgr::IsFullPathHasReindex(const std::string& full_path) {
+  // The opposite direction: the reindexed folder is an ancestor of the path.
+  const auto covers = [&full_path](std::shared_ptr<Event> event) {
+    return event->event == kEventReindex && IsSelfOrBelow(full_path, event->path);
+  };
+  return FindQueue(covers, queue_path_) || FindQueue(covers, queue_path_tmp_);
+}
+
+bool AppendQueueLine(const std::string& queue_path, const std::string& line) {
+  // Without a place for the queue there is nothing to lock or append to.
+  const int probe = open(queue_path.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC, 0644);
+  if (probe < 0) return false;
+  close(probe);
+  // The lock makes the append and a take-over (rename) exclusive: a line is
+  // either in the file that is taken over or in the next live queue.
+  const LockFile lock(queue_path, true);
+  const int fd = open(queue_path.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC, 0644);
+  if (fd < 0) return false;
+  struct stat before;
+  const bool measured = fstat(fd, &before) == 0;
+  const bool written = measured && WriteWhole(fd, line + "\n");
+  // Part of a line would make the reader fail on it: back to the last whole line.
+  if (measured && !written) {
+    const int ignored = ftruncate(fd, before.st_size);
+    (void)ignored;
+  }
+  close(fd);
+  return written;
+}
+
+}  // namespace fileindex
+}  // namespace corvlumex

@@ -1,0 +1,219 @@
+#include <gtest/gtest.h>
+
+#include <ctime>
+
+#include "common/error.h"
+#include "common/json_util.h"
+#include "fileindex/folder.h"
+#include "fileindex/status_mgr.h"
+#include "tests/state/state_sandbox.h"
+
+namespace corvlumex {
+namespace fileindex {
+namespace {
+
+using testing_support::LogCapture;
+using testing_support::SleepRecorder;
+using testing_support::StateSandbox;
+
+Json::Value Parse(const std::string& text) {
+  Json::Value value;
+  EXPECT_TRUE(JsonFromString(value, text)) << text;
+  return value;
+}
+
+template <typename Fn>
+Error ErrorOf(Fn fn) {
+  try {
+    fn();
+  } catch (const Error& error) {
+    return error;
+  }
+  ADD_FAILURE() << "no throw";
+  return Error(kErrorUnexpected, "no throw");
+}
+
+// --- The record and its stored form (no platform needed) ---
+
+TEST(FolderRecord, OptionalKeysDefaultAndAreWrittenBack) {
+  const Folder folder(Parse(R"({"path":"/photo/2019","name":"Trip","document":true,"audio":false,
+                                 "video":true,"photo":false,"extra":1})"));
+  EXPECT_FALSE(folder.IsPrivileged());
+  EXPECT_FALSE(folder.IsPaused());
+  EXPECT_EQ(folder.GetVolumeToBeClean(), "");
+  const Json::Value data = folder.GetData();
+  EXPECT_EQ(data.size(), 9u);
+  EXPECT_EQ(data["privileged"], false);
+  EXPECT_EQ(data["paused"], false);
+  EXPECT_EQ(data["volume_to_be_clean"], "");
+  EXPECT_FALSE(data.isMember("extra"));
+}
+
+TEST(FolderRecord, StoredTextKeepsTheStoredMemberOrder) {
+  Folder folder("/photo/a\"b", "Name", true, false, true, false, true, false);
+  folder.SetVolumeToBeClean("/volume2");
+  EXPECT_EQ(folder.GetStoredText(),
+            R"({"path":"/photo/a\"b","name":"Name","document":true,"audio":false,"video":true,"photo":false,)"
+            R"("paused":false,"privileged":true,"volume_to_be_clean":"/volume2"})");
+  // The text reads back into the same record.
+  EXPECT_EQ(Folder(Parse(folder.GetStoredText())).GetData(), folder.GetData());
+}
+
+TEST(FolderRecord, ConstructorArgumentsAreInTheirDocumentedOrder) {
+  const Folder folder("/s/d", "n", true, false, false, false, true, false);
+  EXPECT_TRUE(folder.IsDocument());
+  EXPECT_TRUE(folder.IsPrivileged());
+  EXPECT_FALSE(folder.IsPaused());
+  const Folder paused("/s/d", "n", false, false, false, true, false, true);
+  EXPECT_TRUE(paused.IsPhoto());
+  EXPECT_TRUE(paused.IsPaused());
+  EXPECT_FALSE(paused.IsPrivileged());
+}
+
+TEST(FolderRecord, MalformedRecordsNameTheirFault) {
+  const Error mistyped = ErrorOf([] {
+    Folder(Parse(R"({"path":"/s","name":"n","document":true,"audio":true,"video":true,"photo":"yes"})"));
+  });
+  EXPECT_EQ(mistyped.code, kErrorBadArgument);
+  EXPECT_EQ(mistyped.reason.rfind("Not a string, data=", 0), 0u) << mistyped.reason;
+  // The first missing key in reading order is the one reported.
+  EXPECT_EQ(ErrorOf([] { Folder(Parse(R"({"document":true})")); }).reason.rfind("Missing property: path", 0), 0u);
+  EXPECT_EQ(ErrorOf([] { Folder(Parse(R"({"path":"/s","video":true})")); }).reason.rfind("Missing property: name", 0),
+            0u);
+  EXPECT_EQ(ErrorOf([] { Folder(Parse("[]")); }).reason.rfind("Not an object", 0), 0u);
+  // A mistyped optional key falls back to its default.
+  const Folder lenient(Parse(R"({"path":"/s","name":"n","document":true,"audio":true,"video":true,"photo":true,
+                                  "paused":"yes","volume_to_be_clean":[5]})"));
+  EXPECT_FALSE(lenient.IsPaused());
+  EXPECT_EQ(lenient.GetVolumeToBeClean(), "");
+}
+
+TEST(FolderRecord, IndexCfgIsTheContentSelectionOnly) {
+  const Folder folder("/s/d", "n", true, false, true, false, true, true);
+  EXPECT_EQ(folder.GetIndexCfg(), Parse(R"({"document":true,"audio":false,"video":true,"photo":false})"));
+}
+
+TEST(FolderRecord, SetShareReplacesThePathAndSetsTheCacheWithoutThePlatform) {
+  Folder folder("/photo/2019/photo", "n", true, true, true, true, false, false);
+  folder.SetShare("x");
+  EXPECT_EQ(folder.GetShare(), "x");
+  EXPECT_EQ(folder.GetPath(), "/x/2019/photo");
+  Folder bare("/photo", "n", true, true, true, true, false, false);
+  bare.SetShare("pics");
+  EXPECT_EQ(bare.GetPath(), "/pics");
+  EXPECT_EQ(ErrorOf([] { Folder("photo", "n", true, true, true, true, false, false).GetShare(); }).code,
+            kErrorBadArgument);
+}
+
+TEST(FolderRecord, AdditionalMustBeAnArrayOfKnownNames) {
+  const Folder folder("/s/d", "n", true, true, true, true, false, false);
+  {
+    LogCapture log;
+    const Error error = ErrorOf([&] { folder.GetDataWithAdditional(Json::Value()); });
+    EXPECT_EQ(error.code, kErrorBadArgument);
+    EXPECT_EQ(error.reason, "null");
+    ASSERT_EQ(log.Lines().size(), 1u);
+    EXPECT_NE(log.Lines()[0].find("(GetDataWithAdditional) Failed [!addiitionals.isArray()], reason: null"),
+              std::string::npos)
+        << log.Lines()[0];
+  }
+  {
+    LogCapture log;
+    EXPECT_EQ(ErrorOf([&] { folder.GetDataWithAdditional(Parse("[1]")); }).code, kErrorBadArgument);
+    EXPECT_EQ(log.Matching("Failed [!it.isString()]").size(), 1u);
+  }
+  const Error unknown = ErrorOf([&] { folder.GetDataWithAdditional(Parse(R"(["size"])")); });
+  EXPECT_EQ(unknown.reason, "Unknown additioal: size");
+  const Json::Value plain = folder.GetDataWithAdditional(Parse("[]"));
+  EXPECT_FALSE(plain.isMember("additional"));
+  EXPECT_EQ(plain, folder.GetData());
+}
+
+// --- Full paths and status (a sandboxed share registry) ---
+
+class FolderStatus : public ::testing::Test {
+ protected:
+  FolderStatus() {
+    share_dir_ = sandbox_.AddShare("photo");
+    sandbox_.AddShare("locked", /*readonly=*/true);
+    queue_ = share_dir_ + "/@eaDir/fileindex.queue";
+  }
+  void Queue(const std::string& lines) { sandbox_.Write(queue_.substr(sandbox_.root().size() + 1), lines); }
+  std::string Status(const Folder& folder) {
+    Json::Value out;
+    folder.GetStatus(out);
+    EXPECT_TRUE(out["text"].isString());
+    return out["text"].asString() + (out.isMember("desc") ? "/" + out["desc"].asString() : "");
+  }
+
+  StateSandbox sandbox_;
+  SleepRecorder sleeps_;
+  std::string share_dir_;
+  std::string queue_;
+};
+
+TEST_F(FolderStatus, FullPathIsDerivedOnceAndKeptAcrossSetShare) {
+  Folder folder("/photo/2019", "n", true, true, true, true, false, false);
+  EXPECT_EQ(folder.GetFullPath(), share_dir_ + "/2019");
+  folder.SetShare("pics");
+  EXPECT_EQ(folder.GetFullPath(), share_dir_ + "/2019");
+  EXPECT_EQ(Folder("/pics/2019", "n", true, true, true, true, false, false).GetShare(), "pics");
+  EXPECT_EQ(ErrorOf([] { Folder("/nosuch/x", "n", true, true, true, true, false, false).GetFullPath(); }).code,
+            kErrorShareNotFound);
+}
+
+TEST_F(FolderStatus, RulesApplyInTheirOrder) {
+  sandbox_.Write("volume1/photo/2019/a.jpg", "x");
+  const Folder folder("/photo/2019", "n", true, true, true, true, false, false);
+  EXPECT_EQ(Status(folder), "finished");
+
+  Queue("{\"event\":64,\"path\":\"" + share_dir_ + "/2019/a.jpg\"}\n");
+  EXPECT_EQ(Status(folder), "processing") << "never paused counts as running";
+  StatusMgr().Pause(0);
+  EXPECT_EQ(Status(folder), "paused");
+  sandbox_.Write("var/packages/CorvLumex/etc/fileindex.status",
+                 "{\"resume_time\":" + std::to_string(time(nullptr) + 3600) + "}");
+  EXPECT_EQ(Status(folder), "paused") << "resume time still ahead";
+  sandbox_.Write("var/packages/CorvLumex/etc/fileindex.status",
+                 "{\"resume_time\":" + std::to_string(time(nullptr) - 1) + "}");
+  EXPECT_EQ(Status(folder), "processing") << "resume time passed";
+
+  StatusMgr().SetShareStatus("photo", 2);
+  EXPECT_EQ(Status(folder), "processing") << "only bit 1 asks for a reindex";
+  StatusMgr().SetShareStatus("photo", 1);
+  EXPECT_EQ(Status(folder), "need_reindex");
+
+  // A path that cannot be indexed wins over everything.
+  const Folder gone("/photo/missing", "n", true, true, true, true, false, false);
+  EXPECT_EQ(Status(gone), "error/invalid_path");
+  sandbox_.Write("var/packages/CorvLumex/etc/fileindex.status", "{\"share\":{\"locked\":1}}");
+  EXPECT_EQ(Status(Folder("/locked", "n", true, true, true, true, false, false)), "error/invalid_path");
+}
+
+TEST_F(FolderStatus, EventsOutsideTheFolderDoNotCount) {
+  const Folder folder("/photo/2019", "n", true, true, true, true, false, false);
+  sandbox_.Write("volume1/photo/2019/.keep", "");
+  Queue("{\"event\":64,\"path\":\"" + share_dir_ + "/20190/a.jpg\"}\n");
+  EXPECT_EQ(Status(folder), "finished");
+  EXPECT_FALSE(folder.IsIndexing());
+  Queue("{\"event\":256,\"path\":\"" + share_dir_ + "/other\",\"path_old\":\"" + share_dir_ + "/2019/x\"}\n");
+  EXPECT_TRUE(folder.IsIndexing()) << "a rename out of the folder is pending work";
+}
+
+TEST_F(FolderStatus, StatusIsComputedBeforeAnUnknownAdditional) {
+  sandbox_.Write("volume1/photo/2019/.keep", "");
+  const Folder folder("/photo/2019", "n", true, true, true, true, false, false);
+  StatusMgr().SetShareStatus("photo", 1);
+  const Json::Value result = folder.GetDataWithAdditional(Parse(R"(["status"])"));
+  EXPECT_EQ(result["additional"], Parse(R"({"status":{"text":"need_reindex"}})"));
+  EXPECT_EQ(ErrorOf([&] { folder.GetDataWithAdditional(Parse(R"(["status","size"])")); }).reason,
+            "Unknown additioal: size");
+  // With an unreadable status file the status step fails first.
+  sandbox_.Write("var/packages/CorvLumex/etc/fileindex.status", "{");
+  EXPECT_EQ(ErrorOf([&] { folder.GetDataWithAdditional(Parse(R"(["status","size"])")); }).code, kErrorLoadJson);
+  EXPECT_EQ(ErrorOf([&] { folder.GetDataWithAdditional(Parse(R"(["size","status"])")); }).code, kErrorBadArgument);
+}
+
+}  // namespace
+}  // namespace fileindex
+}  // namespace corvlumex
