@@ -76,10 +76,22 @@ unsigned QueueMgr::ProcessOP(std::function<void(std::shared_ptr<OP>)> fn, bool u
 bool QueueMgr::FindQueue(const std::function<bool(std::shared_ptr<Event>)>& predicate, const std::string& path) {
   if (!IsFileExist(path)) return false;
   std::ifstream input_stream(path);
+  // Taken over or deleted since the check: the same as not there. Scans run
+  // beside the daemon's take-overs without a lock, so this does happen.
+  if (!input_stream && errno == ENOENT) return false;
   CORV_CHECK_THROW(!input_stream, kErrorSystem, std::string("Failed to open queue, reason=") + strerror(errno));
   std::string line;
   while (std::getline(input_stream, line)) {
-    if (predicate(std::make_shared<Event>(line))) return true;
+    std::shared_ptr<Event> event;
+    try {
+      event = std::make_shared<Event>(line);
+    } catch (const Error&) {
+      // A last line without its "\n" may still be being appended: it is not
+      // there yet. Any other malformed line fails the scan.
+      if (input_stream.eof()) return false;
+      throw;
+    }
+    if (predicate(event)) return true;
   }
   return false;
 }

@@ -175,6 +175,17 @@ TEST_F(QueueMgrTest, AMalformedLineFailsTheScan) {
   EXPECT_TRUE(mgr.IsFullPathProcessing("/v/s/a"));
 }
 
+TEST_F(QueueMgrTest, ALastLineStillBeingAppendedIsNotThereYet) {
+  QueueMgr mgr(queue_);
+  const std::string whole = Line(kEventReindex, "/v/s/dir");
+  Write(queue_, Line(kEventCreate, "/v/s/a") + whole.substr(0, whole.size() / 2));
+  EXPECT_FALSE(mgr.IsFullPathHasReindex("/v/s/dir/f"));
+  EXPECT_TRUE(mgr.IsFullPathProcessing("/v/s/a"));
+  // Complete but without its newline yet: it counts.
+  Write(queue_, whole.substr(0, whole.size() - 1));
+  EXPECT_TRUE(mgr.IsFullPathHasReindex("/v/s/dir/f"));
+}
+
 TEST_F(QueueMgrTest, AppendIsCreatedWhenMissingAndSilentWithoutADirectory) {
   EXPECT_TRUE(AppendQueueLine(queue_, "{\"event\":64,\"path\":\"/v/s/a\"}"));
   EXPECT_TRUE(AppendQueueLine(queue_, "{\"event\":64,\"path\":\"/v/s/b\"}"));
