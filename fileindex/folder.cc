@@ -87,13 +87,9 @@ void Folder::SetShare(const std::string& new_share) {
 }
 
 Json::Value Folder::GetData() const {
-  Json::Value data(Json::objectValue);
+  Json::Value data = GetIndexCfg();
   data[kPath] = path_;
   data[kName] = name_;
-  data[kDocument] = document_;
-  data[kAudio] = audio_;
-  data[kVideo] = video_;
-  data[kPhoto] = photo_;
   data[kPaused] = paused_;
   data[kPrivileged] = privileged_;
   data[kVolumeToBeClean] = volume_to_be_clean_;

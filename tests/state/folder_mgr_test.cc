@@ -11,20 +11,10 @@ namespace corvlumex {
 namespace fileindex {
 namespace {
 
+using testing_support::ErrorOf;
 using testing_support::LogCapture;
 using testing_support::SleepRecorder;
 using testing_support::StateSandbox;
-
-template <typename Fn>
-Error ErrorOf(Fn fn) {
-  try {
-    fn();
-  } catch (const Error& error) {
-    return error;
-  }
-  ADD_FAILURE() << "no throw";
-  return Error(kErrorUnexpected, "no throw");
-}
 
 std::shared_ptr<Folder> MakeFolder(const std::string& path, bool document = true, bool audio = true,
                                    bool video = true, bool photo = true, const std::string& name = "n") {

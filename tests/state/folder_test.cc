@@ -12,6 +12,7 @@ namespace corvlumex {
 namespace fileindex {
 namespace {
 
+using testing_support::ErrorOf;
 using testing_support::LogCapture;
 using testing_support::SleepRecorder;
 using testing_support::StateSandbox;
@@ -20,17 +21,6 @@ Json::Value Parse(const std::string& text) {
   Json::Value value;
   EXPECT_TRUE(JsonFromString(value, text)) << text;
   return value;
-}
-
-template <typename Fn>
-Error ErrorOf(Fn fn) {
-  try {
-    fn();
-  } catch (const Error& error) {
-    return error;
-  }
-  ADD_FAILURE() << "no throw";
-  return Error(kErrorUnexpected, "no throw");
 }
 
 // --- The record and its stored form (no platform needed) ---

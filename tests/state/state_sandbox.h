@@ -3,16 +3,30 @@
 // fake fileindexd on the sandbox's command socket.
 #pragma once
 
+#include <gtest/gtest.h>
 #include <json/json.h>
 
 #include <memory>
 #include <string>
 
+#include "common/error.h"
 #include "tests/state/fake_daemon.h"
 #include "tests/support/log_capture.h"
 
 namespace corvlumex {
 namespace testing_support {
+
+// The Error that `fn` throws; a test failure (and a 9999 stand-in) when none.
+template <typename Fn>
+Error ErrorOf(Fn fn) {
+  try {
+    fn();
+  } catch (const Error& error) {
+    return error;
+  }
+  ADD_FAILURE() << "no throw";
+  return Error(kErrorUnexpected, "no throw");
+}
 
 class StateSandbox {
  public:
