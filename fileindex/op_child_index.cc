@@ -6,45 +6,44 @@
 
 namespace corvlumex {
 namespace fileindex {
+namespace {
 
-ChildIndex::ChildIndex(const std::vector<std::shared_ptr<OPNode>>& children) {
-  Rebuild(children.size() * 2, children);
+size_t Hash(std::string_view name) { return std::hash<std::string_view>()(name); }
+
+}  // namespace
+
+size_t ChildIndex::Capacity(size_t child_count) {
+  size_t capacity = 8;
+  while (capacity < child_count * 2) capacity *= 2;
+  return capacity;
 }
 
-size_t ChildIndex::Hash(std::string_view name) { return std::hash<std::string_view>()(name); }
-
-int64_t ChildIndex::Find(std::string_view name, const std::vector<std::shared_ptr<OPNode>>& children) const {
-  const size_t mask = slots_.size() - 1;
+OPNode* ChildIndex::Find(std::string_view name, size_t child_count) const {
+  const size_t mask = Capacity(child_count) - 1;
   for (size_t slot = Hash(name) & mask;; slot = (slot + 1) & mask) {
-    const uint32_t entry = slots_[slot];
-    if (entry == 0) return -1;
-    if (children[entry - 1]->name_ == name) return entry - 1;
+    OPNode* child = slots_[slot];
+    if (child == nullptr || child->name_ == name) return child;
   }
 }
 
-void ChildIndex::Add(size_t position, const std::vector<std::shared_ptr<OPNode>>& children) {
-  // Keep the table at most half full so probes stay short.
-  if ((used_ + 1) * 2 > slots_.size()) {
-    Rebuild((used_ + 1) * 2, children);
+void ChildIndex::Added(const std::vector<std::shared_ptr<OPNode>>& children) {
+  const size_t count = children.size();
+  if (count < kMinChildren) return;
+  const size_t capacity = Capacity(count);
+  if (count > kMinChildren && capacity == Capacity(count - 1)) {
+    Place(children.back().get(), capacity);
     return;
   }
-  Place(position, children[position]->name_);
+  // First use or growth: rebuild from the list.
+  slots_.reset(new OPNode*[capacity]());
+  for (const std::shared_ptr<OPNode>& child : children) Place(child.get(), capacity);
 }
 
-void ChildIndex::Rebuild(size_t capacity, const std::vector<std::shared_ptr<OPNode>>& children) {
-  size_t size = 16;
-  while (size < capacity) size *= 2;
-  slots_.assign(size, 0);
-  used_ = 0;
-  for (size_t position = 0; position < children.size(); ++position) Place(position, children[position]->name_);
-}
-
-void ChildIndex::Place(size_t position, std::string_view name) {
-  const size_t mask = slots_.size() - 1;
-  size_t slot = Hash(name) & mask;
-  while (slots_[slot] != 0) slot = (slot + 1) & mask;
-  slots_[slot] = static_cast<uint32_t>(position + 1);
-  ++used_;
+void ChildIndex::Place(OPNode* child, size_t capacity) {
+  const size_t mask = capacity - 1;
+  size_t slot = Hash(child->name_) & mask;
+  while (slots_[slot] != nullptr) slot = (slot + 1) & mask;
+  slots_[slot] = child;
 }
 
 }  // namespace fileindex

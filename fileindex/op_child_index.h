@@ -1,9 +1,11 @@
-// Hash index from a child's name to its position in its parent's children_,
-// so a folder with hundreds of thousands of entries is searched in constant
-// time while children_ keeps the order of creation.
+// Hash index from a child's name to the child, so a folder with hundreds of
+// thousands of entries is searched in constant time while its children_
+// list keeps the order of creation. The table's size follows from the
+// number of children, so it needs no bookkeeping of its own beyond one
+// pointer per node.
 #pragma once
 
-#include <cstdint>
+#include <cstddef>
 #include <memory>
 #include <string_view>
 #include <vector>
@@ -15,24 +17,21 @@ class OPNode;
 
 class ChildIndex {
  public:
-  // Below this many children a linear scan is cheaper than hashing.
-  static constexpr size_t kMinChildren = 8;
+  // Below this many children a short scan is as cheap as hashing.
+  static constexpr size_t kMinChildren = 4;
 
-  explicit ChildIndex(const std::vector<std::shared_ptr<OPNode>>& children);
-
-  // Position of the child named `name`, or -1.
-  int64_t Find(std::string_view name, const std::vector<std::shared_ptr<OPNode>>& children) const;
-  // Records children[position], which must be new.
-  void Add(size_t position, const std::vector<std::shared_ptr<OPNode>>& children);
+  // The child named `name`, or null. Only for lists of kMinChildren or more.
+  OPNode* Find(std::string_view name, size_t child_count) const;
+  // Records children.back(), just appended.
+  void Added(const std::vector<std::shared_ptr<OPNode>>& children);
+  void Reset() { slots_.reset(); }
 
  private:
-  static size_t Hash(std::string_view name);
-  void Rebuild(size_t capacity, const std::vector<std::shared_ptr<OPNode>>& children);
-  void Place(size_t position, std::string_view name);
+  // A power of two at least twice the number of children: probes stay short.
+  static size_t Capacity(size_t child_count);
+  void Place(OPNode* child, size_t capacity);
 
-  // Open addressing with linear probing; a slot holds position + 1, 0 is free.
-  std::vector<uint32_t> slots_;
-  size_t used_ = 0;
+  std::unique_ptr<OPNode*[]> slots_;  // open addressing, linear probing; null is free
 };
 
 }  // namespace fileindex

@@ -83,36 +83,57 @@ void ForEachDescendantPostOrder(OPNode* node, Fn fn) {
 }  // namespace
 
 void OPTree::InsertEvent(std::shared_ptr<Event> event) {
-  const std::shared_ptr<OPNode> node = Resolve(event->path);
-  const std::shared_ptr<OP> op = std::make_shared<OP>(node, kOPNone, std::string(), Json::Value());
+  OPNode* node = Resolve(event->path);
+  const std::shared_ptr<OP> op = std::make_shared<OP>(node->shared_from_this(), kOPNone, std::string(), Json::Value());
   // Every bit is tested on its own and the same OP goes to every handler
   // that fires. Directory creates and deletes become reindexes.
-  if (event->event & kEventCreate) event->is_dir ? HandleReindex(node, op) : HandleCreate(node, op);
-  if (event->event & kEventAttr) HandleAttr(node, op);
-  if (event->event & kEventModify) HandleModify(node, op);
-  if (event->event & kEventDelete) event->is_dir ? HandleReindex(node, op) : HandleDelete(node, op);
-  if (event->event & kEventRename) {
+  const uint32_t mask = event->event;
+  if (mask & kEventCreate) event->is_dir ? Reindex(node, op) : Fold(node, op, kOPUpsert, Column::kCreate);
+  if (mask & kEventAttr) Fold(node, op, kOPAttr, Column::kAttr);
+  if (mask & kEventModify) Fold(node, op, kOPUpsert, Column::kModify);
+  if (mask & kEventDelete) event->is_dir ? Reindex(node, op) : Fold(node, op, kOPDelete, Column::kDelete);
+  if (mask & kEventRename) {
     op->path_ = event->path_old;
-    HandleRename(node, op);
+    Rename(node, op);
   }
-  if (event->event & kEventReindex) HandleReindex(node, op);
-  if (event->event & kEventUpdateCfg) {
+  if (mask & kEventReindex) Reindex(node, op);
+  if (mask & kEventUpdateCfg) {
     op->data_ = event->data;
-    HandleUpdateCfg(node, op);
+    Fold(node, op, kOPUpdateCfg, Column::kUpdateCfg);
   }
-  if (event->event & kEventQueueCrash) crashed_ = true;
+  if (mask & kEventQueueCrash) crashed_ = true;
 }
+
+void OPTree::HandleCreate(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  Fold(node.get(), op, kOPUpsert, Column::kCreate);
+}
+
+void OPTree::HandleModify(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  Fold(node.get(), op, kOPUpsert, Column::kModify);
+}
+
+void OPTree::HandleAttr(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  Fold(node.get(), op, kOPAttr, Column::kAttr);
+}
+
+void OPTree::HandleDelete(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  Fold(node.get(), op, kOPDelete, Column::kDelete);
+}
+
+void OPTree::HandleUpdateCfg(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  Fold(node.get(), op, kOPUpdateCfg, Column::kUpdateCfg);
+}
+
+void OPTree::HandleReindex(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) { Reindex(node.get(), op); }
+
+void OPTree::HandleRename(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) { Rename(node.get(), op); }
 
 void OPTree::Append(OPNode* node, const std::shared_ptr<OP>& op) {
   ops_.push_back(op);
   node->ops_.push_back(op);
 }
 
-void OPTree::AppendIfLive(OPNode* node, const std::shared_ptr<OP>& op) {
-  if (op->op_ != kOPNone) Append(node, op);
-}
-
-void OPTree::Merge(OPNode* node, OP& op, FileIndexOP kind, Column column) {
+void OPTree::MergeIntoNode(OPNode* node, OP& op, FileIndexOP kind, Column column) {
   op.op_ = kind;
   // The rules only change kinds and data, never the list, so walking it by
   // index sees exactly the OPs that were there when the walk began.
@@ -123,51 +144,31 @@ void OPTree::Merge(OPNode* node, OP& op, FileIndexOP kind, Column column) {
   }
 }
 
-void OPTree::HandleCreate(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  Merge(node.get(), *op, kOPUpsert, Column::kCreate);
-  AppendIfLive(node.get(), op);
+void OPTree::Fold(OPNode* node, const std::shared_ptr<OP>& op, FileIndexOP kind, Column column) {
+  MergeIntoNode(node, *op, kind, column);
+  if (op->op_ != kOPNone) Append(node, op);
 }
 
-void OPTree::HandleModify(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  Merge(node.get(), *op, kOPUpsert, Column::kModify);
-  AppendIfLive(node.get(), op);
-}
-
-void OPTree::HandleAttr(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  Merge(node.get(), *op, kOPAttr, Column::kAttr);
-  AppendIfLive(node.get(), op);
-}
-
-void OPTree::HandleDelete(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  Merge(node.get(), *op, kOPDelete, Column::kDelete);
-  AppendIfLive(node.get(), op);
-}
-
-void OPTree::HandleUpdateCfg(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  Merge(node.get(), *op, kOPUpdateCfg, Column::kUpdateCfg);
-  AppendIfLive(node.get(), op);
-}
-
-void OPTree::HandleReindex(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  Merge(node.get(), *op, kOPReindex, Column::kReindex);
+void OPTree::Reindex(OPNode* node, const std::shared_ptr<OP>& op) {
+  MergeIntoNode(node, *op, kOPReindex, Column::kReindex);
   // The reindex covers everything below, except renames: documents moved
   // into this directory from elsewhere still have to leave their old place.
-  ForEachDescendantPostOrder(node.get(), [](OPNode* descendant) {
+  ForEachDescendantPostOrder(node, [](OPNode* descendant) {
     for (const std::shared_ptr<OP>& pending : descendant->ops_) {
       if (pending->op_ != kOPRename) pending->op_ = kOPNone;
     }
   });
-  AppendIfLive(node.get(), op);
+  if (op->op_ != kOPNone) Append(node, op);
 }
 
-void OPTree::MoveOPs(OPNode* from, const std::shared_ptr<OPNode>& to, FileIndexOP min_kind, FileIndexOP* extra) {
+void OPTree::MoveOPs(OPNode* from, OPNode* to, FileIndexOP min_kind, FileIndexOP* extra) {
   // Equivalent to: for each live OP of a copy of from->ops_, append it to
   // to->ops_ and erase its first entry in from->ops_. The erasures are
   // counted on the OPs and done in one pass, so moving n OPs costs O(n)
   // even when from and to are the same node.
   std::vector<std::shared_ptr<OP>>& source = from->ops_;
   const size_t count = source.size();
-  bool moved = false;
+  std::shared_ptr<OPNode> owner;
   for (size_t i = 0; i < count; ++i) {
     OP& op = *source[i];
     if (op.op_ == kOPNone || op.op_ < min_kind) continue;
@@ -176,12 +177,12 @@ void OPTree::MoveOPs(OPNode* from, const std::shared_ptr<OPNode>& to, FileIndexO
       *extra = op.op_;
       op.op_ = kOPNone;
     }
-    op.node_ = to;
+    if (!owner) owner = to->shared_from_this();
+    op.node_ = owner;
     ++op.pending_removals_;
     to->ops_.push_back(source[i]);
-    moved = true;
   }
-  if (!moved) return;
+  if (!owner) return;
   size_t kept = 0;
   for (size_t i = 0; i < count; ++i) {
     OP& op = *source[i];
@@ -197,7 +198,7 @@ void OPTree::MoveOPs(OPNode* from, const std::shared_ptr<OPNode>& to, FileIndexO
   source.resize(kept + (source.size() - count));
 }
 
-void OPTree::MoveDescendantOPs(OPNode* old_node, const std::shared_ptr<OPNode>& new_node) {
+void OPTree::MoveDescendantOPs(OPNode* old_node, OPNode* new_node) {
   // Pending work below the old path follows to the same place below the new
   // one; deletes stay where they were, their documents are still there.
   // Post-order like TraverseNodeDescendant. A descendant's target is the new
@@ -209,7 +210,7 @@ void OPTree::MoveDescendantOPs(OPNode* old_node, const std::shared_ptr<OPNode>& 
     OPNode* node;
     size_t next;
     size_t end;
-    std::shared_ptr<OPNode> target;
+    OPNode* target;
   };
   std::vector<Frame> stack;
   stack.push_back({old_node, 0, old_node->children_.size(), new_node});
@@ -220,30 +221,32 @@ void OPTree::MoveDescendantOPs(OPNode* old_node, const std::shared_ptr<OPNode>& 
       stack.push_back({child, 0, child->children_.size(), nullptr});
       continue;
     }
-    if (stack.size() == 1) break;  // the old node itself was handled by the caller
+    if (stack.size() == 1) break;  // the old node itself is the caller's
     size_t resolved = stack.size() - 1;
-    while (!stack[resolved].target) --resolved;
+    while (stack[resolved].target == nullptr) --resolved;
     for (size_t i = resolved + 1; i < stack.size(); ++i) {
-      stack[i].target = stack[i - 1].target->ChildEntry(stack[i].node->name_);
+      stack[i].target = stack[i - 1].target->ChildNode(stack[i].node->name_);
     }
     MoveOPs(top.node, top.target, kOPUpsert, nullptr);
     stack.pop_back();
   }
 }
 
-void OPTree::HandleRename(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+void OPTree::Rename(OPNode* node, const std::shared_ptr<OP>& op) {
   const std::string old_path = op->path_;
-  const std::shared_ptr<OPNode> old_node = Resolve(old_path);
+  OPNode* old_node = Resolve(old_path);
   FileIndexOP extra = kOPNone;
   op->op_ = kOPRename;
   // The rename overwrites whatever was pending at the destination.
   for (const std::shared_ptr<OP>& pending : node->ops_) {
     if (pending->op_ == kOPDelete || pending->op_ == kOPUpsert || pending->op_ == kOPAttr) pending->op_ = kOPNone;
   }
-  MoveOPs(old_node.get(), node, kOPDelete, &extra);
-  MoveDescendantOPs(old_node.get(), node);
-  Append(node.get(), op);
-  if (extra != kOPNone) Append(node.get(), std::make_shared<OP>(node, extra, std::string(), Json::Value()));
+  MoveOPs(old_node, node, kOPDelete, &extra);
+  MoveDescendantOPs(old_node, node);
+  Append(node, op);
+  if (extra != kOPNone) {
+    Append(node, std::make_shared<OP>(node->shared_from_this(), extra, std::string(), Json::Value()));
+  }
 }
 
 }  // namespace fileindex

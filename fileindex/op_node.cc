@@ -4,7 +4,6 @@
 #include <ostream>
 
 #include "common/json_util.h"
-#include "fileindex/op_child_index.h"
 #include "fileindex/optree.h"
 
 namespace corvlumex {
@@ -55,28 +54,23 @@ std::string OPNode::GetPath() const {
   return path;
 }
 
-const std::shared_ptr<OPNode>& OPNode::ChildEntry(std::string_view name) {
-  if (index_) {
-    const int64_t position = index_->Find(name, children_);
-    if (position >= 0) return children_[position];
+OPNode* OPNode::ChildNode(std::string_view name) {
+  if (children_.size() >= ChildIndex::kMinChildren) {
+    if (OPNode* child = index_.Find(name, children_.size())) return child;
   } else {
     for (const std::shared_ptr<OPNode>& child : children_) {
-      if (child->name_ == name) return child;
+      if (child->name_ == name) return child.get();
     }
   }
   children_.push_back(std::make_shared<OPNode>(shared_from_this(), std::string(name)));
-  if (index_) {
-    index_->Add(children_.size() - 1, children_);
-  } else if (children_.size() >= ChildIndex::kMinChildren) {
-    index_ = std::make_unique<ChildIndex>(children_);
-  }
-  return children_.back();
+  index_.Added(children_);
+  return children_.back().get();
 }
 
 std::shared_ptr<OPNode> OPNode::GetChild(const std::string& name) {
   // Resolve ownership first: an unshared node fails before it changes.
   std::shared_ptr<OPNode> self = shared_from_this();
-  return self->ChildEntry(name);
+  return self->ChildNode(name)->shared_from_this();
 }
 
 void OPNode::TraverseOP(std::function<void(std::shared_ptr<OP>)> fn) {

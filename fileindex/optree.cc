@@ -10,7 +10,7 @@
 
 #include "common/error.h"
 #include "common/log.h"
-#include "fileindex/op_child_index.h"
+#include "fileindex/op_folder_cache.h"
 #include "fileindex/op_line_reader.h"
 
 namespace corvlumex {
@@ -50,26 +50,35 @@ void OPTree::BuildTree() {
   }
 }
 
-std::shared_ptr<OPNode> OPTree::GetNodeByPath(const std::string& path) { return Resolve(path); }
+std::shared_ptr<OPNode> OPTree::GetNodeByPath(const std::string& path) {
+  return Resolve(path)->shared_from_this();
+}
 
-const std::shared_ptr<OPNode>& OPTree::Resolve(std::string_view path) {
-  // Walks every non-empty component, creating nodes as it goes. The node
-  // reached answers only when its own path equals `path`, which holds
-  // exactly when `path` is /c1/.../cn: a leading "/", no empty component
-  // and no trailing "/". Comparing the form once replaces rebuilding the
-  // node's path at every step.
-  const std::shared_ptr<OPNode>* node = &root_;
+OPNode* OPTree::Resolve(std::string_view path) {
+  // Only /c1/.../cn resolves: a leading "/", no empty component and no
+  // trailing "/". Walking the components (below) and comparing the node's
+  // path with `path` at each step answers exactly for this form, so the form
+  // is checked once instead of rebuilding the node's path at every step.
+  const bool canonical = !path.empty() && path.front() == '/' && path.back() != '/' &&
+                         path.find("//") == std::string_view::npos;
+  const size_t last_slash = canonical ? path.rfind('/') : 0;
+  if (canonical) {
+    OPNode* folder = last_slash == 0 ? root_.get() : folders_.Find(path.substr(0, last_slash));
+    if (folder != nullptr) return folder->ChildNode(path.substr(last_slash + 1));
+  }
+  // Every non-empty component is walked and created when absent, also for
+  // a path that is then rejected: the nodes made on the way remain.
+  OPNode* node = root_.get();
   size_t start = 0;
   while (start < path.size()) {
     size_t end = path.find('/', start);
     if (end == std::string_view::npos) end = path.size();
-    if (end > start) node = &(*node)->ChildEntry(path.substr(start, end - start));
+    if (end > start) node = node->ChildNode(path.substr(start, end - start));
     start = end + 1;
   }
-  const bool canonical = !path.empty() && path.front() == '/' && path.back() != '/' &&
-                         path.find("//") == std::string_view::npos;
   if (!canonical) throw Error(kErrorUnexpected, "GetNodeByPath failed, path=" + std::string(path));
-  return *node;
+  if (last_slash > 0) folders_.Put(path.substr(0, last_slash), node->parent_.get());
+  return node;
 }
 
 unsigned OPTree::ProcessOP(std::function<void(std::shared_ptr<OP>)> fn) {
@@ -123,10 +132,11 @@ void OPTree::ReleaseCycles() {
     std::shared_ptr<OPNode> node = std::move(pending.back());
     pending.pop_back();
     node->ops_.clear();
-    node->index_.reset();
+    node->index_.Reset();
     for (std::shared_ptr<OPNode>& child : node->children_) pending.push_back(std::move(child));
     node->children_.clear();
   }
+  folders_.Clear();
   ops_.clear();
 }
 

@@ -20,6 +20,8 @@
 #include <vector>
 
 #include "fileindex/event.h"
+#include "fileindex/op_child_index.h"
+#include "fileindex/op_folder_cache.h"
 
 namespace corvlumex {
 namespace fileindex {
@@ -38,7 +40,6 @@ enum FileIndexOP : int32_t {
 
 class OPNode;
 class OPTree;
-class ChildIndex;
 
 class OP {
  public:
@@ -86,11 +87,11 @@ class OPNode : public std::enable_shared_from_this<OPNode> {
 
  private:
   friend class OPTree;
-  // The entry in children_ (stable until this node gains another child).
-  const std::shared_ptr<OPNode>& ChildEntry(std::string_view name);
+  // GetChild without taking shared ownership.
+  OPNode* ChildNode(std::string_view name);
 
   std::vector<std::shared_ptr<OPNode>> children_;
-  std::unique_ptr<ChildIndex> index_;  // name -> position, only for nodes with many children
+  ChildIndex index_;  // name -> child, once there are a few children
 };
 
 class OPTree {
@@ -136,20 +137,23 @@ class OPTree {
 
  private:
   enum class Column;
-  // The node of `path` as an entry of its parent's children (copy it before
-  // the tree changes again); throws Error 9999 like GetNodeByPath.
-  const std::shared_ptr<OPNode>& Resolve(std::string_view path);
-  static void Merge(OPNode* node, OP& op, FileIndexOP kind, Column column);
+  // GetNodeByPath without taking shared ownership.
+  OPNode* Resolve(std::string_view path);
+  // The handlers' work on raw nodes; the public handlers forward here.
+  void Fold(OPNode* node, const std::shared_ptr<OP>& op, FileIndexOP kind, Column column);
+  void Reindex(OPNode* node, const std::shared_ptr<OP>& op);
+  void Rename(OPNode* node, const std::shared_ptr<OP>& op);
+  static void MergeIntoNode(OPNode* node, OP& op, FileIndexOP kind, Column column);
   void Append(OPNode* node, const std::shared_ptr<OP>& op);
-  void AppendIfLive(OPNode* node, const std::shared_ptr<OP>& op);
-  static void MoveOPs(OPNode* from, const std::shared_ptr<OPNode>& to, FileIndexOP min_kind, FileIndexOP* extra);
-  static void MoveDescendantOPs(OPNode* old_node, const std::shared_ptr<OPNode>& new_node);
+  static void MoveOPs(OPNode* from, OPNode* to, FileIndexOP min_kind, FileIndexOP* extra);
+  static void MoveDescendantOPs(OPNode* old_node, OPNode* new_node);
   void ReleaseCycles();
 
   bool crashed_ = false;
   std::string queue_path_;
   std::shared_ptr<OPNode> root_;
   std::vector<std::shared_ptr<OP>> ops_;
+  FolderCache folders_;  // recently resolved folders, to skip walking from the root
 };
 
 // "[05] /old -> /new"; the stream's fill character stays '0' afterwards.

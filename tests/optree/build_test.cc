@@ -166,6 +166,35 @@ TEST_F(BuildTest, ManyChildrenResolveToTheSameNodesInCreationOrder) {
   for (int i = 0; i < 1000; ++i) EXPECT_EQ(children[i]->name_, "n" + std::to_string(999 - i));
 }
 
+TEST_F(BuildTest, PathsResolveToTheSameNodesAcrossManyFolders) {
+  log_level = 6;
+  std::vector<std::string> paths;
+  for (int i = 0; i < 3000; ++i) {
+    paths.push_back("/v/s/d" + std::to_string(i % 700) + "/e" + std::to_string(i % 3) + "/f" + std::to_string(i));
+  }
+  std::vector<std::string> lines;
+  for (const std::string& path : paths) lines.push_back(Line(kEventCreate, path));
+  for (const std::string& path : paths) lines.push_back(Line(kEventDelete, path));
+  auto tree = Build(lines);
+  const Processed out = Process(*tree);
+  ASSERT_EQ(out.ops.size(), paths.size());
+  EXPECT_EQ(out.count, paths.size());
+  for (size_t i = 0; i < paths.size(); ++i) {
+    EXPECT_EQ(out.ops[i], "[01] " + paths[i]);
+    // The same node as a walk by name from the root finds.
+    std::shared_ptr<OPNode> walked = tree->Root();
+    size_t start = 1;
+    while (start <= paths[i].size()) {
+      size_t end = paths[i].find('/', start);
+      if (end == std::string::npos) end = paths[i].size();
+      walked = walked->GetChild(paths[i].substr(start, end - start));
+      start = end + 1;
+    }
+    EXPECT_EQ(tree->GetNodeByPath(paths[i]), walked);
+  }
+  EXPECT_EQ(tree->GetNodeByPath("/v/s")->Children().size(), 700u);
+}
+
 TEST_F(BuildTest, PrintedForms) {
   log_level = 6;
   auto tree = Build({Line(kEventRename, "/v/s/b", false, "/v/s/a"), Line(kEventModify, "/v/s/b"),
