@@ -1,0 +1,255 @@
+#include "fileindex/elastic/elastic_control.h"
+
+#include <chrono>
+#include <cstdlib>
+
+#include "common/error.h"
+#include "common/file_util.h"
+#include "common/json_util.h"
+#include "common/log.h"
+#include "common/sys.h"
+#include "fileindex/constants.h"
+#include "fileindex/custom_event.h"
+#include "fileindex/elastic/comm.h"
+#include "fileindex/elastic/schema.h"
+#include "fileindex/status_mgr.h"
+#include "platform/platform.h"
+#include "sdk/share.h"
+
+namespace corvlumex {
+namespace fileindex {
+namespace elastic {
+namespace {
+
+// After this many busy answers in a row the daemon is probably starved of
+// memory, which only an administrator can fix.
+constexpr unsigned int kBusyRetriesBeforeNotice = 10;
+
+// {"command": command, "data": {"id": <index of share>}}
+Json::Value MakeRequest(const std::string& command, const std::string& share) {
+  Json::Value req(Json::objectValue);
+  req["command"] = command;
+  req["data"]["id"] = GetFileIndexID(share);
+  return req;
+}
+
+// Matches the documents below folder `path`. The trailing "/" keeps a sibling
+// whose name merely begins with the folder's name (b2 next to b) out.
+Json::Value DescendantsQuery(const std::string& path) {
+  Json::Value query(Json::objectValue);
+  query["qsl"]["prefix"][kFieldPath] = path + "/";
+  return query;
+}
+
+Json::Value LoadFields(std::initializer_list<const char*> fields) {
+  Json::Value list(Json::arrayValue);
+  for (const char* field : fields) list.append(field);
+  return list;
+}
+
+// The query answer's document list; Error 916 when there is none.
+const Json::Value& QueryDocuments(const Json::Value& res, const std::string& prefix) {
+  CORV_CHECK_THROW(!res.isMember("data") || !res["data"].isArray(), kErrorQueryAnswer,
+                   "No document list in the answer, prefix=" + prefix + "/");
+  return res["data"];
+}
+
+// The document of `path` as the platform's content extraction sees it.
+Json::Value ExtractDocument(const std::string& path, bool need_meta) {
+  Json::Value options(Json::objectValue);
+  options[kOptionNeedMeta] = need_meta;
+  Json::Value document;
+  try {
+    platform::Current()->ParseFile(path, options, document);
+  } catch (const std::exception& e) {
+    // The caller learns which file failed; the log keeps the extractor's why.
+    CORV_LOG_FN("Parse failed, path=%s, reason=%s", path.c_str(), e.what());
+    throw Error(kErrorParseDocument, "Parse failed, path=" + path);
+  } catch (...) {
+    CORV_LOG_FN("Parse failed, path=%s, reason=unknown exception", path.c_str());
+    throw Error(kErrorParseDocument, "Parse failed, path=" + path);
+  }
+  CORV_CHECK_THROW(!document.isObject(), kErrorParseDocument, "Parse failed, path=" + path);
+  // Name search runs on its own field, analysed for matches inside names.
+  document[kFieldSearchFileName] = document[kFieldFSName];
+  return document;
+}
+
+void SendDocument(const std::string& command, const std::string& share, const std::string& path,
+                  const Json::Value& document) {
+  Json::Value req = MakeRequest(command, share);
+  req["data"]["doc_id"] = path;
+  req["data"]["data"] = document;
+  SendRequestNoResult(req);
+}
+
+}  // namespace
+
+std::string GetFileIndexID(const std::string& share_name) { return "fileindex_" + share_name; }
+
+void SendRequestWithRetry(Json::Value& res, const Json::Value& req) {
+  unsigned int attempt = 0;
+  bool notified = false;
+  for (;;) {
+    try {
+      SendRequestImpl(res, req);
+      return;
+    } catch (const Error& error) {
+      if (!IsElasticBusyCode(error.code)) throw error;
+      CORV_LOG("Retry[%u] since corvelasticd is busy. Command: %s, db: %s", attempt,
+               req["command"].asString().c_str(), req["data"]["id"].asString().c_str());
+    }
+    ++attempt;
+    if (attempt > kBusyRetriesBeforeNotice && !notified) {
+      NotifyLackOfMemory();
+      notified = true;
+    }
+    // Spread the retries of several waiting callers apart.
+    SleepFor(std::chrono::seconds(900 + 60 * (rand() % 5)));
+  }
+}
+
+void SendRequestNoResult(const Json::Value& req) {
+  Json::Value res;
+  SendRequestWithRetry(res, req);
+}
+
+void ShareIndexCreate(const std::string& share) {
+  Json::Value req = MakeRequest("index_create", share);
+  req["data"]["path"] = sdk::SDKShare(share).GetDBPath();
+  req["data"]["settings"] = GetFileIndexSettings();
+  req["data"]["mappings"] = GetFileIndexMappings();
+  req["data"]["event_handler"] = GetFileIndexEventHandler();
+  SendRequestNoResult(req);
+}
+
+void ShareIndexDelete(const std::string& share) { SendRequestNoResult(MakeRequest("index_delete", share)); }
+
+void ShareIndexPause(const std::string& share) { SendRequestNoResult(MakeRequest("index_pause", share)); }
+
+void ShareIndexResume(const std::string& share) { SendRequestNoResult(MakeRequest("index_resume", share)); }
+
+void ShareIndexRename(const std::string& share_from, const std::string& share_to, const std::string& path) {
+  Json::Value req = MakeRequest("index_config_set", share_from);
+  req["data"]["data"]["id"] = GetFileIndexID(share_to);
+  req["data"]["data"]["path"] = path;
+  SendRequestNoResult(req);
+}
+
+void ShareIndexMigrate(const std::string& share, const std::string& path) {
+  Json::Value req = MakeRequest("index_config_set", share);
+  req["data"]["data"]["path"] = path;
+  SendRequestNoResult(req);
+}
+
+void IndexDel(const std::string& share, const std::string& path) {
+  Json::Value req = MakeRequest("document_del_by_id", share);
+  req["data"]["doc_id"] = path;
+  SendRequestNoResult(req);
+}
+
+void IndexDelDir(const std::string& share, const std::string& path) {
+  Json::Value req = MakeRequest("document_del_by_query", share);
+  req["data"]["query"] = DescendantsQuery(path);
+  SendRequestNoResult(req);
+}
+
+void IndexUpsert(const std::string& share, const std::string& path, bool need_meta) {
+  SendDocument("document_upsert_by_id", share, path, ExtractDocument(path, need_meta));
+}
+
+void IndexAttr(const std::string& share, const std::string& path) {
+  SendDocument("document_set_by_id", share, path, ExtractDocument(path, false));
+}
+
+void IndexRename(const std::string& share, const std::string& path_from, const std::string& path_to) {
+  const std::string name = Basename(path_to);
+  const std::string ext = GetFileExtension(path_to, true);
+  Json::Value res;
+
+  // The moved document keeps its key; only its path and name fields change.
+  Json::Value fields(Json::objectValue);
+  fields[kFieldPath] = path_to;
+  fields[kFieldParent] = Dirname(path_to);
+  fields[kFieldFSName] = name;
+  fields[kFieldSearchFileName] = name;
+  fields[kFieldDisplayName] = name;
+  fields[kFieldKind] = ext;
+  fields[kFieldExtension] = ext;
+  Json::Value set_req = MakeRequest("document_set_by_id", share);
+  set_req["data"]["doc_id"] = path_from;
+  set_req["data"]["data"] = fields;
+  SendRequestWithRetry(res, set_req);
+
+  Json::Value query_req = MakeRequest("document_get_by_query", share);
+  query_req["data"]["query"] = DescendantsQuery(path_from);
+  query_req["data"]["query"]["load_field"] = LoadFields({kFieldPath, kFieldFSName, kFieldParent});
+  SendRequestWithRetry(res, query_req);
+
+  // Every descendant in one exchange. The prefix query guarantees that each
+  // parent begins with path_from, so its head is replaced by position.
+  const std::string index_id = GetFileIndexID(share);
+  Json::Value compound(Json::arrayValue);
+  for (const Json::Value& doc : QueryDocuments(res, path_from)) {
+    std::string child_name;
+    std::string parent;
+    GetJsonValue(child_name, doc, kFieldFSName, true);
+    GetJsonValue(parent, doc, kFieldParent, true);
+    const std::string new_parent = parent.replace(0, path_from.size(), path_to);
+    Json::Value element(Json::objectValue);
+    element["command"] = "document_set_by_id";
+    element["data"]["id"] = index_id;
+    element["data"]["doc_id"] = doc[kFieldPath];
+    element["data"]["data"][kFieldParent] = new_parent;
+    element["data"]["data"][kFieldPath] = new_parent + "/" + child_name;
+    element["data"]["data"][kFieldSearchFileName] = child_name;
+    compound.append(element);
+  }
+  Json::Value compound_req(Json::objectValue);
+  compound_req["compound"] = compound;
+  SendRequestNoResult(compound_req);
+}
+
+void IndexGetByPrefixPath(const std::string& share, const std::string& prefix, std::vector<std::string>& paths) {
+  Json::Value req = MakeRequest("document_get_by_query", share);
+  req["data"]["query"] = DescendantsQuery(prefix);
+  req["data"]["query"]["load_field"] = LoadFields({kFieldPath});
+  Json::Value res;
+  SendRequestWithRetry(res, req);
+  for (const Json::Value& doc : QueryDocuments(res, prefix)) {
+    std::string path;
+    GetJsonValue(path, doc, kFieldPath, true);
+    paths.push_back(path);
+  }
+}
+
+void IndexCommit(const std::string& share) {
+  try {
+    SendRequestNoResult(MakeRequest("commit", share));
+  } catch (const Error& error) {
+    // A commit that fails on a full volume leaves the index behind the disk:
+    // it must be rebuilt once there is room again.
+    if (sdk::SDKShare(share).IsSpaceEnough()) throw error;
+    StatusMgr().SetShareStatus(share, kShareStatusNeedReindex);
+    throw Error(kErrorNoSpace, "Share (" + share + ") space not enough");
+  }
+}
+
+void UpdateTermSuggestion(const std::string& db_name, const std::vector<std::string>& fields) {
+  if (fields.empty()) return;
+  Json::Value compound(Json::arrayValue);
+  for (const std::string& field : fields) {
+    Json::Value element(Json::objectValue);
+    element["command"] = "update_term_suggestion";
+    element["data"]["doc_id_field"] = field;
+    element["data"]["db_name"] = db_name;
+    compound.append(element);
+  }
+  Json::Value req(Json::objectValue);
+  req["compound"] = compound;
+  SendRequestNoResult(req);
+}
+
+}  // namespace elastic
+}  // namespace fileindex
+}  // namespace corvlumex

@@ -1,0 +1,60 @@
+// Index commands: one search index per share, one document per file or
+// folder keyed by its full path. Each command is one request to corvelasticd;
+// a busy daemon is waited for without limit.
+#pragma once
+
+#include <json/json.h>
+
+#include <string>
+#include <vector>
+
+namespace corvlumex {
+namespace fileindex {
+namespace elastic {
+
+// "fileindex_" followed by the share name as it stands.
+std::string GetFileIndexID(const std::string& share_name);
+
+// Sends `req` until the daemon stops answering busy (1400/1401), sleeping
+// 15 to 19 minutes between attempts; after the 10th retry the administrators
+// are told, once, that memory is lacking. Other failures propagate.
+void SendRequestWithRetry(Json::Value& res, const Json::Value& req);
+// The same, for commands whose answer is not needed.
+void SendRequestNoResult(const Json::Value& req);
+
+// Share indexes.
+void ShareIndexCreate(const std::string& share);
+void ShareIndexDelete(const std::string& share);
+void ShareIndexPause(const std::string& share);
+void ShareIndexResume(const std::string& share);
+// The index of `share_from` becomes the index of `share_to`, stored at `path`.
+void ShareIndexRename(const std::string& share_from, const std::string& share_to, const std::string& path);
+// The share's index database moves to `path`.
+void ShareIndexMigrate(const std::string& share, const std::string& path);
+
+// Documents. `path` is the full path, which is also the document key.
+void IndexDel(const std::string& share, const std::string& path);
+// Deletes the documents below the folder `path` (not the folder's own).
+void IndexDelDir(const std::string& share, const std::string& path);
+// Extracts the file's fields (with its metadata when `need_meta`) and
+// stores them; Error 914 when the file cannot be extracted.
+void IndexUpsert(const std::string& share, const std::string& path, bool need_meta);
+// Updates the file-system fields of an existing document.
+void IndexAttr(const std::string& share, const std::string& path);
+// Rewrites the path fields of the document at `path_from` and of every
+// document below it. The documents keep their keys (the old full paths).
+void IndexRename(const std::string& share, const std::string& path_from, const std::string& path_to);
+// Appends the paths of the documents below `prefix` to `paths`, in the
+// daemon's order; Error 916 when the answer carries no list.
+void IndexGetByPrefixPath(const std::string& share, const std::string& prefix, std::vector<std::string>& paths);
+// Makes the share's changes durable. When that fails on a volume short of
+// space, the share is marked for reindexing and Error 1003 is thrown.
+void IndexCommit(const std::string& share);
+
+// Rebuilds the term suggestions of the database `db_name` from each field,
+// in one compound request; nothing is sent for an empty list.
+void UpdateTermSuggestion(const std::string& db_name, const std::vector<std::string>& fields);
+
+}  // namespace elastic
+}  // namespace fileindex
+}  // namespace corvlumex
