@@ -22,17 +22,20 @@ namespace {
 // a notice must never hold up or disturb the caller.
 constexpr int kNotifyExecFlags = 0xBB;
 
-// A notice is best effort: its failure shows only in the result.
-int RunNotifier(const std::vector<std::string>& args) {
+int RunNotifier(const std::vector<std::string>& args) { return RunAdminNotifier(args, true); }
+
+}  // namespace
+
+int RunAdminNotifier(const std::vector<std::string>& args, bool wait) {
+  // A notice is best effort: its failure shows only in the result.
+  const int flags = wait ? kNotifyExecFlags : kNotifyExecFlags & ~platform::kExecWait;
   try {
-    return platform::Current()->Exec(SysPath(kVXMNotifyPath), args, kNotifyExecFlags);
+    return platform::Current()->Exec(SysPath(kVXMNotifyPath), args, flags);
   } catch (const std::exception& error) {
     CORV_LOG_FN("notification tool failed, reason=%s", error.what());
     return -1;
   }
 }
-
-}  // namespace
 
 void AddCustomEvent(int event, const std::string& full_path, const std::string& path_old, const Json::Value& data) {
   std::string share_name;

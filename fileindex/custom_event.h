@@ -5,6 +5,7 @@
 #include <json/json.h>
 
 #include <string>
+#include <vector>
 
 namespace corvlumex {
 namespace fileindex {
@@ -15,6 +16,10 @@ namespace fileindex {
 // resolved, the share is marked for a full reindex and the Error is
 // rethrown. A queue file that cannot be opened loses the event silently.
 void AddCustomEvent(int event, const std::string& full_path, const std::string& path_old, const Json::Value& data);
+
+// Runs the administrators' notification tool with `args`, without a shell;
+// waits for it only with `wait`. Never throws: the tool's result, or negative.
+int RunAdminNotifier(const std::vector<std::string>& args, bool wait);
 
 // "error:index_no_space" to the administrators; the notification tool's result.
 int SendVXMNotify();

@@ -69,5 +69,10 @@ class QueueMgr {
 // cannot be opened or written (nothing is thrown for that).
 bool AppendQueueLine(const std::string& queue_path, const std::string& line);
 
+// Appends `lines` (whole lines, each ended by "\n") in one write under the
+// queue's lock. On failure the file is cut back to its former length, so no
+// half line is left, and false is returned with `error` set.
+bool AppendQueueLines(const std::string& queue_path, const std::string& lines, std::string* error);
+
 }  // namespace fileindex
 }  // namespace corvlumex

@@ -10,8 +10,8 @@
 
 #include "common/error.h"
 #include "common/file_util.h"
-#include "common/lock_file.h"
 #include "common/log.h"
+#include "fileindex/queue_mgr.h"
 
 namespace corvlumex {
 namespace notifyd {
@@ -37,46 +37,10 @@ bool EnsureQueueFolder(const std::string& queue_path, std::string* error) {
   return true;
 }
 
-bool WriteAll(int fd, const std::string& data, std::string* error) {
-  size_t written = 0;
-  while (written < data.size()) {
-    const ssize_t n = write(fd, data.data() + written, data.size() - written);
-    if (n < 0 && errno == EINTR) continue;
-    if (n <= 0) {
-      *error = std::string("write failed: ") + (n < 0 ? strerror(errno) : "nothing written");
-      return false;
-    }
-    written += static_cast<size_t>(n);
-  }
-  return true;
-}
-
 }  // namespace
 
 bool AppendQueueLines(const std::string& queue_path, const std::string& lines, std::string* error) {
-  if (!EnsureQueueFolder(queue_path, error)) return false;
-  try {
-    LockFile lock(queue_path, true);
-    const int fd = open(queue_path.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC, 0644);
-    if (fd < 0) {
-      *error = std::string("cannot open the queue: ") + strerror(errno);
-      return false;
-    }
-    struct stat before;
-    bool ok = fstat(fd, &before) == 0;
-    if (!ok) *error = std::string("cannot stat the queue: ") + strerror(errno);
-    ok = ok && WriteAll(fd, lines, error);
-    // A failed write may have left part of a line: the reader would stop at
-    // it, so the file goes back to its last whole line.
-    if (!ok && ftruncate(fd, before.st_size) != 0) *error += std::string(", cut back failed: ") + strerror(errno);
-    close(fd);
-    errno = 0;
-    return ok;
-  } catch (const Error& e) {
-    *error = "cannot lock the queue: " + e.reason;
-    errno = 0;
-    return false;
-  }
+  return EnsureQueueFolder(queue_path, error) && fileindex::AppendQueueLines(queue_path, lines, error);
 }
 
 QueueWriter::QueueWriter(size_t max_pending_bytes, LostFn lost)

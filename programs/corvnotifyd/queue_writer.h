@@ -14,7 +14,8 @@ namespace corvlumex {
 namespace notifyd {
 
 // Appends `lines` (whole lines, each ended by "\n") to the queue file in one
-// write, holding the queue's lock file. Creates the queue (and its folder,
+// write through the library's batched append (under the queue's lock file).
+// Creates the queue (and its folder,
 // when the share's folder exists) if missing. On failure the file is cut
 // back to its former length, so no half line is left, and false is returned
 // with `error` set.
@@ -30,7 +31,7 @@ class QueueWriter {
 
   QueueWriter(size_t max_pending_bytes, LostFn lost);
 
-  // The buffer of a queue's pending lines, to append to with AppendQueueLine.
+  // The buffer of a queue's pending lines (whole lines, each ended by "\n").
   std::string& Buffer(const std::string& queue) { return pending_[queue].lines; }
 
   // Writes what is pending. A queue that failed is retried no sooner than its
