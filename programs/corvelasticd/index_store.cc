@@ -22,6 +22,8 @@ constexpr size_t kMaxTrackedChanges = 100000;
 constexpr size_t kMaxSuggestionTerms = 100000;
 constexpr size_t kFilterBatch = 64;
 constexpr size_t kMaxReaders = 4;
+// Full-text rows queued beyond this are handed to the engine before the next request.
+constexpr size_t kMaxPendingIndexBytes = 16u << 20;
 // Unmapped fields are stored under their name behind this mark, so they
 // never clash with the numbers of mapped fields.
 constexpr char kUnmappedMark = '~';
@@ -244,14 +246,7 @@ void IndexStore::IndexEntries(int64_t rowid, const Json::Value& document, bool r
     any = any || !tokens.empty();
     columns.push_back(JoinTokens(tokens));
   }
-  auto write = [&](const std::string& sql) {
-    Statement& stmt = writer_->Cached(sql);
-    stmt.Bind(1, rowid);
-    for (size_t i = 0; i < columns.size(); ++i) stmt.BindText(static_cast<int>(i + 2), columns[i]);
-    stmt.Step();
-    stmt.Reset();
-  };
-  if (any) write(remove ? delete_text_sql_ : insert_text_sql_);
+  if (any) pending_index_.Add(remove ? &delete_text_sql_ : &insert_text_sql_, rowid, std::move(columns));
   columns.clear();
   any = false;
   for (const FieldSpec* field : ngram_fields_) {
@@ -263,7 +258,7 @@ void IndexStore::IndexEntries(int64_t rowid, const Json::Value& document, bool r
     any = any || !names.empty();
     columns.push_back(names);
   }
-  if (any) write(remove ? delete_name_sql_ : insert_name_sql_);
+  if (any) pending_index_.Add(remove ? &delete_name_sql_ : &insert_name_sql_, rowid, std::move(columns));
 }
 
 void IndexStore::RemoveRow(int64_t rowid, const std::string& key, const std::string& stored) {
@@ -299,23 +294,66 @@ void IndexStore::Begin() {
   in_transaction_ = true;
 }
 
+void IndexStore::Run(const char* sql) {
+  Statement& stmt = writer_->Cached(sql);
+  stmt.Step();
+  stmt.Reset();
+}
+
 // One request's writes happen whole or not at all, inside the open transaction.
 template <typename Body>
 void IndexStore::Atomically(Body body) {
+  // A long transaction must not hold its full-text rows in memory without bound.
+  if (pending_index_.bytes() > kMaxPendingIndexBytes) FlushIndexWrites();
   Begin();
-  writer_->Exec("SAVEPOINT request");
+  const size_t mark = pending_index_.Mark();
+  Run("SAVEPOINT request");
   try {
     body();
   } catch (...) {
+    pending_index_.DropAfter(mark);
     try {
-      writer_->Exec("ROLLBACK TO request");
-      writer_->Exec("RELEASE request");
+      Run("ROLLBACK TO request");
+      Run("RELEASE request");
     } catch (const std::exception&) {
       // The first failure is the one worth reporting.
     }
+    NoteLostTransaction();
     throw;
   }
-  writer_->Exec("RELEASE request");
+  Run("RELEASE request");
+}
+
+// Some failures (a full volume, an I/O error) make SQLite roll the whole
+// transaction back; what was queued for it then belongs to nothing.
+void IndexStore::NoteLostTransaction() {
+  if (!in_transaction_ || sqlite3_get_autocommit(writer_->raw()) == 0) return;
+  in_transaction_ = false;
+  pending_index_.Clear();
+  upserted_.clear();
+  deleted_.clear();
+  truncated_ = false;
+}
+
+// Hands the queued full-text rows to the engine, all or none (they stay
+// queued when it fails, so a later commit tries again).
+void IndexStore::FlushIndexWrites() {
+  if (pending_index_.empty()) return;
+  Begin();
+  Run("SAVEPOINT index_writes");
+  try {
+    pending_index_.ApplyTo(*writer_);
+  } catch (...) {
+    try {
+      Run("ROLLBACK TO index_writes");
+      Run("RELEASE index_writes");
+    } catch (const std::exception&) {
+      // The first failure is the one worth reporting.
+    }
+    NoteLostTransaction();
+    throw;
+  }
+  Run("RELEASE index_writes");
 }
 
 void IndexStore::Upsert(const std::string& doc_id, const Json::Value& input) {
@@ -390,6 +428,7 @@ bool IndexStore::DeleteById(const std::string& doc_id) {
 
 int64_t IndexStore::DeleteByQuery(const Query& query) {
   int64_t deleted = 0;
+  FlushIndexWrites();  // the query may read the full-text tables
   Atomically([&] {
     std::string condition;
     std::vector<SqlValue> values;
@@ -419,6 +458,7 @@ Json::Value IndexStore::GetByQuery(const Query& query, const std::vector<std::st
   std::string condition;
   std::vector<SqlValue> values;
   query.Compile(false, &condition, &values);
+  FlushIndexWrites();  // the query may read the full-text tables
   auto select = writer_->Prepare("SELECT d.key, d.doc FROM docs d WHERE " + condition + " ORDER BY d.key");
   select->BindAll(values);
   Json::Value out(Json::arrayValue);
@@ -429,6 +469,7 @@ Json::Value IndexStore::GetByQuery(const Query& query, const std::vector<std::st
 CommitChanges IndexStore::Commit() {
   CommitChanges changes;
   if (in_transaction_) {
+    FlushIndexWrites();
     writer_->Exec("COMMIT");
     in_transaction_ = false;
   }
@@ -444,6 +485,8 @@ CommitChanges IndexStore::Commit() {
 void IndexStore::Close(bool keep) {
   if (writer_ == nullptr) return;
   if (in_transaction_) {
+    if (keep) FlushIndexWrites();
+    pending_index_.Clear();
     writer_->Exec(keep ? "COMMIT" : "ROLLBACK");
     in_transaction_ = false;
   }

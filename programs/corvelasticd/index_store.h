@@ -18,6 +18,7 @@
 #include <vector>
 
 #include "programs/corvelasticd/index_schema.h"
+#include "programs/corvelasticd/pending_index_writes.h"
 #include "programs/corvelasticd/query.h"
 #include "programs/corvelasticd/sqlite_db.h"
 
@@ -117,6 +118,10 @@ class IndexStore {
   void NoteDelete(const std::string& key);
   template <typename Body>
   void Atomically(Body body);
+  void FlushIndexWrites();
+  void NoteLostTransaction();
+  // Runs a statement without parameters that returns no rows, kept prepared.
+  void Run(const char* sql);
 
   // Reader pool.
   std::unique_ptr<Database> TakeReader();
@@ -130,6 +135,7 @@ class IndexStore {
   std::vector<const FieldSpec*> text_fields_;
   std::vector<const FieldSpec*> ngram_fields_;
   std::string insert_text_sql_, delete_text_sql_, insert_name_sql_, delete_name_sql_;
+  PendingIndexWrites pending_index_;
   std::set<std::string> upserted_, deleted_;
   bool truncated_ = false;
 
