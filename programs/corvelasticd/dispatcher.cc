@@ -1,12 +1,11 @@
 #include "programs/corvelasticd/dispatcher.h"
 
 #include <algorithm>
-#include <functional>
-#include <map>
+#include <unordered_map>
 
-#include "common/json_util.h"
 #include "common/log.h"
 #include "programs/corvelasticd/daemon_error.h"
+#include "programs/corvelasticd/json_text.h"
 #include "programs/corvelasticd/request_args.h"
 #include "programs/corvelasticd/search.h"
 
@@ -44,9 +43,118 @@ Json::Value QueryClause(const Json::Value& data) {
   return query["qsl"];
 }
 
+struct Request {
+  IndexRegistry& registry;
+  const Json::Value& data;
+  const PeerIdentity& peer;
+  int backlog;
+};
+
+struct CommandInfo {
+  Json::Value (*run)(const Request&);
+  // Index-changing commands, and reads that bypass the access filter: root
+  // and the service user only.
+  bool changes_indexes;
+};
+
+Json::Value Empty() { return Json::Value(Json::objectValue); }
+
+// Built once: every request looks its command up here.
+const std::unordered_map<std::string, CommandInfo>& Commands() {
+  static const auto* const commands = new std::unordered_map<std::string, CommandInfo>{
+      {"search", {[](const Request& r) { return RunSearch(r.registry, r.data, AccessFilter(r.peer)); }, false}},
+      {"suggest", {[](const Request& r) { return RunSuggest(r.registry, r.data, AccessFilter(r.peer)); }, false}},
+      {"index_list", {[](const Request& r) { return r.registry.List(); }, false}},
+      {"index_create",
+       {[](const Request& r) {
+          const Json::Value settings = r.data.isMember("settings") ? RequiredObject(r.data, "settings") : Empty();
+          const Json::Value handler = r.data.isMember("event_handler") ? RequiredObject(r.data, "event_handler") : Empty();
+          Json::Value out(Json::objectValue);
+          out["created"] = r.registry.Create(NonEmptyString(r.data, "id"), NonEmptyString(r.data, "path"),
+                                             RequiredObject(r.data, "mappings"), settings, handler);
+          return out;
+        },
+        true}},
+      {"index_delete", {[](const Request& r) { r.registry.Delete(NonEmptyString(r.data, "id")); return Empty(); }, true}},
+      {"index_pause", {[](const Request& r) { r.registry.SetPaused(NonEmptyString(r.data, "id"), true); return Empty(); }, true}},
+      {"index_resume", {[](const Request& r) { r.registry.SetPaused(NonEmptyString(r.data, "id"), false); return Empty(); }, true}},
+      {"index_config_set",
+       {[](const Request& r) {
+          const Json::Value& changes = RequiredObject(r.data, "data");
+          const std::string new_id = OptionalString(changes, "id", "");
+          const std::string new_path = OptionalString(changes, "path", "");
+          if (new_id.empty() && new_path.empty()) throw DaemonError(kCodeBadArgument, "\"data\" needs a new \"id\" or \"path\"");
+          r.registry.Configure(NonEmptyString(r.data, "id"), new_id, new_path);
+          return Empty();
+        },
+        true}},
+      {"document_upsert_by_id",
+       {[](const Request& r) {
+          WriterTurn turn(r.registry.Get(NonEmptyString(r.data, "id")), true, r.backlog);
+          turn.store().Upsert(NonEmptyString(r.data, "doc_id"), RequiredObject(r.data, "data"));
+          return Empty();
+        },
+        true}},
+      {"document_set_by_id",
+       {[](const Request& r) {
+          WriterTurn turn(r.registry.Get(NonEmptyString(r.data, "id")), true, r.backlog);
+          turn.store().SetById(NonEmptyString(r.data, "doc_id"), RequiredObject(r.data, "data"));
+          return Empty();
+        },
+        true}},
+      {"document_del_by_id",
+       {[](const Request& r) {
+          WriterTurn turn(r.registry.Get(NonEmptyString(r.data, "id")), true, r.backlog);
+          Json::Value out(Json::objectValue);
+          out["deleted"] = turn.store().DeleteById(NonEmptyString(r.data, "doc_id")) ? 1 : 0;
+          return out;
+        },
+        true}},
+      {"document_del_by_query",
+       {[](const Request& r) {
+          WriterTurn turn(r.registry.Get(NonEmptyString(r.data, "id")), true, r.backlog);
+          const Query query = Query::Parse(QueryClause(r.data), turn.store().schema());
+          Json::Value out(Json::objectValue);
+          out["deleted"] = static_cast<Json::Int64>(turn.store().DeleteByQuery(query));
+          return out;
+        },
+        true}},
+      {"document_get_by_query",
+       {[](const Request& r) {
+          // Read through the writer so a rename sees its own uncommitted writes.
+          WriterTurn turn(r.registry.Get(NonEmptyString(r.data, "id")), false, r.backlog);
+          const Query query = Query::Parse(QueryClause(r.data), turn.store().schema());
+          std::vector<std::string> fields = OptionalStrings(QueryObject(r.data), "load_field");
+          if (fields.empty()) fields = OptionalStrings(r.data, "load_field");
+          return turn.store().GetByQuery(query, fields);
+        },
+        true}},
+      {"commit",
+       {[](const Request& r) {
+          WriterTurn turn(r.registry.Get(NonEmptyString(r.data, "id")), false, r.backlog);
+          const CommitChanges changes = turn.store().Commit();
+          if (turn.plugin() != nullptr) turn.plugin()->Committed(changes);
+          return Empty();
+        },
+        true}},
+      {"update_term_suggestion",
+       {[](const Request& r) {
+          const std::string id = r.data.isMember("id") ? NonEmptyString(r.data, "id") : NonEmptyString(r.data, "db_name");
+          WriterTurn turn(r.registry.Get(id), true, r.backlog);
+          turn.store().UpdateSuggestions(NonEmptyString(r.data, "doc_id_field"));
+          // Suggestions are for searches, which see committed data only.
+          const CommitChanges changes = turn.store().Commit();
+          if (turn.plugin() != nullptr) turn.plugin()->Committed(changes);
+          return Empty();
+        },
+        true}},
+  };
+  return *commands;
+}
+
 }  // namespace
 
-std::string Dispatcher::ErrorAnswer(int code, const std::string& message) { return JsonToString(Failure(code, message)); }
+std::string Dispatcher::ErrorAnswer(int code, const std::string& message) { return JsonText(Failure(code, message)); }
 
 bool Dispatcher::MayWrite(const PeerIdentity& peer) const {
   return peer.uid == 0 || std::find(options_.writer_uids.begin(), options_.writer_uids.end(), peer.uid) != options_.writer_uids.end();
@@ -54,8 +162,8 @@ bool Dispatcher::MayWrite(const PeerIdentity& peer) const {
 
 std::string Dispatcher::Handle(const std::string& text, const PeerIdentity& peer) {
   Json::Value request;
-  if (!JsonFromString(request, text)) return ErrorAnswer(kCodeBadRequest, "The request is not valid JSON");
-  return JsonToString(HandleRequest(request, peer, false));
+  if (!ParseJsonText(text, &request)) return ErrorAnswer(kCodeBadRequest, "The request is not valid JSON");
+  return JsonText(HandleRequest(request, peer, false));
 }
 
 Json::Value Dispatcher::HandleRequest(const Json::Value& request, const PeerIdentity& peer, bool nested) {
@@ -91,103 +199,12 @@ Json::Value Dispatcher::HandleRequest(const Json::Value& request, const PeerIden
 }
 
 Json::Value Dispatcher::Run(const std::string& command, const Json::Value& data, const PeerIdentity& peer) {
-  using Handler = std::function<Json::Value()>;
-  const int backlog = options_.max_writer_backlog;
-  Json::Value empty(Json::objectValue);
-
-  // Commands that read for everyone (filtered by the asking user).
-  const AccessFilter filter(peer);
-  const std::map<std::string, Handler> open_commands = {
-      {"search", [&] { return RunSearch(registry_, data, filter); }},
-      {"suggest", [&] { return RunSuggest(registry_, data, filter); }},
-      {"index_list", [&] { return registry_.List(); }},
-  };
-  const auto open = open_commands.find(command);
-  if (open != open_commands.end()) return open->second();
-
-  // Commands of the indexing side: root and the service user only.
-  const std::map<std::string, Handler> writer_commands = {
-      {"index_create",
-       [&] {
-         const Json::Value settings = data.isMember("settings") ? RequiredObject(data, "settings") : empty;
-         const Json::Value handler = data.isMember("event_handler") ? RequiredObject(data, "event_handler") : empty;
-         Json::Value out(Json::objectValue);
-         out["created"] = registry_.Create(NonEmptyString(data, "id"), NonEmptyString(data, "path"),
-                                           RequiredObject(data, "mappings"), settings, handler);
-         return out;
-       }},
-      {"index_delete", [&] { registry_.Delete(NonEmptyString(data, "id")); return empty; }},
-      {"index_pause", [&] { registry_.SetPaused(NonEmptyString(data, "id"), true); return empty; }},
-      {"index_resume", [&] { registry_.SetPaused(NonEmptyString(data, "id"), false); return empty; }},
-      {"index_config_set",
-       [&] {
-         const Json::Value& changes = RequiredObject(data, "data");
-         const std::string new_id = OptionalString(changes, "id", "");
-         const std::string new_path = OptionalString(changes, "path", "");
-         if (new_id.empty() && new_path.empty()) throw DaemonError(kCodeBadArgument, "\"data\" needs a new \"id\" or \"path\"");
-         registry_.Configure(NonEmptyString(data, "id"), new_id, new_path);
-         return empty;
-       }},
-      {"document_upsert_by_id",
-       [&] {
-         WriterTurn turn(registry_.Get(NonEmptyString(data, "id")), true, backlog);
-         turn.store().Upsert(NonEmptyString(data, "doc_id"), RequiredObject(data, "data"));
-         return empty;
-       }},
-      {"document_set_by_id",
-       [&] {
-         WriterTurn turn(registry_.Get(NonEmptyString(data, "id")), true, backlog);
-         turn.store().SetById(NonEmptyString(data, "doc_id"), RequiredObject(data, "data"));
-         return empty;
-       }},
-      {"document_del_by_id",
-       [&] {
-         WriterTurn turn(registry_.Get(NonEmptyString(data, "id")), true, backlog);
-         Json::Value out(Json::objectValue);
-         out["deleted"] = turn.store().DeleteById(NonEmptyString(data, "doc_id")) ? 1 : 0;
-         return out;
-       }},
-      {"document_del_by_query",
-       [&] {
-         WriterTurn turn(registry_.Get(NonEmptyString(data, "id")), true, backlog);
-         const Query query = Query::Parse(QueryClause(data), turn.store().schema());
-         Json::Value out(Json::objectValue);
-         out["deleted"] = static_cast<Json::Int64>(turn.store().DeleteByQuery(query));
-         return out;
-       }},
-      {"document_get_by_query",
-       [&] {
-         // Read through the writer so a rename sees its own uncommitted writes.
-         WriterTurn turn(registry_.Get(NonEmptyString(data, "id")), false, backlog);
-         const Query query = Query::Parse(QueryClause(data), turn.store().schema());
-         std::vector<std::string> fields = OptionalStrings(QueryObject(data), "load_field");
-         if (fields.empty()) fields = OptionalStrings(data, "load_field");
-         return turn.store().GetByQuery(query, fields);
-       }},
-      {"commit",
-       [&] {
-         WriterTurn turn(registry_.Get(NonEmptyString(data, "id")), false, backlog);
-         const CommitChanges changes = turn.store().Commit();
-         if (turn.plugin() != nullptr) turn.plugin()->Committed(changes);
-         return empty;
-       }},
-      {"update_term_suggestion",
-       [&] {
-         const std::string id = data.isMember("id") ? NonEmptyString(data, "id") : NonEmptyString(data, "db_name");
-         WriterTurn turn(registry_.Get(id), true, backlog);
-         turn.store().UpdateSuggestions(NonEmptyString(data, "doc_id_field"));
-         // Suggestions are for searches, which see committed data only.
-         const CommitChanges changes = turn.store().Commit();
-         if (turn.plugin() != nullptr) turn.plugin()->Committed(changes);
-         return empty;
-       }},
-  };
-  const auto writer = writer_commands.find(command);
-  if (writer == writer_commands.end()) throw DaemonError(kCodeUnknownCommand, "Unknown command \"" + command + "\"");
-  if (!MayWrite(peer)) {
+  const auto found = Commands().find(command);
+  if (found == Commands().end()) throw DaemonError(kCodeUnknownCommand, "Unknown command \"" + command + "\"");
+  if (found->second.changes_indexes && !MayWrite(peer)) {
     throw DaemonError(kCodePermissionDenied, "\"" + command + "\" is allowed to root and the service user only");
   }
-  return writer->second();
+  return found->second.run(Request{registry_, data, peer, options_.max_writer_backlog});
 }
 
 }  // namespace elasticd

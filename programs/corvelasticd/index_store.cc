@@ -9,6 +9,7 @@
 
 #include "common/json_util.h"
 #include "programs/corvelasticd/daemon_error.h"
+#include "programs/corvelasticd/document_codec.h"
 #include "programs/corvelasticd/index_files.h"
 #include "programs/corvelasticd/text_analysis.h"
 
@@ -24,9 +25,6 @@ constexpr size_t kFilterBatch = 64;
 constexpr size_t kMaxReaders = 4;
 // Full-text rows queued beyond this are handed to the engine before the next request.
 constexpr size_t kMaxPendingIndexBytes = 16u << 20;
-// Unmapped fields are stored under their name behind this mark, so they
-// never clash with the numbers of mapped fields.
-constexpr char kUnmappedMark = '~';
 
 [[noreturn]] void BadDocument(const std::string& what) { throw DaemonError(kCodeBadDocument, "Bad document: " + what); }
 
@@ -96,7 +94,7 @@ std::unique_ptr<IndexStore> IndexStore::Create(const std::string& directory, con
   if (name_columns.empty()) name_columns = "unused";
   db->Exec("BEGIN");
   db->Exec("CREATE TABLE meta(name TEXT PRIMARY KEY, value TEXT NOT NULL) WITHOUT ROWID");
-  db->Exec("CREATE TABLE docs(rowid INTEGER PRIMARY KEY, key TEXT NOT NULL, doc TEXT NOT NULL)");
+  db->Exec("CREATE TABLE docs(rowid INTEGER PRIMARY KEY, key TEXT NOT NULL, doc BLOB NOT NULL)");
   db->Exec("CREATE UNIQUE INDEX docs_key ON docs(key)");
   db->Exec("CREATE VIRTUAL TABLE fts_text USING fts5(" + text_columns + ", content='', tokenize='corvblank')");
   db->Exec("CREATE VIRTUAL TABLE fts_name USING fts5(" + name_columns + ", content='', tokenize='trigram case_sensitive 1')");
@@ -183,29 +181,12 @@ void IndexStore::ValidateDocument(const Json::Value& document) const {
   }
 }
 
-std::string IndexStore::EncodeDocument(const Json::Value& document) const {
-  Json::Value stored(Json::objectValue);
-  for (const std::string& name : document.getMemberNames()) {
-    if (name == schema_.property_id()) continue;  // kept once, as the row's key
-    const FieldSpec* field = schema_.Find(name);
-    stored[field != nullptr ? std::to_string(field->code) : kUnmappedMark + name] = document[name];
-  }
-  return JsonToString(stored);
+std::string IndexStore::EncodeDocument(const std::string& key, const Json::Value& document) const {
+  return elasticd::EncodeDocument(schema_, key, document);
 }
 
-Json::Value IndexStore::DecodeDocument(const std::string& key, const std::string& text) const {
-  Json::Value stored;
-  Json::Value document(Json::objectValue);
-  if (!JsonFromString(stored, text) || !stored.isObject()) return document;
-  for (const std::string& name : stored.getMemberNames()) {
-    if (!name.empty() && name[0] == kUnmappedMark) {
-      document[name.substr(1)] = stored[name];
-    } else if (const FieldSpec* field = schema_.FindCode(atoi(name.c_str()))) {
-      document[field->name] = stored[name];
-    }
-  }
-  document[schema_.property_id()] = key;
-  return document;
+Json::Value IndexStore::DecodeDocument(const std::string& key, std::string_view stored) const {
+  return elasticd::DecodeDocument(schema_, key, stored);
 }
 
 Json::Value IndexStore::VisibleFields(const Json::Value& document, const std::vector<std::string>& fields) const {
@@ -229,7 +210,7 @@ bool IndexStore::FindRow(const std::string& key, Row* row) {
   const bool found = stmt.Step();
   if (found) {
     row->rowid = stmt.Int(0);
-    row->stored = stmt.Text(1);
+    row->stored = std::string(stmt.Bytes(1));
   }
   stmt.Reset();
   return found;
@@ -367,11 +348,11 @@ void IndexStore::Upsert(const std::string& doc_id, const Json::Value& input) {
     Row row;
     // A document sent under an old key with a new key value moves to the new key.
     if (key != doc_id && FindRow(doc_id, &row)) RemoveRow(row.rowid, doc_id, row.stored);
-    const std::string stored = EncodeDocument(document);
+    const std::string stored = EncodeDocument(key, document);
     if (FindRow(key, &row)) {
       IndexEntries(row.rowid, DecodeDocument(key, row.stored), true);
       Statement& update = writer_->Cached("UPDATE docs SET doc = ? WHERE rowid = ?");
-      update.BindText(1, stored);
+      update.BindBlob(1, stored);
       update.Bind(2, row.rowid);
       update.Step();
       update.Reset();
@@ -379,7 +360,7 @@ void IndexStore::Upsert(const std::string& doc_id, const Json::Value& input) {
     } else {
       Statement& insert = writer_->Cached("INSERT INTO docs(key, doc) VALUES(?, ?)");
       insert.BindText(1, key);
-      insert.BindText(2, stored);
+      insert.BindBlob(2, stored);
       insert.Step();
       insert.Reset();
       IndexEntries(sqlite3_last_insert_rowid(writer_->raw()), document, false);
@@ -407,7 +388,7 @@ void IndexStore::SetById(const std::string& doc_id, const Json::Value& changes) 
     }
     Statement& update = writer_->Cached("UPDATE docs SET key = ?, doc = ? WHERE rowid = ?");
     update.BindText(1, key);
-    update.BindText(2, EncodeDocument(document));
+    update.BindBlob(2, EncodeDocument(key, document));
     update.Bind(3, row.rowid);
     update.Step();
     update.Reset();
@@ -445,7 +426,7 @@ int64_t IndexStore::DeleteByQuery(const Query& query) {
       load.Bind(1, rowid);
       if (!load.Step()) continue;
       const std::string key = load.Text(0);
-      const std::string stored = load.Text(1);
+      const std::string stored(load.Bytes(1));
       load.Reset();
       RemoveRow(rowid, key, stored);
       ++deleted;
@@ -462,7 +443,7 @@ Json::Value IndexStore::GetByQuery(const Query& query, const std::vector<std::st
   auto select = writer_->Prepare("SELECT d.key, d.doc FROM docs d WHERE " + condition + " ORDER BY d.key");
   select->BindAll(values);
   Json::Value out(Json::arrayValue);
-  while (select->Step()) out.append(VisibleFields(DecodeDocument(select->Text(0), select->Text(1)), fields));
+  while (select->Step()) out.append(VisibleFields(DecodeDocument(select->Text(0), select->Bytes(1)), fields));
   return out;
 }
 
@@ -507,7 +488,7 @@ void IndexStore::UpdateSuggestions(const std::string& name) {
     auto scan = writer_->Prepare("SELECT key, doc FROM docs");
     const Analyzer analyzer = field->kind == FieldKind::kKeyword ? Analyzer::kKeyword : Analyzer::kStandard;
     while (scan->Step()) {
-      const Json::Value document = DecodeDocument(scan->Text(0), scan->Text(1));
+      const Json::Value document = DecodeDocument(scan->Text(0), scan->Bytes(1));
       std::vector<std::string> tokens;
       ForEachValue(document[name], [&](const Json::Value& value) { Analyze(analyzer, ValueText(value), &tokens); });
       std::sort(tokens.begin(), tokens.end());
@@ -573,7 +554,7 @@ SearchResult IndexStore::Search(const Query& query, const SortSpec& sort, size_t
   } else if (sort.by == SortSpec::By::kKey) {
     order = std::string("d.key") + (sort.descending ? " DESC" : "");
   } else if (sort.by == SortSpec::By::kField) {
-    sort_expression = "json_extract(d.doc, '$.\"" + std::to_string(sort.code) + "\"')";
+    sort_expression = "corv_field(d.key, d.doc, " + std::to_string(sort.code) + ")";
     if (sort.text) sort_expression = "corv_fold(" + sort_expression + ")";
     order = sort_expression + (sort.descending ? " DESC" : "") + ", d.key";
   }
@@ -615,7 +596,7 @@ SearchResult IndexStore::Search(const Query& query, const SortSpec& sort, size_t
           // Documents are read only for the hits that make the page.
           load.Reset();
           load.Bind(1, rowids[i]);
-          if (load.Step()) batch[i].document = DecodeDocument(batch[i].key, load.Text(0));
+          if (load.Step()) batch[i].document = DecodeDocument(batch[i].key, load.Bytes(0));
           load.Reset();
           result.hits.push_back(std::move(batch[i]));
         }

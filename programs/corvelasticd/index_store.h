@@ -104,8 +104,8 @@ class IndexStore {
   // Writer helpers.
   void Begin();
   void ValidateDocument(const Json::Value& document) const;
-  std::string EncodeDocument(const Json::Value& document) const;
-  Json::Value DecodeDocument(const std::string& key, const std::string& stored) const;
+  std::string EncodeDocument(const std::string& key, const Json::Value& document) const;
+  Json::Value DecodeDocument(const std::string& key, std::string_view stored) const;
   struct Row {
     int64_t rowid = 0;
     std::string stored;

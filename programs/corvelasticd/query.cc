@@ -393,7 +393,7 @@ const QueryNode* FindRanked(const QueryNode& node) {
   return nullptr;
 }
 
-std::string JsonField(int code) { return "json_extract(d.doc, '$.\"" + std::to_string(code) + "\"')"; }
+std::string JsonField(int code) { return "corv_field(d.key, d.doc, " + std::to_string(code) + ")"; }
 
 }  // namespace
 

@@ -2,18 +2,21 @@
 
 #include <fcntl.h>
 #include <poll.h>
+#include <sys/epoll.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
 #include <unistd.h>
 
 #include <cerrno>
+#include <chrono>
 #include <cstring>
 #include <stdexcept>
 #include <thread>
 
 #include "common/error.h"
 #include "common/log.h"
+#include "common/sys.h"
 #include "fileindex/communication.h"
 #include "programs/corvelasticd/daemon_error.h"
 #include "programs/corvelasticd/request_frame.h"
@@ -21,6 +24,10 @@
 namespace corvlumex {
 namespace elasticd {
 namespace {
+
+// Workers started with the server, and the most that stay waiting after a burst.
+constexpr int kStartWorkers = 2;
+constexpr int kMaxIdleWorkers = 4;
 
 sockaddr_un Address(const std::string& path) {
   sockaddr_un address;
@@ -73,7 +80,8 @@ void Server::Listen() {
     if (SomeoneListens(path)) throw std::runtime_error("another daemon already answers on " + path);
     unlink(path.c_str());
   }
-  listen_fd_ = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  // Non-blocking: every waiting worker may be told of a connection another one takes.
+  listen_fd_ = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
   if (listen_fd_ < 0) throw std::runtime_error(std::string("socket: ") + strerror(errno));
   const sockaddr_un address = Address(path);
   // Nobody may connect before the mode below is in place.
@@ -97,43 +105,98 @@ void Server::Stop() {
 }
 
 void Server::Run() {
+  {
+    std::lock_guard<std::mutex> guard(mutex_);
+    for (int i = 0; i < kStartWorkers; ++i) StartWorker();
+  }
   for (;;) {
-    struct pollfd pollers[2] = {{listen_fd_, POLLIN, 0}, {wake_pipe_[0], POLLIN, 0}};
-    if (poll(pollers, 2, -1) < 0) {
-      if (errno == EINTR) continue;
-      CORV_LOG_FAILED("poll(listen socket)");
+    struct pollfd poller = {wake_pipe_[0], POLLIN, 0};
+    if (poll(&poller, 1, -1) > 0) break;
+    if (errno != EINTR) {
+      CORV_LOG_FAILED("poll(wake pipe)");
       break;
     }
-    if (pollers[1].revents != 0) break;
-    const int fd = accept4(listen_fd_, nullptr, nullptr, SOCK_CLOEXEC);
-    if (fd < 0) {
-      errno = 0;
-      continue;
-    }
-    const struct timeval send_timeout = {options_.stall_ms / 1000, (options_.stall_ms % 1000) * 1000};
-    setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &send_timeout, sizeof(send_timeout));
-    {
-      std::lock_guard<std::mutex> guard(mutex_);
-      if (active_ >= options_.max_clients) {
-        SendAnswer(fd, Dispatcher::ErrorAnswer(kCodeBusy, "Too many clients; try again later"));
-        close(fd);
-        continue;
-      }
-      ++active_;
-      open_fds_.insert(fd);
-    }
-    std::thread([this, fd] {
-      Serve(fd);
-      std::lock_guard<std::mutex> guard(mutex_);
-      open_fds_.erase(fd);
-      close(fd);
-      if (--active_ == 0) idle_.notify_all();
-    }).detach();
   }
   // Connections finish the request they are in; no new request is read.
   std::unique_lock<std::mutex> lock(mutex_);
+  stopping_ = true;
   for (const int fd : open_fds_) shutdown(fd, SHUT_RD);
-  idle_.wait(lock, [this] { return active_ == 0; });
+  all_done_.wait(lock, [this] { return workers_ == 0; });
+}
+
+void Server::StartWorker() {
+  ++workers_;
+  ++waiting_;
+  std::thread([this] { WorkerLoop(); }).detach();
+}
+
+int Server::Accept(int poll_fd) {
+  for (;;) {
+    struct epoll_event event;
+    const int ready = epoll_wait(poll_fd, &event, 1, -1);
+    if (ready < 0 && errno != EINTR) {
+      CORV_LOG_FAILED("epoll_wait(listen socket)");
+      return -1;
+    }
+    if (ready <= 0) continue;
+    if (event.data.fd == wake_pipe_[0]) return -1;
+    const int fd = accept4(listen_fd_, nullptr, nullptr, SOCK_CLOEXEC);
+    if (fd >= 0) return fd;
+    if (errno == EMFILE || errno == ENFILE || errno == ENOBUFS || errno == ENOMEM) {
+      // Out of descriptors or memory: let the connections in progress end.
+      SleepFor(std::chrono::milliseconds(10));
+    }
+    errno = 0;  // another worker took it, or the client gave up
+  }
+}
+
+void Server::WorkerLoop() {
+  // Each worker waits on its own epoll set; EPOLLEXCLUSIVE wakes one waiting
+  // worker per connection, while a stop wakes them all.
+  const int poll_fd = epoll_create1(EPOLL_CLOEXEC);
+  struct epoll_event listen_event = {EPOLLIN | EPOLLEXCLUSIVE, {}};
+  listen_event.data.fd = listen_fd_;
+  struct epoll_event wake_event = {EPOLLIN, {}};
+  wake_event.data.fd = wake_pipe_[0];
+  if (poll_fd < 0 || epoll_ctl(poll_fd, EPOLL_CTL_ADD, listen_fd_, &listen_event) != 0 ||
+      epoll_ctl(poll_fd, EPOLL_CTL_ADD, wake_pipe_[0], &wake_event) != 0) {
+    CORV_LOG_FAILED("epoll(listen socket)");
+  }
+  std::unique_lock<std::mutex> lock(mutex_);
+  while (!stopping_) {
+    lock.unlock();
+    const int fd = poll_fd >= 0 ? Accept(poll_fd) : -1;
+    lock.lock();
+    --waiting_;
+    if (fd < 0 || stopping_) {
+      if (fd >= 0) close(fd);
+      break;
+    }
+    if (serving_ >= options_.max_clients) {
+      lock.unlock();
+      SendAnswer(fd, Dispatcher::ErrorAnswer(kCodeBusy, "Too many clients; try again later"));
+      close(fd);
+      lock.lock();
+      ++waiting_;
+      continue;
+    }
+    ++serving_;
+    open_fds_.insert(fd);
+    // Someone must be waiting for the next client (or to tell it the server is full).
+    if (waiting_ == 0 && workers_ <= options_.max_clients) StartWorker();
+    lock.unlock();
+    const struct timeval send_timeout = {options_.stall_ms / 1000, (options_.stall_ms % 1000) * 1000};
+    setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &send_timeout, sizeof(send_timeout));
+    Serve(fd);
+    lock.lock();
+    open_fds_.erase(fd);
+    close(fd);
+    --serving_;
+    if (waiting_ >= kMaxIdleWorkers) break;
+    ++waiting_;
+  }
+  if (poll_fd >= 0) close(poll_fd);
+  if (--workers_ == 0) all_done_.notify_all();
 }
 
 void Server::Serve(int fd) {

@@ -1,6 +1,9 @@
-// The daemon's Unix socket: accepts clients, one thread per connection, each
-// connection reading request frames and answering each with one frame until
-// the client closes it.
+// The daemon's Unix socket. A pool of worker threads takes the connections:
+// each worker accepts one, reads its request frames and answers each with
+// one frame until the client closes it, then accepts the next. The pool
+// grows while every worker is busy (up to --max-clients, plus one that
+// answers "busy" beyond that) and shrinks back to a few idle workers, so a
+// request costs no thread start and no hand-over between threads.
 #pragma once
 
 #include <sys/types.h>
@@ -41,14 +44,22 @@ class Server {
 
  private:
   void Serve(int fd);
+  // With mutex_ held.
+  void StartWorker();
+  void WorkerLoop();
+  // The next connection, or -1 when the server stops.
+  int Accept(int poll_fd);
 
   ServerOptions options_;
   Dispatcher& dispatcher_;
   int listen_fd_ = -1;
   int wake_pipe_[2] = {-1, -1};
   std::mutex mutex_;
-  std::condition_variable idle_;
-  int active_ = 0;
+  std::condition_variable all_done_;
+  bool stopping_ = false;
+  int workers_ = 0;   // threads alive
+  int waiting_ = 0;   // workers waiting for a connection
+  int serving_ = 0;   // connections being served
   std::set<int> open_fds_;
 };
 

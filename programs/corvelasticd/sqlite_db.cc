@@ -1,6 +1,7 @@
 #include "programs/corvelasticd/sqlite_db.h"
 
 #include "programs/corvelasticd/daemon_error.h"
+#include "programs/corvelasticd/document_codec.h"
 #include "programs/corvelasticd/fts_tokenizer.h"
 
 namespace corvlumex {
@@ -32,6 +33,11 @@ void Statement::BindText(int index, std::string_view text) {
   if (rc != SQLITE_OK) ThrowSqlite(db_, rc, "bind");
 }
 
+void Statement::BindBlob(int index, std::string_view bytes) {
+  const int rc = sqlite3_bind_blob64(stmt_, index, bytes.data(), bytes.size(), SQLITE_TRANSIENT);
+  if (rc != SQLITE_OK) ThrowSqlite(db_, rc, "bind");
+}
+
 void Statement::BindAll(const std::vector<SqlValue>& values) {
   for (size_t i = 0; i < values.size(); ++i) Bind(static_cast<int>(i + 1), values[i]);
 }
@@ -56,6 +62,12 @@ std::string Statement::Text(int column) const {
   return std::string(text, static_cast<size_t>(sqlite3_column_bytes(stmt_, column)));
 }
 
+std::string_view Statement::Bytes(int column) const {
+  const auto* bytes = static_cast<const char*>(sqlite3_column_blob(stmt_, column));
+  if (bytes == nullptr) return std::string_view();
+  return std::string_view(bytes, static_cast<size_t>(sqlite3_column_bytes(stmt_, column)));
+}
+
 Database::Database(const std::string& path, bool create) {
   const int flags = SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX | (create ? SQLITE_OPEN_CREATE : 0);
   const int rc = sqlite3_open_v2(path.c_str(), &db_, flags, nullptr);
@@ -68,6 +80,7 @@ Database::Database(const std::string& path, bool create) {
   sqlite3_extended_result_codes(db_, 1);
   sqlite3_busy_timeout(db_, 5000);
   RegisterTokenizer(db_);
+  RegisterDocumentFunctions(db_);
 }
 
 Database::~Database() {

@@ -28,6 +28,7 @@ class Statement {
 
   void Bind(int index, const SqlValue& value);
   void BindText(int index, std::string_view text);
+  void BindBlob(int index, std::string_view bytes);
   void BindAll(const std::vector<SqlValue>& values);
   // True while a row is available.
   bool Step();
@@ -38,6 +39,8 @@ class Statement {
   bool IsNull(int column) const { return sqlite3_column_type(stmt_, column) == SQLITE_NULL; }
   int Type(int column) const { return sqlite3_column_type(stmt_, column); }
   std::string Text(int column) const;
+  // The column's bytes as stored (text or blob), valid until the next step or reset.
+  std::string_view Bytes(int column) const;
 
  private:
   sqlite3* db_;

@@ -2,6 +2,7 @@
 // the real socket, compound answers, busy answers, restarts.
 #include <gtest/gtest.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <fstream>
 #include <sstream>
@@ -324,6 +325,29 @@ TEST_F(BacklogDaemonTest, WritesOverTheBacklogBoundAnswer1400) {
   const Json::Value answer = Run("document_upsert_by_id", data);
   EXPECT_EQ(answer["error"]["code"].asInt(), 1400);
   EXPECT_NE(answer["error"]["msg"].asString().find("too many writes"), std::string::npos);
+}
+
+class ClientLimitDaemonTest : public DaemonTest {
+ protected:
+  std::vector<std::string> ExtraArgs() override { return {"--max-clients", "2"}; }
+};
+
+TEST_F(ClientLimitDaemonTest, ClientsOverTheLimitAnswer1400AndTheOthersGoOn) {
+  Json::Value list(Json::objectValue);
+  list["command"] = "index_list";
+  // Two kept-open connections, each known to be served (it has been answered).
+  std::vector<int> held;
+  for (int i = 0; i < 2; ++i) {
+    held.push_back(ConnectTo(daemon_->socket_path()));
+    ASSERT_GE(held.back(), 0);
+    EXPECT_TRUE(Exchange(held.back(), list)["success"].asBool());
+  }
+  const Json::Value refused = Send(daemon_->socket_path(), list);
+  EXPECT_EQ(refused["error"]["code"].asInt(), 1400) << JsonToString(refused);
+  for (const int fd : held) {
+    EXPECT_TRUE(Exchange(fd, list)["success"].asBool());
+    close(fd);
+  }
 }
 
 }  // namespace

@@ -29,7 +29,9 @@ std::string DaemonBinary() {
   return CORVELASTICD_BINARY;
 }
 
-int Connect(const std::string& path) {
+}  // namespace
+
+int ConnectTo(const std::string& path) {
   const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
   sockaddr_un address;
   memset(&address, 0, sizeof(address));
@@ -41,8 +43,6 @@ int Connect(const std::string& path) {
   }
   return fd;
 }
-
-}  // namespace
 
 Json::Value LibraryMappings() {
   const char* text = R"({
@@ -113,7 +113,7 @@ void Daemon::Start() {
   }
   // Ready when the socket answers.
   for (int attempt = 0; attempt < 2000; ++attempt) {
-    const int fd = Connect(socket_);
+    const int fd = ConnectTo(socket_);
     if (fd >= 0) {
       close(fd);
       return;
@@ -162,7 +162,7 @@ std::string Frame(const std::string& text) {
 std::string SendRaw(const std::string& socket, const std::string& bytes) {
   // The daemon may answer and hang up before a refused request is fully sent.
   signal(SIGPIPE, SIG_IGN);
-  const int fd = Connect(socket);
+  const int fd = ConnectTo(socket);
   if (fd < 0) throw std::runtime_error("cannot connect to " + socket);
   try {
     if (!bytes.empty()) fileindex::BufferWrite(fd, static_cast<unsigned int>(bytes.size()), reinterpret_cast<const unsigned char*>(bytes.data()));
@@ -173,6 +173,16 @@ std::string SendRaw(const std::string& socket, const std::string& bytes) {
   const elasticd::FrameStatus status = elasticd::ReadRequestFrame(fd, 1u << 30, 20000, 20000, &answer);
   close(fd);
   return status == elasticd::FrameStatus::kOk ? answer : std::string();
+}
+
+Json::Value Exchange(int fd, const Json::Value& request) {
+  fileindex::WriteFrame(fd, JsonToString(request));
+  std::string text;
+  Json::Value answer;
+  if (elasticd::ReadRequestFrame(fd, 1u << 30, 20000, 20000, &text) != elasticd::FrameStatus::kOk || !JsonFromString(answer, text)) {
+    throw std::runtime_error("no JSON answer: \"" + text + "\"");
+  }
+  return answer;
 }
 
 Json::Value Send(const std::string& socket, const Json::Value& request) {

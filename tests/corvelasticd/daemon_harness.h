@@ -38,6 +38,10 @@ class Daemon {
   pid_t pid_ = -1;
 };
 
+// A connection to the socket (-1 when refused), and one request/answer on it.
+int ConnectTo(const std::string& socket);
+Json::Value Exchange(int fd, const Json::Value& request);
+
 // One request on a fresh connection; the parsed answer.
 Json::Value Send(const std::string& socket, const Json::Value& request);
 // Raw bytes in, raw answer text out ("" when the daemon closed without answering).
