@@ -1,0 +1,195 @@
+// Listing, reading, adding and changing folders end to end in a sandbox,
+// with fake fileindexd and corvelasticd.
+#include <gtest/gtest.h>
+
+#include "common/json_util.h"
+#include "fileindex/index_mgr.h"
+#include "tests/mgmt/mgmt_sandbox.h"
+#include "tests/mgmt/test_platform.h"
+
+namespace corvlumex {
+namespace fileindex {
+namespace {
+
+using testing_support::ErrorOf;
+using testing_support::FolderJson;
+using testing_support::LogCapture;
+using testing_support::MgmtSandbox;
+using testing_support::ScopedTestPlatform;
+using testing_support::ShareFlags;
+using ::testing::ElementsAre;
+
+Json::Value List(const std::vector<Json::Value>& folders) {
+  Json::Value list(Json::arrayValue);
+  for (const Json::Value& folder : folders) list.append(folder);
+  return list;
+}
+
+std::string Kinds(const Json::Value& data) {
+  std::string text;
+  for (const char* kind : {"document", "audio", "video", "photo"}) text += data[kind].asBool() ? "1" : "0";
+  return text;
+}
+
+class FolderUpsertTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    photo_ = sandbox_.AddShare("photo");
+    music_ = sandbox_.AddShare("music", "volume2");
+    sandbox_.AddShare("ro", "volume1", ShareFlags{true, false, false});
+    sandbox_.MakeDir("volume1/photo/a");
+    sandbox_.MakeDir("volume1/photo/b");
+  }
+
+  // A refused request changes nothing anywhere, and says why.
+  void ExpectRefused(const Json::Value& list, bool create, ErrorCode code, const std::string& reason,
+                     const std::string& condition) {
+    const testing_support::SystemSnapshot before = sandbox_.Snapshot();
+    LogCapture log;
+    const Error error = ErrorOf([&] { FolderUpsert(list, create, false); });
+    EXPECT_EQ(error.code, code);
+    if (!reason.empty()) EXPECT_EQ(error.reason, reason);
+    if (!condition.empty()) {
+      EXPECT_EQ(log.Matching("(FolderUpsert) Failed [" + condition + "], reason: " + reason).size(), 1u)
+          << "log: " << ::testing::PrintToString(log.Lines());
+    }
+    EXPECT_EQ(sandbox_.Snapshot(), before);
+  }
+
+  MgmtSandbox sandbox_;
+  std::string photo_;
+  std::string music_;
+};
+
+TEST_F(FolderUpsertTest, AddPreparesIndexMonitorDaemonAndReindex) {
+  FolderAdd(List({FolderJson("/photo/a"), FolderJson("/music", true, true, false, false), FolderJson("/photo/b")}),
+            false);
+
+  // Touched shares in name order, one index each, created once.
+  EXPECT_THAT(sandbox_.SearchCommands(), ElementsAre("index_create fileindex_music", "index_create fileindex_photo"));
+  EXPECT_EQ(sandbox_.SearchRequests()[1]["data"]["path"].asString(), photo_ + "/@eaDir/fileindex.db");
+  const Json::Value cfg = sandbox_.MonitorCfg("photo");
+  ASSERT_EQ(cfg["config"].size(), 2u);
+  EXPECT_EQ(cfg["config"][0]["path"].asString(), photo_ + "/a");
+  EXPECT_EQ(sandbox_.MonitorCfg("music")["config"][0]["path"].asString(), music_);
+
+  Json::Value saved;
+  ASSERT_TRUE(JsonFromFile(saved, sandbox_.FoldersFile()));
+  ASSERT_EQ(saved.size(), 3u);
+  EXPECT_EQ(saved[1]["path"].asString(), "/music");
+
+  const std::vector<Json::Value> commands = sandbox_.DaemonCommands();
+  ASSERT_EQ(commands.size(), 2u);
+  EXPECT_EQ(commands[0]["type"].asString(), "notify_setting_changed");
+  EXPECT_EQ(commands[0]["data"]["share_name"].asString(), "music");
+  EXPECT_EQ(commands[1]["data"]["share_name"].asString(), "photo");
+  EXPECT_TRUE(commands[1]["data"]["is_upsert"].asBool());
+
+  // Everything in a new folder is indexed: all four kinds, whatever it selects.
+  const std::vector<Json::Value> events = sandbox_.QueueEvents("photo");
+  ASSERT_EQ(events.size(), 2u);
+  EXPECT_EQ(events[0]["event"].asUInt(), 131072u);
+  EXPECT_EQ(events[0]["path"].asString(), photo_ + "/a");
+  EXPECT_EQ(events[0]["path_old"].asString(), "");
+  EXPECT_EQ(Kinds(events[0]["data"]), "1111");
+  EXPECT_EQ(events[1]["path"].asString(), photo_ + "/b");
+  ASSERT_EQ(sandbox_.QueueEvents("music").size(), 1u);
+  EXPECT_EQ(Kinds(sandbox_.QueueEvents("music")[0]["data"]), "1111");
+  EXPECT_EQ(sandbox_.ServiceRequests().back(), "start pkg-CorvLumex-fileindexd.service");
+
+  // A second folder of an indexed share does not create its index again.
+  sandbox_.MakeDir("volume1/photo/c");
+  FolderAdd(List({FolderJson("/photo/c")}), false);
+  EXPECT_EQ(sandbox_.SearchRequests().size(), 2u);
+}
+
+TEST_F(FolderUpsertTest, SetReindexesOnlyTheKindsThatChanged) {
+  FolderAdd(List({FolderJson("/photo/a")}), false);
+  const size_t requests = sandbox_.SearchRequests().size();
+  FolderSet(List({FolderJson("/photo/a", false, true, true, false)}), false);
+  EXPECT_EQ(sandbox_.SearchRequests().size(), requests);  // no index created for a change
+  const std::vector<Json::Value> events = sandbox_.QueueEvents("photo");
+  ASSERT_EQ(events.size(), 2u);
+  EXPECT_EQ(Kinds(events[1]["data"]), "1001");
+  EXPECT_EQ(sandbox_.DaemonCommands().size(), 2u);
+
+  // A new folder inside an indexed one, set rather than added: only what differs
+  // from the folder that governed it.
+  sandbox_.MakeDir("volume1/photo/a/x");
+  FolderSet(List({FolderJson("/photo/a/x", false, true, false, false)}), false);
+  EXPECT_EQ(Kinds(sandbox_.QueueEvents("photo")[2]["data"]), "0010");
+}
+
+TEST_F(FolderUpsertTest, RefusalsChangeNothing) {
+  FolderAdd(List({FolderJson("/photo/a")}), false);
+  ExpectRefused(Json::Value(Json::objectValue), true, kErrorBadArgument, "{}", "!folder_list.isArray()");
+  ExpectRefused(List({FolderJson("/photo/b"), FolderJson("/ro")}), true, kErrorPathCannotIndex,
+                "Path cannot index: /ro", "!CanPathBeIndexed(folder_new->GetPath()) && !updater_mode");
+  ExpectRefused(List({FolderJson("/photo/b"), FolderJson("/photo/a")}), true, kErrorDuplicatedId,
+                "Duplicated ID: /photo/a", "create && folder_mgr.HasFolder(folder_new->GetPath())");
+  ExpectRefused(List({FolderJson("/photo/b"), FolderJson("/photo/b")}), true, kErrorDuplicatedId,
+                "Duplicated ID: /photo/b", "create && folder_mgr.HasFolder(folder_new->GetPath())");
+  // A malformed element, and a share that does not exist.
+  Json::Value no_name = FolderJson("/photo/b");
+  no_name.removeMember("name");
+  ExpectRefused(List({FolderJson("/photo/b"), FolderJson("/nosuch")}), false, kErrorShareNotFound, "", "");
+  ExpectRefused(List({no_name}), false, kErrorBadArgument, "", "");
+}
+
+TEST_F(FolderUpsertTest, FullVolumeRefusesTheRequest) {
+  ScopedTestPlatform platform;
+  platform->no_space = true;
+  ExpectRefused(List({FolderJson("/photo/a")}), true, kErrorNoSpace, "Share (photo) space not enough",
+                "!share.IsSpaceEnough()");
+}
+
+TEST_F(FolderUpsertTest, UpdaterModeStoresRefusedPathsWithoutReindex) {
+  FolderAdd(List({FolderJson("/ro")}), true);
+  Json::Value saved;
+  ASSERT_TRUE(JsonFromFile(saved, sandbox_.FoldersFile()));
+  ASSERT_EQ(saved.size(), 1u);
+  EXPECT_EQ(saved[0]["path"].asString(), "/ro");
+  EXPECT_THAT(sandbox_.SearchCommands(), ElementsAre("index_create fileindex_ro"));
+  EXPECT_EQ(sandbox_.DaemonCommands().size(), 1u);
+  EXPECT_TRUE(sandbox_.QueueEvents("ro").empty());
+}
+
+TEST_F(FolderUpsertTest, EmptyListStartsServicesAndSavesTheSameList) {
+  FolderAdd(Json::Value(Json::arrayValue), false);
+  EXPECT_EQ(MgmtSandbox::Read(sandbox_.FoldersFile()), "[]\n");
+  EXPECT_EQ(sandbox_.ServiceRequests().back(), "start pkg-CorvLumex-fileindexd.service");
+  EXPECT_TRUE(sandbox_.SearchRequests().empty());
+  EXPECT_TRUE(sandbox_.DaemonCommands().empty());
+}
+
+TEST_F(FolderUpsertTest, ListAndGet) {
+  FolderAdd(List({FolderJson("/photo/b"), FolderJson("/music"), FolderJson("/photo/a")}), false);
+  Json::Value out;
+  FolderList(out, 1, 1, "path", "ASC", Json::Value(Json::arrayValue));
+  EXPECT_EQ(out["total"].asUInt(), 3u);
+  EXPECT_EQ(out["offset"].asUInt(), 1u);
+  ASSERT_EQ(out["folder"].size(), 1u);
+  EXPECT_EQ(out["folder"][0]["path"].asString(), "/photo/a");
+  EXPECT_FALSE(out["folder"][0].isMember("additional"));
+
+  Json::Value additional(Json::arrayValue);
+  additional.append("status");
+  FolderList(out, 0, 0, "", "", additional);
+  ASSERT_EQ(out["folder"].size(), 3u);
+  EXPECT_TRUE(out["folder"][2]["additional"]["status"].isMember("text"));
+
+  FolderList(out, 10, 5, "name", "DESC", Json::Value(Json::arrayValue));
+  EXPECT_EQ(out["offset"].asUInt(), 10u);
+  EXPECT_EQ(out["total"].asUInt(), 3u);
+  EXPECT_TRUE(out["folder"].isArray());
+  EXPECT_EQ(out["folder"].size(), 0u);
+
+  FolderGet(out, "/music");
+  EXPECT_EQ(out["path"].asString(), "/music");
+  EXPECT_EQ(out["name"].asString(), "music");
+  EXPECT_EQ(ErrorOf([&] { FolderGet(out, "/music/x"); }).code, kErrorFolderNotFound);
+}
+
+}  // namespace
+}  // namespace fileindex
+}  // namespace corvlumex

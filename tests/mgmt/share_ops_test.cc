@@ -1,0 +1,171 @@
+// Following a renamed share, a share moved to another volume, and a recycle
+// bin switched on or off, end to end in a sandbox.
+#include <gtest/gtest.h>
+
+#include <filesystem>
+
+#include "common/json_util.h"
+#include "fileindex/index_mgr.h"
+#include "fileindex/status_mgr.h"
+#include "tests/mgmt/mgmt_sandbox.h"
+#include "tests/mgmt/test_platform.h"
+
+namespace corvlumex {
+namespace fileindex {
+namespace {
+
+using testing_support::ErrorOf;
+using testing_support::FolderJson;
+using testing_support::LogCapture;
+using testing_support::MgmtSandbox;
+using testing_support::ScopedTestPlatform;
+using testing_support::SystemSnapshot;
+using ::testing::ElementsAre;
+
+Json::Value List(const std::vector<Json::Value>& items) {
+  Json::Value list(Json::arrayValue);
+  for (const Json::Value& item : items) list.append(item);
+  return list;
+}
+
+class ShareOpsTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    photo_ = sandbox_.AddShare("photo");
+    sandbox_.AddShare("music", "volume2");
+    sandbox_.MakeDir("volume1/photo/a");
+    FolderAdd(List({FolderJson("/photo"), FolderJson("/photo/a", true, false, false, false)}), false);
+    std::filesystem::remove(photo_ + "/@eaDir/fileindex.queue");
+    search_before_ = sandbox_.SearchRequests().size();
+    daemon_before_ = sandbox_.DaemonCommands().size();
+  }
+  std::vector<std::string> NewSearchCommands() const {
+    const std::vector<std::string> all = sandbox_.SearchCommands();
+    return std::vector<std::string>(all.begin() + search_before_, all.end());
+  }
+  std::vector<Json::Value> NewDaemonCommands() const {
+    const std::vector<Json::Value> all = sandbox_.DaemonCommands();
+    return std::vector<Json::Value>(all.begin() + daemon_before_, all.end());
+  }
+  void ExpectRefused(const std::function<void()>& action, ErrorCode code, const std::string& condition) {
+    const SystemSnapshot before = sandbox_.Snapshot();
+    LogCapture log;
+    EXPECT_EQ(ErrorOf(action).code, code);
+    if (!condition.empty()) EXPECT_EQ(log.Matching("Failed [" + condition + "]").size(), 1u);
+    EXPECT_EQ(sandbox_.Snapshot(), before);
+  }
+
+  MgmtSandbox sandbox_;
+  std::string photo_;
+  size_t search_before_ = 0;
+  size_t daemon_before_ = 0;
+};
+
+TEST_F(ShareOpsTest, RenameMovesFoldersIndexMonitorAndStatus) {
+  StatusMgr().SetShareStatus("photo", kShareStatusPaused);
+  const std::string old_queue_cfg = sandbox_.Snapshot().monitor.begin()->first;
+  const std::string pics = sandbox_.RenameShare("photo", "pics");
+  ShareRename("photo", "pics");
+
+  const std::vector<Json::Value> requests = sandbox_.SearchRequests();
+  EXPECT_THAT(NewSearchCommands(), ElementsAre("index_config_set fileindex_photo",
+                                               "document_del_by_query fileindex_pics prefix=" + photo_ + "/",
+                                               "document_del_by_id fileindex_pics " + photo_));
+  EXPECT_EQ(JsonToString(requests[search_before_]["data"]["data"]),
+            "{\"id\":\"fileindex_pics\",\"path\":\"" + pics + "/@eaDir/fileindex.db\"}");
+  Json::Value saved;
+  ASSERT_TRUE(JsonFromFile(saved, sandbox_.FoldersFile()));
+  EXPECT_EQ(saved[0]["path"].asString(), "/pics");
+  EXPECT_EQ(saved[1]["path"].asString(), "/pics/a");
+  EXPECT_EQ(saved[1]["document"].asBool(), true);
+  EXPECT_EQ(sandbox_.Snapshot().monitor.count(old_queue_cfg), 0u);
+  const Json::Value cfg = sandbox_.MonitorCfg("pics");
+  ASSERT_EQ(cfg["config"].size(), 2u);
+  EXPECT_EQ(cfg["config"][1]["path"].asString(), pics + "/a");
+  EXPECT_EQ(StatusMgr().GetShareStatus("pics"), kShareStatusPaused);
+  EXPECT_EQ(StatusMgr().GetShareStatus("photo"), 0u);
+  const std::vector<Json::Value> commands = NewDaemonCommands();
+  ASSERT_EQ(commands.size(), 2u);
+  EXPECT_EQ(JsonToString(commands[0]["data"]), "{\"is_upsert\":false,\"share_name\":\"photo\"}");
+  EXPECT_EQ(JsonToString(commands[1]["data"]), "{\"is_upsert\":true,\"share_name\":\"pics\"}");
+  // One reindex of the share covers its inner folder.
+  const std::vector<Json::Value> events = sandbox_.QueueEvents("pics");
+  ASSERT_EQ(events.size(), 1u);
+  EXPECT_EQ(events[0]["event"].asUInt(), 65536u);
+  EXPECT_EQ(events[0]["path"].asString(), pics);
+}
+
+TEST_F(ShareOpsTest, RenameRefusalsChangeNothing) {
+  ExpectRefused([] { ShareRename("", "pics"); }, kErrorBadArgument, "share_from.empty()");
+  ExpectRefused([] { ShareRename("photo", ""); }, kErrorBadArgument, "share_to.empty()");
+  ExpectRefused([] { ShareRename("photo", "pics"); }, kErrorShareNotFound, "");  // not renamed yet
+  FolderAdd(List({FolderJson("/music")}), false);
+  ExpectRefused([] { ShareRename("photo", "music"); }, kErrorDuplicatedId, "folder_mgr.IsShareIndexed(share_to)");
+}
+
+TEST_F(ShareOpsTest, RenameOfAShareWithoutFoldersCarriesItsStatusOnly) {
+  StatusMgr().SetShareStatus("music", 1);
+  sandbox_.RenameShare("music", "songs");
+  ShareRename("music", "songs");
+  EXPECT_EQ(StatusMgr().GetShareStatus("songs"), 1u);
+  EXPECT_EQ(StatusMgr().GetShareStatus("music"), 0u);
+  EXPECT_TRUE(NewSearchCommands().empty());
+  EXPECT_TRUE(NewDaemonCommands().empty());
+}
+
+TEST_F(ShareOpsTest, MigrateFollowsTheShareToItsNewVolume) {
+  const std::string folders = MgmtSandbox::Read(sandbox_.FoldersFile());
+  const std::string moved = sandbox_.MoveShare("photo", "volume2");
+  ShareMigrate("photo", photo_, moved);
+  EXPECT_THAT(NewSearchCommands(), ElementsAre("index_config_set fileindex_photo",
+                                               "document_del_by_query fileindex_photo prefix=" + photo_ + "/",
+                                               "document_del_by_id fileindex_photo " + photo_));
+  EXPECT_EQ(JsonToString(sandbox_.SearchRequests()[search_before_]["data"]["data"]),
+            "{\"path\":\"" + moved + "/@eaDir/fileindex.db\"}");
+  EXPECT_EQ(MgmtSandbox::Read(sandbox_.FoldersFile()), folders);
+  const SystemSnapshot snapshot = sandbox_.Snapshot();
+  EXPECT_EQ(snapshot.monitor.size(), 1u);  // the old place's configuration is gone
+  EXPECT_EQ(sandbox_.MonitorCfg("photo")["config"][0]["path"].asString(), moved);
+  ASSERT_EQ(NewDaemonCommands().size(), 1u);
+  EXPECT_TRUE(NewDaemonCommands()[0]["data"]["is_upsert"].asBool());
+  ASSERT_EQ(sandbox_.QueueEvents("photo").size(), 1u);
+  EXPECT_EQ(sandbox_.QueueEvents("photo")[0]["path"].asString(), moved);
+
+  ExpectRefused([&] { ShareMigrate("", photo_, moved); }, kErrorBadArgument, "share_name.empty()");
+  ExpectRefused([&] { ShareMigrate("photo", "", moved); }, kErrorBadArgument, "path_from.empty()");
+  ExpectRefused([&] { ShareMigrate("photo", moved, ""); }, kErrorBadArgument, "path_to.empty()");
+  // The share's record does not place it where the request says.
+  ExpectRefused([&] { ShareMigrate("photo", moved, photo_); }, kErrorBadArgument, "share.GetPath() != path_to");
+}
+
+TEST_F(ShareOpsTest, RecycleBinLeavesTheIndexWhenItIsABin) {
+  sandbox_.MakeDir("volume1/photo/#recycle/old");
+  ShareCheckRecycle("photo");
+  EXPECT_THAT(NewSearchCommands(),
+              ElementsAre("document_del_by_query fileindex_photo prefix=" + photo_ + "/#recycle/",
+                          "document_del_by_id fileindex_photo " + photo_ + "/#recycle"));
+  EXPECT_TRUE(sandbox_.QueueEvents("photo").empty());
+  ExpectRefused([] { ShareCheckRecycle(""); }, kErrorBadArgument, "share_name.empty()");
+  ShareCheckRecycle("music");  // nothing indexed there
+  EXPECT_EQ(NewSearchCommands().size(), 2u);
+}
+
+TEST_F(ShareOpsTest, RecycleBinEntersTheIndexWhenSwitchedOff) {
+  sandbox_.MakeDir("volume1/photo/#recycle/old");
+  ScopedTestPlatform platform;
+  platform->recycle_follows_switch = true;
+  ShareCheckRecycle("photo");  // the share's bin is off: its folder is an ordinary one
+  EXPECT_TRUE(NewSearchCommands().empty());
+  const std::vector<Json::Value> events = sandbox_.QueueEvents("photo");
+  ASSERT_EQ(events.size(), 1u);
+  EXPECT_EQ(events[0]["event"].asUInt(), 65536u);
+  EXPECT_EQ(events[0]["path"].asString(), photo_ + "/#recycle");
+
+  sandbox_.SetRecycleBin("photo", true);
+  ShareCheckRecycle("photo");
+  EXPECT_EQ(NewSearchCommands().size(), 2u);
+}
+
+}  // namespace
+}  // namespace fileindex
+}  // namespace corvlumex
