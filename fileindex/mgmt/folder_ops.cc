@@ -11,6 +11,7 @@
 #include "fileindex/index_mgr.h"
 #include "fileindex/mgmt/mgmt_util.h"
 #include "fileindex/related_services.h"
+#include "fileindex/status_mgr.h"
 #include "sdk/share.h"
 
 namespace corvlumex {
@@ -87,6 +88,17 @@ void RestoreMonitorCfg(const FolderMgr& folder_mgr_before, const std::vector<std
   }
 }
 
+// A share that no longer exists may still have an index in the search
+// daemon; it goes too, but its absence is no reason to fail the deletion.
+void DropIndexOfVanishedShare(const std::string& share_name) {
+  try {
+    elastic::ShareIndexDelete(share_name);
+  } catch (const Error& error) {
+    CORV_LOG_FN("Cannot delete the index of the vanished share [%s], code=%d, reason=%s", share_name.c_str(),
+                error.code, error.reason.c_str());
+  }
+}
+
 }  // namespace
 
 void FolderReindex(const Json::Value& path_list) {
@@ -131,7 +143,10 @@ void FolderDelete(const Json::Value& path_list) {
   }
 
   for (const auto& [share_name, share] : plan) {
-    if (!share.exists) continue;
+    if (!share.exists) {
+      if (!share.keeps_folders) DropIndexOfVanishedShare(share_name);
+      continue;
+    }
     try {
       if (!share.keeps_folders) {
         elastic::ShareIndexDelete(share_name);
@@ -144,7 +159,9 @@ void FolderDelete(const Json::Value& path_list) {
     }
   }
   for (const auto& [share_name, share] : plan) {
-    if (share.exists && !share.keeps_folders) CleanShareIndexData(share_name, share.directory);
+    if (share.keeps_folders) continue;
+    if (share.exists) CleanShareIndexData(share_name, share.directory);
+    else if (StatusMgr().GetShareStatus(share_name) != 0) StatusMgr().ClearShareStatus(share_name);
   }
 
   for (const auto& [share_name, share] : plan) {

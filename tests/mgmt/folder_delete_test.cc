@@ -1,5 +1,6 @@
 // Deleting and reindexing folders, and the term suggestions, end to end in
 // a sandbox with fake fileindexd and corvelasticd.
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <filesystem>
@@ -134,6 +135,24 @@ TEST_F(FolderDeleteTest, DocumentsOfAnOuterFolderFollowItsSettings) {
   FolderDelete(List({"/photo/b"}));
   EXPECT_TRUE(sandbox_.QueueEvents("photo").empty());
   EXPECT_THAT(SavedPaths(sandbox_), ElementsAre("/photo"));
+}
+
+TEST_F(FolderDeleteTest, FoldersOfAVanishedShareCanStillBeRemoved) {
+  Add({FolderJson("/photo/a"), FolderJson("/music")});
+  StatusMgr().SetShareStatus("photo", 1);
+  sandbox_.RemoveShare("photo");
+  FolderDelete(List({"/photo/a"}));
+  EXPECT_THAT(SavedPaths(sandbox_), ElementsAre("/music"));
+  EXPECT_EQ(StatusMgr().GetShareStatus("photo"), 0u);
+  EXPECT_THAT(NewSearchCommands(), ElementsAre("index_delete fileindex_photo"));
+  EXPECT_TRUE(NewDaemonCommands().empty());
+  // An index the search daemon no longer knows does not stop the deletion.
+  sandbox_.MakeDir("volume2/music/x");
+  Add({FolderJson("/music/x")});
+  sandbox_.search().Enqueue(testing_support::FakeAnswer::Failure(2010, "No index fileindex_music"));
+  sandbox_.RemoveShare("music");
+  FolderDelete(List({"/music", "/music/x"}));
+  EXPECT_THAT(SavedPaths(sandbox_), ElementsAre());
 }
 
 TEST_F(FolderDeleteTest, RefusalsChangeNothing) {

@@ -1,5 +1,6 @@
 // Listing, reading, adding and changing folders end to end in a sandbox,
 // with fake fileindexd and corvelasticd.
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include "common/json_util.h"
@@ -48,7 +49,9 @@ class FolderUpsertTest : public ::testing::Test {
     LogCapture log;
     const Error error = ErrorOf([&] { FolderUpsert(list, create, false); });
     EXPECT_EQ(error.code, code);
-    if (!reason.empty()) EXPECT_EQ(error.reason, reason);
+    if (!reason.empty()) {
+      EXPECT_EQ(error.reason, reason);
+    }
     if (!condition.empty()) {
       EXPECT_EQ(log.Matching("(FolderUpsert) Failed [" + condition + "], reason: " + reason).size(), 1u)
           << "log: " << ::testing::PrintToString(log.Lines());

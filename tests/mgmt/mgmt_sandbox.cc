@@ -80,6 +80,15 @@ std::string MgmtSandbox::MoveShare(const std::string& name, const std::string& v
   return new_path;
 }
 
+void MgmtSandbox::RemoveShare(const std::string& name) {
+  Json::Value kept(Json::arrayValue);
+  for (const Json::Value& share : shares_) {
+    if (share["name"].asString() != name) kept.append(share);
+  }
+  shares_ = kept;
+  SaveRegistry();
+}
+
 void MgmtSandbox::SetRecycleBin(const std::string& name, bool enabled) {
   (*FindShare(name))["recycle_bin"] = enabled;
   SaveRegistry();

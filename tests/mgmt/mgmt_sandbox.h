@@ -53,6 +53,8 @@ class MgmtSandbox {
   std::string RenameShare(const std::string& from, const std::string& to);
   // Moves the share's directory to another volume and updates the registry.
   std::string MoveShare(const std::string& name, const std::string& volume);
+  // Drops the share from the registry (its directory stays).
+  void RemoveShare(const std::string& name);
   void SetRecycleBin(const std::string& name, bool enabled);
   std::string MakeDir(const std::string& relative) const { return root_.MakeDir(relative); }
 

@@ -1,11 +1,13 @@
 // Pausing and resuming shares and volumes, the home service switch and user
 // renames, end to end in a sandbox.
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <filesystem>
 
 #include "common/json_util.h"
 #include "common/sys.h"
+#include "fileindex/constants.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "tests/mgmt/mgmt_sandbox.h"
@@ -57,7 +59,9 @@ class PauseHomeTest : public ::testing::Test {
     const SystemSnapshot before = sandbox_.Snapshot();
     LogCapture log;
     EXPECT_EQ(ErrorOf(action).code, code);
-    if (!condition.empty()) EXPECT_EQ(log.Matching("Failed [" + condition + "]").size(), 1u);
+    if (!condition.empty()) {
+      EXPECT_EQ(log.Matching("Failed [" + condition + "]").size(), 1u);
+    }
     EXPECT_EQ(sandbox_.Snapshot(), before);
   }
 

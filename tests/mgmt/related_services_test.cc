@@ -1,8 +1,10 @@
 // The neighbours of indexing: services, the notifier's queue configuration,
 // the removal of a share's index data and the setting-changed notice.
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <filesystem>
+#include <fstream>
 
 #include "common/json_util.h"
 #include "fileindex/folder_mgr.h"
@@ -40,7 +42,8 @@ TEST(RelatedServicesTest, EnableStartsEverythingAndSwitchesSpotlightOnlyOnce) {
 
   SetupRelatedServices(false);
   SetupRelatedServices(false);  // already off: no second restart
-  EXPECT_THAT(std::vector<std::string>(sandbox.ServiceRequests().begin() + 5, sandbox.ServiceRequests().end()),
+  const std::vector<std::string> requests = sandbox.ServiceRequests();
+  EXPECT_THAT(std::vector<std::string>(requests.begin() + 5, requests.end()),
               ElementsAre("restart smbd.service", "--no-block stop corvcontentextractd.service",
                           "stop pkg-CorvLumex-fileindexd.service", "--no-block stop corvcontentextractd.service",
                           "stop pkg-CorvLumex-fileindexd.service"));
@@ -63,7 +66,9 @@ TEST(RelatedServicesTest, FailuresAreLoggedAndEveryStepStillRuns) {
   log.Clear();
   SetupRelatedServices(false);  // Spotlight is on: the switch fails, samba is left alone
   EXPECT_EQ(log.Matching("(SetupRelatedServices) CORVSMBSetSpotlight failed: err=[0x0A00").size(), 1u);
-  EXPECT_THAT(std::vector<std::string>(sandbox.ServiceRequests().end() - 2, sandbox.ServiceRequests().end()),
+  const std::vector<std::string> requests = sandbox.ServiceRequests();
+  ASSERT_GE(requests.size(), 2u);
+  EXPECT_THAT(std::vector<std::string>(requests.end() - 2, requests.end()),
               ElementsAre("--no-block stop corvcontentextractd.service", "stop pkg-CorvLumex-fileindexd.service"));
 }
 

@@ -1,5 +1,6 @@
 // Following a renamed share, a share moved to another volume, and a recycle
 // bin switched on or off, end to end in a sandbox.
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <filesystem>
@@ -51,7 +52,9 @@ class ShareOpsTest : public ::testing::Test {
     const SystemSnapshot before = sandbox_.Snapshot();
     LogCapture log;
     EXPECT_EQ(ErrorOf(action).code, code);
-    if (!condition.empty()) EXPECT_EQ(log.Matching("Failed [" + condition + "]").size(), 1u);
+    if (!condition.empty()) {
+      EXPECT_EQ(log.Matching("Failed [" + condition + "]").size(), 1u);
+    }
     EXPECT_EQ(sandbox_.Snapshot(), before);
   }
 
