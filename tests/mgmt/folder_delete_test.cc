@@ -1,15 +1,12 @@
 // Deleting and reindexing folders, and the term suggestions, end to end in
 // a sandbox with fake fileindexd and corvelasticd.
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
-
 #include <filesystem>
 #include <fstream>
 
 #include "common/json_util.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/status_mgr.h"
-#include "tests/mgmt/mgmt_sandbox.h"
+#include "tests/mgmt/mgmt_test_base.h"
 #include "tests/mgmt/test_platform.h"
 
 namespace corvlumex {
@@ -18,16 +15,11 @@ namespace {
 
 using testing_support::ErrorOf;
 using testing_support::FolderJson;
+using testing_support::JsonList;
 using testing_support::LogCapture;
 using testing_support::MgmtSandbox;
 using testing_support::ScopedTestPlatform;
 using ::testing::ElementsAre;
-
-Json::Value List(const std::vector<Json::Value>& items) {
-  Json::Value list(Json::arrayValue);
-  for (const Json::Value& item : items) list.append(item);
-  return list;
-}
 
 std::vector<std::string> SavedPaths(const MgmtSandbox& sandbox) {
   Json::Value saved;
@@ -37,43 +29,20 @@ std::vector<std::string> SavedPaths(const MgmtSandbox& sandbox) {
   return paths;
 }
 
-class FolderDeleteTest : public ::testing::Test {
+class FolderDeleteTest : public testing_support::MgmtTest {
  protected:
   void SetUp() override {
     photo_ = sandbox_.AddShare("photo");
     music_ = sandbox_.AddShare("music", "volume2");
     for (const char* dir : {"volume1/photo/a/x", "volume1/photo/b"}) sandbox_.MakeDir(dir);
   }
-
-  // Adds folders and forgets what the addition sent, so that each test sees
-  // only what its own operation does.
   void Add(const std::vector<Json::Value>& folders) {
-    FolderAdd(List(folders), false);
-    search_before_ = sandbox_.SearchRequests().size();
-    daemon_before_ = sandbox_.DaemonCommands().size();
-    services_before_ = sandbox_.ServiceRequests().size();
-    std::filesystem::remove(photo_ + "/@eaDir/fileindex.queue");
-    std::filesystem::remove(music_ + "/@eaDir/fileindex.queue");
-  }
-  std::vector<std::string> NewSearchCommands() const {
-    const std::vector<std::string> all = sandbox_.SearchCommands();
-    return std::vector<std::string>(all.begin() + search_before_, all.end());
-  }
-  std::vector<Json::Value> NewDaemonCommands() const {
-    const std::vector<Json::Value> all = sandbox_.DaemonCommands();
-    return std::vector<Json::Value>(all.begin() + daemon_before_, all.end());
-  }
-  std::vector<std::string> NewServiceRequests() const {
-    const std::vector<std::string> all = sandbox_.ServiceRequests();
-    return std::vector<std::string>(all.begin() + services_before_, all.end());
+    FolderAdd(JsonList(folders), false);
+    Mark({"photo", "music"});
   }
 
-  MgmtSandbox sandbox_;
   std::string photo_;
   std::string music_;
-  size_t search_before_ = 0;
-  size_t daemon_before_ = 0;
-  size_t services_before_ = 0;
 };
 
 TEST_F(FolderDeleteTest, LastFolderOfAShareTakesItsIndexAndDataAlong) {
@@ -82,7 +51,7 @@ TEST_F(FolderDeleteTest, LastFolderOfAShareTakesItsIndexAndDataAlong) {
   std::ofstream(photo_ + "/@eaDir/fileindex.queue") << "{\"event\":2,\"path\":\"" << photo_ << "/a/f\"}\n";
   StatusMgr().SetShareStatus("photo", 1);
 
-  FolderDelete(List({"/photo/a"}));
+  FolderDelete(JsonList({"/photo/a"}));
   EXPECT_THAT(SavedPaths(sandbox_), ElementsAre("/music"));
   EXPECT_THAT(NewSearchCommands(), ElementsAre("index_delete fileindex_photo"));
   EXPECT_TRUE(sandbox_.MonitorCfg("photo").isNull());
@@ -95,7 +64,7 @@ TEST_F(FolderDeleteTest, LastFolderOfAShareTakesItsIndexAndDataAlong) {
   EXPECT_EQ(JsonToString(commands[0]["data"]), "{\"is_upsert\":false,\"share_name\":\"photo\"}");
   EXPECT_TRUE(NewServiceRequests().empty());  // music is still indexed
 
-  FolderDelete(List({"/music"}));
+  FolderDelete(JsonList({"/music"}));
   EXPECT_THAT(SavedPaths(sandbox_), ElementsAre());
   EXPECT_THAT(NewServiceRequests(), ElementsAre("restart smbd.service", "--no-block stop corvcontentextractd.service",
                                                 "stop pkg-CorvLumex-fileindexd.service"));
@@ -103,7 +72,7 @@ TEST_F(FolderDeleteTest, LastFolderOfAShareTakesItsIndexAndDataAlong) {
 
 TEST_F(FolderDeleteTest, OrphanedDocumentsLeaveAndInnerFoldersAreRebuilt) {
   Add({FolderJson("/photo/a"), FolderJson("/photo/a/x"), FolderJson("/photo/b")});
-  FolderDelete(List({"/photo/a"}));
+  FolderDelete(JsonList({"/photo/a"}));
   EXPECT_THAT(SavedPaths(sandbox_), ElementsAre("/photo/a/x", "/photo/b"));
   EXPECT_THAT(NewSearchCommands(),
               ElementsAre("document_del_by_query fileindex_photo prefix=" + photo_ + "/a/",
@@ -122,7 +91,7 @@ TEST_F(FolderDeleteTest, OrphanedDocumentsLeaveAndInnerFoldersAreRebuilt) {
 
 TEST_F(FolderDeleteTest, DocumentsOfAnOuterFolderFollowItsSettings) {
   Add({FolderJson("/photo"), FolderJson("/photo/a", true, false, false, false)});
-  FolderDelete(List({"/photo/a"}));
+  FolderDelete(JsonList({"/photo/a"}));
   EXPECT_TRUE(NewSearchCommands().empty());
   const std::vector<Json::Value> events = sandbox_.QueueEvents("photo");
   ASSERT_EQ(events.size(), 1u);
@@ -132,7 +101,7 @@ TEST_F(FolderDeleteTest, DocumentsOfAnOuterFolderFollowItsSettings) {
 
   // The same settings inside and outside: nothing to redo.
   Add({FolderJson("/photo/b")});
-  FolderDelete(List({"/photo/b"}));
+  FolderDelete(JsonList({"/photo/b"}));
   EXPECT_TRUE(sandbox_.QueueEvents("photo").empty());
   EXPECT_THAT(SavedPaths(sandbox_), ElementsAre("/photo"));
 }
@@ -141,7 +110,7 @@ TEST_F(FolderDeleteTest, FoldersOfAVanishedShareCanStillBeRemoved) {
   Add({FolderJson("/photo/a"), FolderJson("/music")});
   StatusMgr().SetShareStatus("photo", 1);
   sandbox_.RemoveShare("photo");
-  FolderDelete(List({"/photo/a"}));
+  FolderDelete(JsonList({"/photo/a"}));
   EXPECT_THAT(SavedPaths(sandbox_), ElementsAre("/music"));
   EXPECT_EQ(StatusMgr().GetShareStatus("photo"), 0u);
   EXPECT_THAT(NewSearchCommands(), ElementsAre("index_delete fileindex_photo"));
@@ -151,7 +120,7 @@ TEST_F(FolderDeleteTest, FoldersOfAVanishedShareCanStillBeRemoved) {
   Add({FolderJson("/music/x")});
   sandbox_.search().Enqueue(testing_support::FakeAnswer::Failure(2010, "No index fileindex_music"));
   sandbox_.RemoveShare("music");
-  FolderDelete(List({"/music", "/music/x"}));
+  FolderDelete(JsonList({"/music", "/music/x"}));
   EXPECT_THAT(SavedPaths(sandbox_), ElementsAre());
 }
 
@@ -161,10 +130,10 @@ TEST_F(FolderDeleteTest, RefusalsChangeNothing) {
   LogCapture log;
   EXPECT_EQ(ErrorOf([] { FolderDelete(Json::Value("/photo/a")); }).code, kErrorBadArgument);
   EXPECT_EQ(log.Matching("Failed [!path_list.isArray()], reason: \"/photo/a\"").size(), 1u);
-  EXPECT_EQ(ErrorOf([] { FolderDelete(List({"/photo/a", ""})); }).code, kErrorBadArgument);
-  EXPECT_EQ(ErrorOf([] { FolderDelete(List({"/photo/a", 7})); }).code, kErrorBadArgument);
-  EXPECT_EQ(ErrorOf([] { FolderDelete(List({"/photo/a", "/photo/zzz"})); }).code, kErrorFolderNotFound);
-  EXPECT_EQ(ErrorOf([] { FolderReindex(List({"/music", "/photo/zzz"})); }).code, kErrorFolderNotFound);
+  EXPECT_EQ(ErrorOf([] { FolderDelete(JsonList({"/photo/a", ""})); }).code, kErrorBadArgument);
+  EXPECT_EQ(ErrorOf([] { FolderDelete(JsonList({"/photo/a", 7})); }).code, kErrorBadArgument);
+  EXPECT_EQ(ErrorOf([] { FolderDelete(JsonList({"/photo/a", "/photo/zzz"})); }).code, kErrorFolderNotFound);
+  EXPECT_EQ(ErrorOf([] { FolderReindex(JsonList({"/music", "/photo/zzz"})); }).code, kErrorFolderNotFound);
   EXPECT_EQ(ErrorOf([] { FolderReindex(Json::Value(Json::objectValue)); }).code, kErrorBadArgument);
   EXPECT_EQ(sandbox_.Snapshot(), before);
 }
@@ -174,13 +143,13 @@ TEST_F(FolderDeleteTest, MonitorFailureRestoresTheFolderFile) {
   const testing_support::SystemSnapshot before = sandbox_.Snapshot();
   ScopedTestPlatform platform;
   platform->fail_monitor = true;
-  EXPECT_EQ(ErrorOf([] { FolderDelete(List({"/photo/a", "/music"})); }).code, kErrorSystem);
+  EXPECT_EQ(ErrorOf([] { FolderDelete(JsonList({"/photo/a", "/music"})); }).code, kErrorSystem);
   EXPECT_EQ(sandbox_.Snapshot(), before);
 }
 
 TEST_F(FolderDeleteTest, ReindexQueuesOneEventPerFolder) {
   Add({FolderJson("/photo/a"), FolderJson("/photo/b"), FolderJson("/music")});
-  FolderReindex(List({"/photo/b", Json::Value(FolderJson("/music")), "/photo/a", "/photo/b"}));
+  FolderReindex(JsonList({"/photo/b", Json::Value(FolderJson("/music")), "/photo/a", "/photo/b"}));
   const std::vector<Json::Value> photo = sandbox_.QueueEvents("photo");
   ASSERT_EQ(photo.size(), 2u);
   EXPECT_EQ(JsonToString(photo[0]),
@@ -195,11 +164,11 @@ TEST_F(FolderDeleteTest, TermSuggestionsOfEveryIndexedShare) {
   Add({FolderJson("/photo/a"), FolderJson("/music")});
   UpdateTermSuggestion();
   const std::vector<Json::Value> requests = sandbox_.SearchRequests();
-  ASSERT_EQ(requests.size(), search_before_ + 2);
-  EXPECT_EQ(JsonToString(requests[search_before_]["compound"]),
+  ASSERT_EQ(NewSearchCommands().size(), 2u);
+  EXPECT_EQ(JsonToString(requests[requests.size() - 2]["compound"]),
             "[{\"command\":\"update_term_suggestion\",\"data\":{\"db_name\":\"fileindex_music\","
             "\"doc_id_field\":\"CORVMDSearchFileName\"}}]");
-  EXPECT_EQ(requests[search_before_ + 1]["compound"][0]["data"]["db_name"].asString(), "fileindex_photo");
+  EXPECT_EQ(requests[requests.size() - 1]["compound"][0]["data"]["db_name"].asString(), "fileindex_photo");
 }
 
 }  // namespace

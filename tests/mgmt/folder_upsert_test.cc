@@ -1,11 +1,8 @@
 // Listing, reading, adding and changing folders end to end in a sandbox,
 // with fake fileindexd and corvelasticd.
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
-
 #include "common/json_util.h"
 #include "fileindex/index_mgr.h"
-#include "tests/mgmt/mgmt_sandbox.h"
+#include "tests/mgmt/mgmt_test_base.h"
 #include "tests/mgmt/test_platform.h"
 
 namespace corvlumex {
@@ -14,17 +11,12 @@ namespace {
 
 using testing_support::ErrorOf;
 using testing_support::FolderJson;
+using testing_support::JsonList;
 using testing_support::LogCapture;
 using testing_support::MgmtSandbox;
 using testing_support::ScopedTestPlatform;
 using testing_support::ShareFlags;
 using ::testing::ElementsAre;
-
-Json::Value List(const std::vector<Json::Value>& folders) {
-  Json::Value list(Json::arrayValue);
-  for (const Json::Value& folder : folders) list.append(folder);
-  return list;
-}
 
 std::string Kinds(const Json::Value& data) {
   std::string text;
@@ -32,7 +24,7 @@ std::string Kinds(const Json::Value& data) {
   return text;
 }
 
-class FolderUpsertTest : public ::testing::Test {
+class FolderUpsertTest : public testing_support::MgmtTest {
  protected:
   void SetUp() override {
     photo_ = sandbox_.AddShare("photo");
@@ -41,31 +33,17 @@ class FolderUpsertTest : public ::testing::Test {
     sandbox_.MakeDir("volume1/photo/a");
     sandbox_.MakeDir("volume1/photo/b");
   }
-
-  // A refused request changes nothing anywhere, and says why.
-  void ExpectRefused(const Json::Value& list, bool create, ErrorCode code, const std::string& reason,
-                     const std::string& condition) {
-    const testing_support::SystemSnapshot before = sandbox_.Snapshot();
-    LogCapture log;
-    const Error error = ErrorOf([&] { FolderUpsert(list, create, false); });
-    EXPECT_EQ(error.code, code);
-    if (!reason.empty()) {
-      EXPECT_EQ(error.reason, reason);
-    }
-    if (!condition.empty()) {
-      EXPECT_EQ(log.Matching("(FolderUpsert) Failed [" + condition + "], reason: " + reason).size(), 1u)
-          << "log: " << ::testing::PrintToString(log.Lines());
-    }
-    EXPECT_EQ(sandbox_.Snapshot(), before);
+  void ExpectUpsertRefused(const Json::Value& list, bool create, ErrorCode code, const std::string& reason,
+                           const std::string& condition) {
+    ExpectRefused([&] { FolderUpsert(list, create, false); }, code, condition, reason);
   }
 
-  MgmtSandbox sandbox_;
   std::string photo_;
   std::string music_;
 };
 
 TEST_F(FolderUpsertTest, AddPreparesIndexMonitorDaemonAndReindex) {
-  FolderAdd(List({FolderJson("/photo/a"), FolderJson("/music", true, true, false, false), FolderJson("/photo/b")}),
+  FolderAdd(JsonList({FolderJson("/photo/a"), FolderJson("/music", true, true, false, false), FolderJson("/photo/b")}),
             false);
 
   // Touched shares in name order, one index each, created once.
@@ -102,14 +80,14 @@ TEST_F(FolderUpsertTest, AddPreparesIndexMonitorDaemonAndReindex) {
 
   // A second folder of an indexed share does not create its index again.
   sandbox_.MakeDir("volume1/photo/c");
-  FolderAdd(List({FolderJson("/photo/c")}), false);
+  FolderAdd(JsonList({FolderJson("/photo/c")}), false);
   EXPECT_EQ(sandbox_.SearchRequests().size(), 2u);
 }
 
 TEST_F(FolderUpsertTest, SetReindexesOnlyTheKindsThatChanged) {
-  FolderAdd(List({FolderJson("/photo/a")}), false);
+  FolderAdd(JsonList({FolderJson("/photo/a")}), false);
   const size_t requests = sandbox_.SearchRequests().size();
-  FolderSet(List({FolderJson("/photo/a", false, true, true, false)}), false);
+  FolderSet(JsonList({FolderJson("/photo/a", false, true, true, false)}), false);
   EXPECT_EQ(sandbox_.SearchRequests().size(), requests);  // no index created for a change
   const std::vector<Json::Value> events = sandbox_.QueueEvents("photo");
   ASSERT_EQ(events.size(), 2u);
@@ -119,35 +97,40 @@ TEST_F(FolderUpsertTest, SetReindexesOnlyTheKindsThatChanged) {
   // A new folder inside an indexed one, set rather than added: only what differs
   // from the folder that governed it.
   sandbox_.MakeDir("volume1/photo/a/x");
-  FolderSet(List({FolderJson("/photo/a/x", false, true, false, false)}), false);
+  FolderSet(JsonList({FolderJson("/photo/a/x", false, true, false, false)}), false);
   EXPECT_EQ(Kinds(sandbox_.QueueEvents("photo")[2]["data"]), "0010");
 }
 
 TEST_F(FolderUpsertTest, RefusalsChangeNothing) {
-  FolderAdd(List({FolderJson("/photo/a")}), false);
-  ExpectRefused(Json::Value(Json::objectValue), true, kErrorBadArgument, "{}", "!folder_list.isArray()");
-  ExpectRefused(List({FolderJson("/photo/b"), FolderJson("/ro")}), true, kErrorPathCannotIndex,
+  FolderAdd(JsonList({FolderJson("/photo/a")}), false);
+  ExpectUpsertRefused(Json::Value(Json::objectValue), true, kErrorBadArgument, "{}", "!folder_list.isArray()");
+  {
+    LogCapture log;  // failures are logged under the operation's own name
+    EXPECT_EQ(ErrorOf([] { FolderSet(Json::Value(Json::objectValue), false); }).code, kErrorBadArgument);
+    EXPECT_EQ(log.Matching("(FolderUpsert) Failed [!folder_list.isArray()], reason: {}").size(), 1u);
+  }
+  ExpectUpsertRefused(JsonList({FolderJson("/photo/b"), FolderJson("/ro")}), true, kErrorPathCannotIndex,
                 "Path cannot index: /ro", "!CanPathBeIndexed(folder_new->GetPath()) && !updater_mode");
-  ExpectRefused(List({FolderJson("/photo/b"), FolderJson("/photo/a")}), true, kErrorDuplicatedId,
+  ExpectUpsertRefused(JsonList({FolderJson("/photo/b"), FolderJson("/photo/a")}), true, kErrorDuplicatedId,
                 "Duplicated ID: /photo/a", "create && folder_mgr.HasFolder(folder_new->GetPath())");
-  ExpectRefused(List({FolderJson("/photo/b"), FolderJson("/photo/b")}), true, kErrorDuplicatedId,
+  ExpectUpsertRefused(JsonList({FolderJson("/photo/b"), FolderJson("/photo/b")}), true, kErrorDuplicatedId,
                 "Duplicated ID: /photo/b", "create && folder_mgr.HasFolder(folder_new->GetPath())");
   // A malformed element, and a share that does not exist.
   Json::Value no_name = FolderJson("/photo/b");
   no_name.removeMember("name");
-  ExpectRefused(List({FolderJson("/photo/b"), FolderJson("/nosuch")}), false, kErrorShareNotFound, "", "");
-  ExpectRefused(List({no_name}), false, kErrorBadArgument, "", "");
+  ExpectUpsertRefused(JsonList({FolderJson("/photo/b"), FolderJson("/nosuch")}), false, kErrorShareNotFound, "", "");
+  ExpectUpsertRefused(JsonList({no_name}), false, kErrorBadArgument, "", "");
 }
 
 TEST_F(FolderUpsertTest, FullVolumeRefusesTheRequest) {
   ScopedTestPlatform platform;
   platform->no_space = true;
-  ExpectRefused(List({FolderJson("/photo/a")}), true, kErrorNoSpace, "Share (photo) space not enough",
+  ExpectUpsertRefused(JsonList({FolderJson("/photo/a")}), true, kErrorNoSpace, "Share (photo) space not enough",
                 "!share.IsSpaceEnough()");
 }
 
 TEST_F(FolderUpsertTest, UpdaterModeStoresRefusedPathsWithoutReindex) {
-  FolderAdd(List({FolderJson("/ro")}), true);
+  FolderAdd(JsonList({FolderJson("/ro")}), true);
   Json::Value saved;
   ASSERT_TRUE(JsonFromFile(saved, sandbox_.FoldersFile()));
   ASSERT_EQ(saved.size(), 1u);
@@ -166,7 +149,7 @@ TEST_F(FolderUpsertTest, EmptyListStartsServicesAndSavesTheSameList) {
 }
 
 TEST_F(FolderUpsertTest, ListAndGet) {
-  FolderAdd(List({FolderJson("/photo/b"), FolderJson("/music"), FolderJson("/photo/a")}), false);
+  FolderAdd(JsonList({FolderJson("/photo/b"), FolderJson("/music"), FolderJson("/photo/a")}), false);
   Json::Value out;
   FolderList(out, 1, 1, "path", "ASC", Json::Value(Json::arrayValue));
   EXPECT_EQ(out["total"].asUInt(), 3u);

@@ -100,6 +100,13 @@ std::string MgmtSandbox::FoldersFile() const { return root_.path() + "/var/packa
 
 std::string MgmtSandbox::StatusFile() const { return root_.path() + "/var/packages/CorvLumex/etc/fileindex.status"; }
 
+bool MgmtSandbox::HasShare(const std::string& name) const {
+  for (const Json::Value& entry : shares_) {
+    if (entry["name"].asString() == name) return true;
+  }
+  return false;
+}
+
 std::string MgmtSandbox::QueueFile(const std::string& share) const {
   for (const Json::Value& entry : shares_) {
     if (entry["name"].asString() == share) return entry["path"].asString() + "/@eaDir/fileindex.queue";

@@ -60,6 +60,7 @@ class MgmtSandbox {
 
   std::string FoldersFile() const;
   std::string StatusFile() const;
+  bool HasShare(const std::string& name) const;
   std::string QueueFile(const std::string& share) const;  // of a registered share
   // The monitor configuration of a share, parsed; null when there is none.
   Json::Value MonitorCfg(const std::string& share) const;

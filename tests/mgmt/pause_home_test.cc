@@ -1,8 +1,5 @@
 // Pausing and resuming shares and volumes, the home service switch and user
 // renames, end to end in a sandbox.
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
-
 #include <filesystem>
 
 #include "common/json_util.h"
@@ -10,26 +7,20 @@
 #include "fileindex/constants.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/status_mgr.h"
-#include "tests/mgmt/mgmt_sandbox.h"
+#include "tests/mgmt/mgmt_test_base.h"
 
 namespace corvlumex {
 namespace fileindex {
 namespace {
 
-using testing_support::ErrorOf;
 using testing_support::FolderJson;
+using testing_support::JsonList;
 using testing_support::LogCapture;
 using testing_support::MgmtSandbox;
 using testing_support::SystemSnapshot;
 using ::testing::ElementsAre;
 
-Json::Value List(const std::vector<Json::Value>& items) {
-  Json::Value list(Json::arrayValue);
-  for (const Json::Value& item : items) list.append(item);
-  return list;
-}
-
-class PauseHomeTest : public ::testing::Test {
+class PauseHomeTest : public testing_support::MgmtTest {
  protected:
   void SetUp() override {
     photo_ = sandbox_.AddShare("photo");
@@ -37,39 +28,12 @@ class PauseHomeTest : public ::testing::Test {
     sandbox_.AddShare("music", "volume2");
     homes_ = sandbox_.AddShare("homes");
     for (const char* dir : {"volume1/homes/alice/docs", "volume1/homes/bob"}) sandbox_.MakeDir(dir);
-    FolderAdd(List({FolderJson("/photo"), FolderJson("/music"), FolderJson("/homes/alice/docs")}), false);
-    for (const char* share : {"photo", "music", "homes"}) std::filesystem::remove(sandbox_.QueueFile(share));
-    daemon_before_ = sandbox_.DaemonCommands().size();
-    search_before_ = sandbox_.SearchRequests().size();
-  }
-  // "<type> <share>" of each command fileindexd received since SetUp.
-  std::vector<std::string> NewDaemonCommands() const {
-    std::vector<std::string> out;
-    const std::vector<Json::Value> all = sandbox_.DaemonCommands();
-    for (size_t i = daemon_before_; i < all.size(); ++i) {
-      out.push_back(all[i]["type"].asString() + " " + all[i]["data"]["share_name"].asString());
-    }
-    return out;
-  }
-  std::vector<std::string> NewSearchCommands() const {
-    const std::vector<std::string> all = sandbox_.SearchCommands();
-    return std::vector<std::string>(all.begin() + search_before_, all.end());
-  }
-  void ExpectRefused(const std::function<void()>& action, ErrorCode code, const std::string& condition) {
-    const SystemSnapshot before = sandbox_.Snapshot();
-    LogCapture log;
-    EXPECT_EQ(ErrorOf(action).code, code);
-    if (!condition.empty()) {
-      EXPECT_EQ(log.Matching("Failed [" + condition + "]").size(), 1u);
-    }
-    EXPECT_EQ(sandbox_.Snapshot(), before);
+    FolderAdd(JsonList({FolderJson("/photo"), FolderJson("/music"), FolderJson("/homes/alice/docs")}), false);
+    Mark({"photo", "music", "homes"});
   }
 
-  MgmtSandbox sandbox_;
   std::string photo_;
   std::string homes_;
-  size_t daemon_before_ = 0;
-  size_t search_before_ = 0;
 };
 
 TEST_F(PauseHomeTest, SharePauseAndResumeTellTheDaemonOncePerChange) {
@@ -78,16 +42,16 @@ TEST_F(PauseHomeTest, SharePauseAndResumeTellTheDaemonOncePerChange) {
   SharePause("video");  // not indexed: recorded, the daemon has no worker to stop
   EXPECT_EQ(StatusMgr().GetShareStatus("photo"), kShareStatusPaused);
   EXPECT_EQ(StatusMgr().GetShareStatus("video"), kShareStatusPaused);
-  EXPECT_THAT(NewDaemonCommands(), ElementsAre("worker_delete photo"));
+  EXPECT_THAT(NewDaemonSummaries(), ElementsAre("worker_delete photo"));
 
   ShareResume("photo");
   ShareResume("photo");
   EXPECT_EQ(StatusMgr().GetShareStatus("photo"), 0u);
-  EXPECT_THAT(NewDaemonCommands(), ElementsAre("worker_delete photo", "worker_create photo"));
+  EXPECT_THAT(NewDaemonSummaries(), ElementsAre("worker_delete photo", "worker_create photo"));
 
   ShareClearPaused("video");
   EXPECT_EQ(StatusMgr().GetShareStatus("video"), 0u);
-  EXPECT_EQ(NewDaemonCommands().size(), 2u);
+  EXPECT_EQ(NewDaemonSummaries().size(), 2u);
 }
 
 TEST_F(PauseHomeTest, VolumeAndSharePausesAddUp) {
@@ -96,18 +60,18 @@ TEST_F(PauseHomeTest, VolumeAndSharePausesAddUp) {
   EXPECT_EQ(StatusMgr().GetShareStatus("photo"), kShareStatusPaused | kShareStatusVolumePaused);
   EXPECT_EQ(StatusMgr().GetShareStatus("homes"), kShareStatusVolumePaused);
   EXPECT_EQ(StatusMgr().GetShareStatus("music"), 0u);  // on the other volume
-  EXPECT_THAT(NewDaemonCommands(), ElementsAre("worker_delete photo", "worker_delete homes"));
+  EXPECT_THAT(NewDaemonSummaries(), ElementsAre("worker_delete photo", "worker_delete homes"));
 
   ShareResume("photo");  // the volume still holds it
-  EXPECT_EQ(NewDaemonCommands().size(), 2u);
+  EXPECT_EQ(NewDaemonSummaries().size(), 2u);
   VolumeResume(sandbox_.Volume("volume1"));
-  EXPECT_THAT(NewDaemonCommands(), ElementsAre("worker_delete photo", "worker_delete homes", "worker_create homes",
+  EXPECT_THAT(NewDaemonSummaries(), ElementsAre("worker_delete photo", "worker_delete homes", "worker_create homes",
                                                "worker_create photo"));
 
   VolumePause(sandbox_.Volume("volume2"));
   VolumeClearPaused(sandbox_.Volume("volume2"));
   EXPECT_EQ(StatusMgr().GetShareStatus("music"), 0u);
-  EXPECT_EQ(NewDaemonCommands().back(), "worker_delete music");
+  EXPECT_EQ(NewDaemonSummaries().back(), "worker_delete music");
 }
 
 TEST_F(PauseHomeTest, PauseRefusalsAndUnreachableDaemonChangeNothing) {
@@ -133,13 +97,13 @@ TEST_F(PauseHomeTest, HomeServiceSwitchSuspendsAndRestoresTheHomes) {
   HomeDisable();
   EXPECT_TRUE(sandbox_.MonitorCfg("homes").isNull());
   EXPECT_EQ(StatusMgr().GetShareStatus("homes"), kShareStatusHomeDisabled);
-  EXPECT_THAT(NewDaemonCommands(), ElementsAre("worker_delete homes"));
+  EXPECT_THAT(NewDaemonSummaries(), ElementsAre("worker_delete homes"));
   EXPECT_NE(MgmtSandbox::Read(sandbox_.FoldersFile()).find("/homes/alice/docs"), std::string::npos);
 
   HomeEnable();
   EXPECT_EQ(JsonToString(sandbox_.MonitorCfg("homes")), JsonToString(cfg));
   EXPECT_EQ(StatusMgr().GetShareStatus("homes"), 0u);
-  EXPECT_THAT(NewDaemonCommands(), ElementsAre("worker_delete homes", "worker_create homes"));
+  EXPECT_THAT(NewDaemonSummaries(), ElementsAre("worker_delete homes", "worker_create homes"));
   const std::vector<Json::Value> events = sandbox_.QueueEvents("homes");
   ASSERT_EQ(events.size(), 1u);
   EXPECT_EQ(events[0]["event"].asUInt(), 65536u);
@@ -160,7 +124,7 @@ TEST_F(PauseHomeTest, UserRenameMovesTheUsersFolders) {
   EXPECT_THAT(NewSearchCommands(),
               ElementsAre("document_del_by_query fileindex_homes prefix=" + homes_ + "/alice/docs/",
                           "document_del_by_id fileindex_homes " + homes_ + "/alice/docs"));
-  EXPECT_THAT(NewDaemonCommands(), ElementsAre("notify_setting_changed homes"));
+  EXPECT_THAT(NewDaemonSummaries(), ElementsAre("notify_setting_changed homes"));
   const std::vector<Json::Value> events = sandbox_.QueueEvents("homes");
   ASSERT_EQ(events.size(), 1u);
   EXPECT_EQ(events[0]["path"].asString(), homes_ + "/carol/docs");
@@ -175,7 +139,7 @@ TEST_F(PauseHomeTest, UserRenameRefusalsChangeNothing) {
   ExpectRefused([] { UserRename("", "carol"); }, kErrorBadArgument, "user_from.empty()");
   ExpectRefused([] { UserRename("alice", ""); }, kErrorBadArgument, "user_to.empty()");
   sandbox_.MakeDir("volume1/homes/bob/docs");
-  FolderAdd(List({FolderJson("/homes/bob/docs")}), false);
+  FolderAdd(JsonList({FolderJson("/homes/bob/docs")}), false);
   ExpectRefused([] { UserRename("alice", "bob"); }, kErrorDuplicatedId, "folder_mgr.HasFolder(renamed->GetPath())");
 }
 

@@ -1,67 +1,35 @@
 // Following a renamed share, a share moved to another volume, and a recycle
 // bin switched on or off, end to end in a sandbox.
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
-
 #include <filesystem>
 
 #include "common/json_util.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/status_mgr.h"
-#include "tests/mgmt/mgmt_sandbox.h"
+#include "tests/mgmt/mgmt_test_base.h"
 #include "tests/mgmt/test_platform.h"
 
 namespace corvlumex {
 namespace fileindex {
 namespace {
 
-using testing_support::ErrorOf;
 using testing_support::FolderJson;
-using testing_support::LogCapture;
+using testing_support::JsonList;
 using testing_support::MgmtSandbox;
 using testing_support::ScopedTestPlatform;
 using testing_support::SystemSnapshot;
 using ::testing::ElementsAre;
 
-Json::Value List(const std::vector<Json::Value>& items) {
-  Json::Value list(Json::arrayValue);
-  for (const Json::Value& item : items) list.append(item);
-  return list;
-}
-
-class ShareOpsTest : public ::testing::Test {
+class ShareOpsTest : public testing_support::MgmtTest {
  protected:
   void SetUp() override {
     photo_ = sandbox_.AddShare("photo");
     sandbox_.AddShare("music", "volume2");
     sandbox_.MakeDir("volume1/photo/a");
-    FolderAdd(List({FolderJson("/photo"), FolderJson("/photo/a", true, false, false, false)}), false);
-    std::filesystem::remove(photo_ + "/@eaDir/fileindex.queue");
-    search_before_ = sandbox_.SearchRequests().size();
-    daemon_before_ = sandbox_.DaemonCommands().size();
-  }
-  std::vector<std::string> NewSearchCommands() const {
-    const std::vector<std::string> all = sandbox_.SearchCommands();
-    return std::vector<std::string>(all.begin() + search_before_, all.end());
-  }
-  std::vector<Json::Value> NewDaemonCommands() const {
-    const std::vector<Json::Value> all = sandbox_.DaemonCommands();
-    return std::vector<Json::Value>(all.begin() + daemon_before_, all.end());
-  }
-  void ExpectRefused(const std::function<void()>& action, ErrorCode code, const std::string& condition) {
-    const SystemSnapshot before = sandbox_.Snapshot();
-    LogCapture log;
-    EXPECT_EQ(ErrorOf(action).code, code);
-    if (!condition.empty()) {
-      EXPECT_EQ(log.Matching("Failed [" + condition + "]").size(), 1u);
-    }
-    EXPECT_EQ(sandbox_.Snapshot(), before);
+    FolderAdd(JsonList({FolderJson("/photo"), FolderJson("/photo/a", true, false, false, false)}), false);
+    Mark({"photo"});
   }
 
-  MgmtSandbox sandbox_;
   std::string photo_;
-  size_t search_before_ = 0;
-  size_t daemon_before_ = 0;
 };
 
 TEST_F(ShareOpsTest, RenameMovesFoldersIndexMonitorAndStatus) {
@@ -74,7 +42,7 @@ TEST_F(ShareOpsTest, RenameMovesFoldersIndexMonitorAndStatus) {
   EXPECT_THAT(NewSearchCommands(), ElementsAre("index_config_set fileindex_photo",
                                                "document_del_by_query fileindex_pics prefix=" + photo_ + "/",
                                                "document_del_by_id fileindex_pics " + photo_));
-  EXPECT_EQ(JsonToString(requests[search_before_]["data"]["data"]),
+  EXPECT_EQ(JsonToString(requests[requests.size() - 3]["data"]["data"]),
             "{\"id\":\"fileindex_pics\",\"path\":\"" + pics + "/@eaDir/fileindex.db\"}");
   Json::Value saved;
   ASSERT_TRUE(JsonFromFile(saved, sandbox_.FoldersFile()));
@@ -102,7 +70,7 @@ TEST_F(ShareOpsTest, RenameRefusalsChangeNothing) {
   ExpectRefused([] { ShareRename("", "pics"); }, kErrorBadArgument, "share_from.empty()");
   ExpectRefused([] { ShareRename("photo", ""); }, kErrorBadArgument, "share_to.empty()");
   ExpectRefused([] { ShareRename("photo", "pics"); }, kErrorShareNotFound, "");  // not renamed yet
-  FolderAdd(List({FolderJson("/music")}), false);
+  FolderAdd(JsonList({FolderJson("/music")}), false);
   ExpectRefused([] { ShareRename("photo", "music"); }, kErrorDuplicatedId, "folder_mgr.IsShareIndexed(share_to)");
 }
 
@@ -123,7 +91,7 @@ TEST_F(ShareOpsTest, MigrateFollowsTheShareToItsNewVolume) {
   EXPECT_THAT(NewSearchCommands(), ElementsAre("index_config_set fileindex_photo",
                                                "document_del_by_query fileindex_photo prefix=" + photo_ + "/",
                                                "document_del_by_id fileindex_photo " + photo_));
-  EXPECT_EQ(JsonToString(sandbox_.SearchRequests()[search_before_]["data"]["data"]),
+  EXPECT_EQ(JsonToString(sandbox_.SearchRequests()[sandbox_.SearchRequests().size() - 3]["data"]["data"]),
             "{\"path\":\"" + moved + "/@eaDir/fileindex.db\"}");
   EXPECT_EQ(MgmtSandbox::Read(sandbox_.FoldersFile()), folders);
   const SystemSnapshot snapshot = sandbox_.Snapshot();
