@@ -2,6 +2,7 @@
 #include <map>
 #include <set>
 
+#include "common/json_util.h"
 #include "common/log.h"
 #include "fileindex/custom_event.h"
 #include "fileindex/elastic/elastic_control.h"
@@ -104,6 +105,7 @@ void DropIndexOfVanishedShare(const std::string& share_name) {
 void FolderReindex(const Json::Value& path_list) {
   const FolderLock lock;
   const FolderMgr folder_mgr;
+  CORV_CHECK_THROW(!path_list.isArray(), kErrorBadArgument, JsonToString(path_list));
   std::vector<std::string> full_paths;
   for (const std::string& path : RequestPaths(path_list)) {
     std::shared_ptr<Folder> folder;
@@ -117,6 +119,7 @@ void FolderDelete(const Json::Value& path_list) {
   const FolderLock lock;
   FolderMgr folder_mgr;
   const FolderMgr folder_mgr_before;
+  CORV_CHECK_THROW(!path_list.isArray(), kErrorBadArgument, JsonToString(path_list));
   std::vector<std::shared_ptr<Folder>> removed;
   for (const std::string& path : RequestPaths(path_list)) {
     std::shared_ptr<Folder> folder;

@@ -20,7 +20,6 @@ namespace fileindex {
 FolderLock::FolderLock() : lock_(SysPath(kFileIndexFoldersLockPath), true) {}
 
 std::vector<std::string> RequestPaths(const Json::Value& path_list) {
-  CORV_CHECK_THROW(!path_list.isArray(), kErrorBadArgument, JsonToString(path_list));
   std::vector<std::string> paths;
   for (const Json::Value& element : path_list) {
     std::string path;

@@ -26,9 +26,9 @@ class FolderLock {
   LockFile lock_;
 };
 
-// The share paths named by a request: an array whose elements are share
-// paths or objects with a "path". Repeated paths count once. Error 120 for
-// anything else, an empty path included.
+// The share paths named by a request, an array (the caller checks that)
+// whose elements are share paths or objects with a "path". Repeated paths
+// count once. Error 120 for any other element, an empty path included.
 std::vector<std::string> RequestPaths(const Json::Value& path_list);
 
 // The folders of one share, in the manager's order.

@@ -129,7 +129,7 @@ TEST_F(FolderDeleteTest, RefusalsChangeNothing) {
   const testing_support::SystemSnapshot before = sandbox_.Snapshot();
   LogCapture log;
   EXPECT_EQ(ErrorOf([] { FolderDelete(Json::Value("/photo/a")); }).code, kErrorBadArgument);
-  EXPECT_EQ(log.Matching("Failed [!path_list.isArray()], reason: \"/photo/a\"").size(), 1u);
+  EXPECT_EQ(log.Matching("(FolderDelete) Failed [!path_list.isArray()], reason: \"/photo/a\"").size(), 1u);
   EXPECT_EQ(ErrorOf([] { FolderDelete(JsonList({"/photo/a", ""})); }).code, kErrorBadArgument);
   EXPECT_EQ(ErrorOf([] { FolderDelete(JsonList({"/photo/a", 7})); }).code, kErrorBadArgument);
   EXPECT_EQ(ErrorOf([] { FolderDelete(JsonList({"/photo/a", "/photo/zzz"})); }).code, kErrorFolderNotFound);

@@ -111,6 +111,13 @@ TEST_F(PauseHomeTest, HomeServiceSwitchSuspendsAndRestoresTheHomes) {
   EXPECT_TRUE(NewSearchCommands().empty());  // the index stayed all along
 }
 
+TEST_F(PauseHomeTest, HomeSwitchWithoutTheHomesShareChangesNothing) {
+  sandbox_.RemoveShare("homes");
+  ExpectRefused([] { HomeDisable(); }, kErrorShareNotFound, "");
+  ExpectRefused([] { HomeEnable(); }, kErrorShareNotFound, "");
+  ExpectRefused([] { UserRename("alice", "carol"); }, kErrorShareNotFound, "");
+}
+
 TEST_F(PauseHomeTest, UserRenameMovesTheUsersFolders) {
   std::filesystem::rename(homes_ + "/alice", homes_ + "/carol");
   LogCapture log;
