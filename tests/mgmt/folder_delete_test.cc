@@ -147,6 +147,17 @@ TEST_F(FolderDeleteTest, MonitorFailureRestoresTheFolderFile) {
   EXPECT_EQ(sandbox_.Snapshot(), before);
 }
 
+TEST_F(FolderDeleteTest, IndexFailureMarksTheShareForRebuild) {
+  Add({FolderJson("/photo/a"), FolderJson("/photo/b")});
+  sandbox_.search().Enqueue(testing_support::FakeAnswer::Failure(2003, "disk I/O error"));
+  EXPECT_EQ(ErrorOf([] { FolderDelete(JsonList({"/photo/a"})); }).code, 2003);
+  // The folder is gone from the file and the notifier; the index, which may
+  // still hold its documents, is marked for a rebuild.
+  EXPECT_THAT(SavedPaths(sandbox_), ElementsAre("/photo/b"));
+  EXPECT_EQ(sandbox_.MonitorCfg("photo")["config"].size(), 1u);
+  EXPECT_EQ(StatusMgr().GetShareStatus("photo"), 1u);
+}
+
 TEST_F(FolderDeleteTest, ReindexQueuesOneEventPerFolder) {
   Add({FolderJson("/photo/a"), FolderJson("/photo/b"), FolderJson("/music")});
   FolderReindex(JsonList({"/photo/b", Json::Value(FolderJson("/music")), "/photo/a", "/photo/b"}));
