@@ -97,7 +97,8 @@ std::unique_ptr<IndexStore> IndexStore::Create(const std::string& directory, con
   db->Exec("CREATE TABLE docs(rowid INTEGER PRIMARY KEY, key TEXT NOT NULL, doc BLOB NOT NULL)");
   db->Exec("CREATE UNIQUE INDEX docs_key ON docs(key)");
   db->Exec("CREATE VIRTUAL TABLE fts_text USING fts5(" + text_columns + ", content='', tokenize='corvblank')");
-  db->Exec("CREATE VIRTUAL TABLE fts_name USING fts5(" + name_columns + ", content='', tokenize='trigram case_sensitive 1')");
+  // Name matches filter and are never ranked, so the name index keeps no lengths.
+  db->Exec("CREATE VIRTUAL TABLE fts_name USING fts5(" + name_columns + ", content='', columnsize=0, tokenize='trigram case_sensitive 1')");
   db->Exec("CREATE TABLE suggest(field TEXT NOT NULL, term TEXT NOT NULL, freq INTEGER NOT NULL, PRIMARY KEY(field, term)) WITHOUT ROWID");
   Statement& meta = db->Cached("INSERT INTO meta(name, value) VALUES(?, ?)");
   for (const auto& [name, value] : std::vector<std::pair<std::string, std::string>>{
@@ -430,6 +431,11 @@ int64_t IndexStore::DeleteByQuery(const Query& query) {
       load.Reset();
       RemoveRow(rowid, key, stored);
       ++deleted;
+      // Everything queued now is this request's own (the queue was emptied
+      // above), so it may reach the engine inside the request's savepoint:
+      // a failure rolls it back with the rest. This bounds the memory of a
+      // delete of many documents.
+      if (pending_index_.bytes() > kMaxPendingIndexBytes) pending_index_.ApplyTo(*writer_);
     }
   });
   return deleted;
