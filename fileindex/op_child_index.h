@@ -6,6 +6,7 @@
 #pragma once
 
 #include <cstddef>
+#include <cstdint>
 #include <memory>
 #include <string_view>
 #include <vector>
@@ -31,7 +32,9 @@ class ChildIndex {
   static size_t Capacity(size_t child_count);
   void Place(OPNode* child, size_t capacity);
 
-  std::unique_ptr<OPNode*[]> slots_;  // open addressing, linear probing; null is free
+  // Capacity child pointers (null is free; open addressing, linear
+  // probing) followed by one hash tag byte per slot, in one block.
+  std::unique_ptr<uint8_t[]> slots_;
 };
 
 }  // namespace fileindex

@@ -30,7 +30,7 @@ class FolderCache {
     OPNode* node = nullptr;
   };
   static constexpr size_t kFirstSlots = 64;
-  static constexpr size_t kMaxSlots = 65536;
+  static constexpr size_t kMaxSlots = 16384;
   size_t Slot(std::string_view folder_path) const;
 
   std::vector<Entry> entries_;  // a power of two in size once used

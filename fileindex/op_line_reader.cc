@@ -1,5 +1,6 @@
 #include "fileindex/op_line_reader.h"
 
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -9,9 +10,19 @@ namespace corvlumex {
 namespace fileindex {
 namespace {
 constexpr size_t kReadSize = 1 << 20;
+constexpr size_t kSmallestBuffer = 4096;
+
+// Large reads for large queues, without a megabyte for a queue of three lines.
+size_t FirstBufferSize(int fd) {
+  struct stat info {};
+  if (fstat(fd, &info) != 0 || !S_ISREG(info.st_mode)) return kReadSize;
+  const size_t wanted = static_cast<size_t>(info.st_size) + 1;
+  return wanted < kSmallestBuffer ? kSmallestBuffer : wanted > kReadSize ? kReadSize : wanted;
+}
+
 }  // namespace
 
-LineReader::LineReader(int fd) : fd_(fd), buffer_(kReadSize) {}
+LineReader::LineReader(int fd) : fd_(fd), buffer_(FirstBufferSize(fd)) {}
 
 LineReader::~LineReader() {
   if (fd_ >= 0) close(fd_);
@@ -44,7 +55,7 @@ bool LineReader::Fill() {
     end_ -= begin_;
     begin_ = 0;
   }
-  if (buffer_.size() - end_ < kReadSize / 2) buffer_.resize(buffer_.size() * 2);
+  if (buffer_.size() - end_ < buffer_.size() / 2) buffer_.resize(buffer_.size() * 2);
   for (;;) {
     const ssize_t got = read(fd_, buffer_.data() + end_, buffer_.size() - end_);
     if (got > 0) {

@@ -30,6 +30,9 @@ void OP::MergeData(const Json::Value& data) {
 OPNode::OPNode(std::shared_ptr<OPNode> parent, const std::string& name)
     : name_(name), parent_(std::move(parent)) {}
 
+OPNode::OPNode(FromView, std::shared_ptr<OPNode> parent, std::string_view name)
+    : name_(name), parent_(std::move(parent)) {}
+
 OPNode::~OPNode() {
   // Release the ancestors this node was the last owner of one by one, so a
   // path thousands of components deep cannot exhaust the stack.
@@ -62,7 +65,7 @@ OPNode* OPNode::ChildNode(std::string_view name) {
       if (child->name_ == name) return child.get();
     }
   }
-  children_.push_back(std::make_shared<OPNode>(shared_from_this(), std::string(name)));
+  children_.push_back(std::make_shared<OPNode>(FromView(), shared_from_this(), name));
   index_.Added(children_);
   return children_.back().get();
 }

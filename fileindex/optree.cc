@@ -60,8 +60,10 @@ OPNode* OPTree::Resolve(std::string_view path) {
   // path with `path` at each step answers exactly for this form, so the form
   // is checked once instead of rebuilding the node's path at every step.
   const bool canonical = !path.empty() && path.front() == '/' && path.back() != '/' &&
-                         path.find("//") == std::string_view::npos;
-  const size_t last_slash = canonical ? path.rfind('/') : 0;
+                         memmem(path.data(), path.size(), "//", 2) == nullptr;
+  const size_t last_slash =
+      canonical ? static_cast<size_t>(static_cast<const char*>(memrchr(path.data(), '/', path.size())) - path.data())
+                : 0;
   if (canonical) {
     OPNode* folder = last_slash == 0 ? root_.get() : folders_.Find(path.substr(0, last_slash));
     if (folder != nullptr) return folder->ChildNode(path.substr(last_slash + 1));

@@ -63,6 +63,9 @@ class OP {
 class OPNode : public std::enable_shared_from_this<OPNode> {
  public:
   OPNode(std::shared_ptr<OPNode> parent, const std::string& name);
+  // Same, for the tree's own use: builds the name in place from a piece of a path.
+  struct FromView {};
+  OPNode(FromView, std::shared_ptr<OPNode> parent, std::string_view name);
   ~OPNode();
   OPNode(const OPNode&) = delete;
   OPNode& operator=(const OPNode&) = delete;

@@ -110,14 +110,18 @@ std::vector<std::string> GenerateQueue(size_t count, uint32_t seed, const QueueM
       file.second = model.NewName(false);
       lines.push_back(QueueLine(kEventRename, model.FolderPath(file.first) + "/" + file.second, false, old_path));
     } else if (model.folders_.size() > 1 && take(mix.rename_folder)) {
-      const int at = 1 + static_cast<int>(model.Roll(static_cast<unsigned>(model.folders_.size() - 1)));
+      // Like every other change, mostly in the folders in use lately (the
+      // "New folder" that gets its name), sometimes anywhere.
+      int at = model.PickFolder();
+      if (at == 0) at = 1;
       const std::string old_path = model.FolderPath(at);
       model.folders_[at].name = model.NewName(true);
       lines.push_back(QueueLine(kEventRename, model.FolderPath(at), true, old_path));
     } else if (model.folders_.size() > 1 && take(mix.delete_folder)) {
       // The folder stays in the model (a later create may reuse the path);
       // the event itself is what matters to the tree.
-      const int at = 1 + static_cast<int>(model.Roll(static_cast<unsigned>(model.folders_.size() - 1)));
+      int at = model.PickFolder();
+      if (at == 0) at = 1;
       lines.push_back(QueueLine(kEventDelete, model.FolderPath(at), true));
     } else if (take(mix.update_cfg)) {
       lines.push_back("{\"data\":{\"audio\":false,\"document\":true,\"photo\":true,\"video\":false},\"event\":131072,"

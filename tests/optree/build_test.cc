@@ -82,6 +82,24 @@ TEST_F(BuildTest, LastLineWithoutNewlineAndCarriageReturnsAreRead) {
   EXPECT_THAT(Process(*tree).ops, ElementsAre("[02] /v/s/a", "[02] /v/s/b"));
 }
 
+TEST_F(BuildTest, LinesAcrossReadBlocksAndLongerThanABlockAreWhole) {
+  log_level = 6;
+  // About 2.5 MiB: lines straddle the 1 MiB read blocks, and one line is
+  // longer than a block.
+  std::vector<std::string> lines;
+  std::vector<std::string> expected;
+  for (int i = 0; i < 24000; ++i) {
+    std::string path = "/v/s/" + std::string(40 + i % 57, 'a' + i % 26) + "/f" + std::to_string(i);
+    if (i == 12000) path = "/v/s/long/" + std::string(1200000, 'x');
+    lines.push_back(Line(kEventCreate, path));
+    expected.push_back("[02] " + path);
+  }
+  auto tree = Build(lines);
+  const Processed out = Process(*tree);
+  EXPECT_EQ(out.ops, expected);
+  EXPECT_TRUE(log_.Lines().empty());
+}
+
 TEST_F(BuildTest, CrashMarkerStopsReadingAndAsksForFullReindex) {
   log_level = 6;
   auto tree = Build({Line(kEventCreate, "/v/s/a"), Line(kEventQueueCrash, "/v/s"), "not json",
