@@ -4,8 +4,8 @@
 #include <random>
 #include <stdexcept>
 
-#include "common/json_util.h"
 #include "fileindex/event.h"
+#include "tests/optree/queue_line.h"
 
 namespace corvlumex {
 namespace fileindex {
@@ -67,12 +67,7 @@ class Model {
 }  // namespace
 
 std::string QueueLine(unsigned mask, const std::string& path, bool is_dir, const std::string& path_old) {
-  Json::Value line(Json::objectValue);
-  line["event"] = mask;
-  line["is_dir"] = is_dir;
-  line["path"] = path;
-  if (!path_old.empty()) line["path_old"] = path_old;
-  return JsonToString(line);
+  return queue_testing::Line(mask, path, is_dir, path_old);
 }
 
 std::vector<std::string> GenerateQueue(size_t count, uint32_t seed, const QueueMix& mix) {

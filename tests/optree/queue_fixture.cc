@@ -8,15 +8,6 @@ namespace corvlumex {
 namespace fileindex {
 namespace queue_testing {
 
-std::string Line(unsigned mask, const std::string& path, bool is_dir, const std::string& path_old) {
-  Json::Value line(Json::objectValue);
-  line["event"] = mask;
-  line["is_dir"] = is_dir;
-  line["path"] = path;
-  if (!path_old.empty()) line["path_old"] = path_old;
-  return JsonToString(line);
-}
-
 std::string CfgLine(const std::string& path, const std::string& data_json) {
   return "{\"event\":131072,\"path\":\"" + path + "\",\"data\":" + data_json + "}";
 }

@@ -8,14 +8,13 @@
 
 #include "common/log.h"
 #include "fileindex/optree.h"
+#include "tests/optree/queue_line.h"
 #include "tests/support/log_capture.h"
 
 namespace corvlumex {
 namespace fileindex {
 namespace queue_testing {
 
-// One queue line.
-std::string Line(unsigned mask, const std::string& path, bool is_dir = false, const std::string& path_old = "");
 std::string CfgLine(const std::string& path, const std::string& data_json);
 
 class QueueTest {
