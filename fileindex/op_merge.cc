@@ -235,6 +235,14 @@ void OPTree::MoveDescendantOPs(OPNode* old_node, OPNode* new_node) {
 void OPTree::Rename(OPNode* node, const std::shared_ptr<OP>& op) {
   const std::string old_path = op->path_;
   OPNode* old_node = Resolve(old_path);
+  // No file system moves a folder into itself. Folding such a line would
+  // copy the pending subtree into itself (and again for each such line), so
+  // it is refused like a path that does not resolve.
+  for (const OPNode* up = node->parent_.get(); up != nullptr; up = up->parent_.get()) {
+    if (up == old_node) {
+      throw Error(kErrorBadArgument, "Rename into its own subtree, path_old=" + old_path + ", path=" + node->GetPath());
+    }
+  }
   FileIndexOP extra = kOPNone;
   op->op_ = kOPRename;
   // The rename overwrites whatever was pending at the destination.

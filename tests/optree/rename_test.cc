@@ -2,6 +2,8 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <cstdlib>
+
 #include "tests/optree/queue_fixture.h"
 
 namespace corvlumex {
@@ -76,12 +78,27 @@ TEST_F(RenameTest, RenameOntoItselfMovesPendingWorkBehindIt) {
   EXPECT_EQ(node->ops_[1]->op_, kOPRename);
 }
 
-TEST_F(RenameTest, RenameIntoItsOwnSubtreeFinishes) {
-  const Processed out = Run({Line(kEventCreate, "/v/s/a/x"), Line(kEventCreate, "/v/s/a/b/y"),
-                             Rename("/v/s/a", "/v/s/a/b", true)});
-  // x first moves to /a/b/x, which the walk then meets inside /a/b and
-  // moves on like y: each descendant's work follows once per visit.
-  EXPECT_THAT(out.ops, ElementsAre("[02] /v/s/a/b/b/x", "[02] /v/s/a/b/b/y", "[05] /v/s/a -> /v/s/a/b"));
+TEST_F(RenameTest, RenameIntoItsOwnSubtreeIsRefused) {
+  const Processed out = Run({Line(kEventCreate, "/v/s/a/x"), Rename("/v/s/a", "/v/s/a/b", true),
+                             Line(kEventModify, "/v/s/a/y")});
+  EXPECT_THAT(out.ops, ElementsAre("[02] /v/s/a/x", "[02] /v/s/a/y"));
+  EXPECT_EQ(log_.Matching("InsertEvent failed, event_raw=" + Rename("/v/s/a", "/v/s/a/b", true) +
+                          ", code=120, reason=Rename into its own subtree, path_old=/v/s/a, path=/v/s/a/b")
+                .size(),
+            1u);
+}
+
+// A queue found by fuzzing: renames of a folder into ever deeper places
+// inside itself used to copy the pending subtree into itself until memory
+// ran out.
+TEST_F(RenameTest, RepeatedRenamesIntoItselfStaySmall) {
+  const char* source = getenv("FILEINDEX_SOURCE_DIR");
+  ASSERT_NE(source, nullptr);
+  OPTree tree(std::string(source) + "/tests/optree/data/rename_into_itself.queue");
+  size_t nodes = 0;
+  OPTree::TraverseNodeDescendant(tree.Root(), [&](std::shared_ptr<OPNode>) { ++nodes; }, true);
+  EXPECT_LT(nodes, 200u);
+  EXPECT_EQ(log_.Matching("reason=Rename into its own subtree").size(), 3u);
 }
 
 TEST_F(RenameTest, RenameToAParentFolder) {
