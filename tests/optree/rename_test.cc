@@ -2,8 +2,6 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <cstdlib>
-
 #include "tests/optree/queue_fixture.h"
 
 namespace corvlumex {
@@ -92,9 +90,7 @@ TEST_F(RenameTest, RenameIntoItsOwnSubtreeIsRefused) {
 // inside itself used to copy the pending subtree into itself until memory
 // ran out.
 TEST_F(RenameTest, RepeatedRenamesIntoItselfStaySmall) {
-  const char* source = getenv("FILEINDEX_SOURCE_DIR");
-  ASSERT_NE(source, nullptr);
-  OPTree tree(std::string(source) + "/tests/optree/data/rename_into_itself.queue");
+  OPTree tree(std::string(OPTREE_TEST_DATA) + "/rename_into_itself.queue");
   size_t nodes = 0;
   OPTree::TraverseNodeDescendant(tree.Root(), [&](std::shared_ptr<OPNode>) { ++nodes; }, true);
   EXPECT_LT(nodes, 200u);
