@@ -75,52 +75,11 @@ bool WaitForFrame(int fd) {
   }
 }
 
-DomainSockConnection::DomainSockConnection(const std::string& path) : path_(path) {}
-
-DomainSockConnection::~DomainSockConnection() {
-  if (fd_ >= 0) close(fd_);
-}
-
-bool DomainSockConnection::Connect() {
-  struct sockaddr_un address;
-  memset(&address, 0, sizeof(address));
-  address.sun_family = AF_UNIX;
-  if (path_.size() >= sizeof(address.sun_path)) {
-    errno = ENAMETOOLONG;
-    return false;
-  }
-  memcpy(address.sun_path, path_.c_str(), path_.size());
-  if (fd_ < 0) fd_ = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  if (fd_ < 0) return false;
-  return connect(fd_, reinterpret_cast<struct sockaddr*>(&address), sizeof(address)) == 0;
-}
-
-bool DomainSockConnection::Send(const std::string& text) {
-  if (fd_ < 0) return false;
-  const fileindex::SigpipeBlock no_sigpipe;
-  try {
-    fileindex::WriteFrame(fd_, text);
-  } catch (const Error&) {
-    return false;
-  }
-  return true;
-}
-
-bool DomainSockConnection::Recv(std::string& text) {
-  if (fd_ < 0 || !WaitForFrame(fd_)) return false;
-  try {
-    text = fileindex::ReadFrame(fd_);
-  } catch (const Error&) {
-    return false;
-  }
-  return true;
-}
-
 void SendRequestImpl(Json::Value& res, const Json::Value& req) {
   const std::string path = ElasticSocketPath();
   WaitForSocketFile(path);
 
-  DomainSockConnection conn(path);
+  corvdaemon::DomainSockConnection conn(path);
   CORV_CHECK_THROW(!conn.Connect(), kErrorSearchRequest, "Connect failed");
   CORV_CHECK_THROW_TEXT(!conn.Send(JsonToString(req)), "!conn.Send(req.toString())", kErrorSearchRequest,
                         "Send failed");
@@ -158,3 +117,48 @@ void SendRequestImpl(Json::Value& res, const Json::Value& req) {
 }
 
 }  // namespace corvlumex
+
+namespace corvdaemon {
+
+SockConnection::~SockConnection() {
+  if (fd_ >= 0) close(fd_);
+}
+
+bool SockConnection::Send(const std::string& text) {
+  if (fd_ < 0) return false;
+  const corvlumex::fileindex::SigpipeBlock no_sigpipe;
+  try {
+    corvlumex::fileindex::WriteFrame(fd_, text);
+  } catch (const corvlumex::Error&) {
+    return false;
+  }
+  return true;
+}
+
+bool SockConnection::Recv(std::string& text) {
+  if (fd_ < 0 || !corvlumex::WaitForFrame(fd_)) return false;
+  try {
+    text = corvlumex::fileindex::ReadFrame(fd_);
+  } catch (const corvlumex::Error&) {
+    return false;
+  }
+  return true;
+}
+
+DomainSockConnection::DomainSockConnection(const std::string& path) : path_(path) {}
+
+bool DomainSockConnection::Connect() {
+  struct sockaddr_un address;
+  memset(&address, 0, sizeof(address));
+  address.sun_family = AF_UNIX;
+  if (path_.size() >= sizeof(address.sun_path)) {
+    errno = ENAMETOOLONG;
+    return false;
+  }
+  memcpy(address.sun_path, path_.c_str(), path_.size());
+  if (fd_ < 0) fd_ = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  if (fd_ < 0) return false;
+  return connect(fd_, reinterpret_cast<struct sockaddr*>(&address), sizeof(address)) == 0;
+}
+
+}  // namespace corvdaemon

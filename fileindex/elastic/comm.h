@@ -23,25 +23,42 @@ std::string ElasticSocketPath();
 // so callers must not start reading a frame that will never come.
 bool WaitForFrame(int fd);
 
-// A client connection on a Unix stream socket; the descriptor is closed on
-// destruction. Each call reports success as true.
-class DomainSockConnection {
- public:
-  explicit DomainSockConnection(const std::string& path);
-  ~DomainSockConnection();
-  DomainSockConnection(const DomainSockConnection&) = delete;
-  DomainSockConnection& operator=(const DomainSockConnection&) = delete;
+}  // namespace corvlumex
 
-  bool Connect();
+// The platform's socket client, in the platform's own namespace: a connected
+// stream socket that carries one frame per call each way, and its Unix-socket
+// form that knows where to connect. The descriptor is closed on destruction.
+// Each call reports success as true.
+namespace corvdaemon {
+
+class SockConnection {
+ public:
+  virtual ~SockConnection();
+  SockConnection(const SockConnection&) = delete;
+  SockConnection& operator=(const SockConnection&) = delete;
+
   // One frame each way. A peer that has gone away makes Send fail; it does
   // not kill a caller that leaves SIGPIPE at its default.
   bool Send(const std::string& text);
   bool Recv(std::string& text);
 
- private:
-  std::string path_;
+ protected:
+  SockConnection() = default;
   int fd_ = -1;
 };
+
+class DomainSockConnection : public SockConnection {
+ public:
+  explicit DomainSockConnection(const std::string& path);
+  bool Connect();
+
+ private:
+  std::string path_;
+};
+
+}  // namespace corvdaemon
+
+namespace corvlumex {
 
 // One exchange with corvelasticd. On return `res` holds the answer, an object
 // with a bool "success" that is true. Throws Error: 913 when the daemon cannot

@@ -4,6 +4,7 @@
 
 #include <memory>
 #include <string>
+#include <type_traits>
 
 #include "common/error.h"
 #include "common/json_util.h"
@@ -47,6 +48,31 @@ TEST_F(SendRequestTest, OneFramedRequestPerConnectionAndTheAnswerIsReturned) {
   EXPECT_EQ(daemon.Connections(), 2);
   EXPECT_TRUE(sleeps_.Sleeps().empty());
   EXPECT_TRUE(log_.Lines().empty());
+}
+
+// The channel goes through the platform's client class, by its own name and
+// through its base; a connection that is not connected refuses to carry.
+TEST_F(SendRequestTest, PlatformConnectionCarriesOneFrameEachWay) {
+  static_assert(std::is_base_of<corvdaemon::SockConnection, corvdaemon::DomainSockConnection>::value,
+                "the Unix-socket client is a socket connection");
+  FakeSearchDaemon daemon;
+  daemon.Enqueue(FakeAnswer::Success(JsonOf(R"({"hits": 1})")));
+  std::string raw;
+  {
+    corvdaemon::DomainSockConnection idle(ElasticSocketPath());
+    EXPECT_FALSE(idle.Send("{}"));
+    EXPECT_FALSE(idle.Recv(raw));
+  }
+  corvdaemon::DomainSockConnection conn(ElasticSocketPath());
+  ASSERT_TRUE(conn.Connect());
+  corvdaemon::SockConnection& base = conn;
+  ASSERT_TRUE(base.Send(JsonToString(req_)));
+  ASSERT_TRUE(base.Recv(raw));
+  Json::Value res;
+  ASSERT_TRUE(JsonFromString(res, raw)) << raw;
+  EXPECT_EQ(res["data"]["hits"].asInt(), 1);
+  ASSERT_EQ(daemon.Requests().size(), 1u);
+  EXPECT_EQ(daemon.Requests()[0], req_);
 }
 
 TEST_F(SendRequestTest, MissingSocketIsWaitedForFifteenSecondsThenConnectFails) {
