@@ -129,6 +129,29 @@ TEST_F(FolderUpsertTest, FullVolumeRefusesTheRequest) {
                 "!share.IsSpaceEnough()");
 }
 
+// Once every folder is accepted the steps run in order and a failure stops
+// them where it happens: what was done stays, what follows never runs.
+TEST_F(FolderUpsertTest, LateFailurePropagatesAndLeavesEarlierStepsInPlace) {
+  const std::string folders_before = MgmtSandbox::Read(sandbox_.FoldersFile());
+  {
+    ScopedTestPlatform platform;
+    platform->fail_monitor = true;
+    const Error error = ErrorOf([] { FolderAdd(JsonList({FolderJson("/photo/a")}), false); });
+    EXPECT_EQ(error.code, kErrorSystem);
+    EXPECT_EQ(error.reason, "MonitorQueue::Upsert failed, share=photo");
+  }
+  EXPECT_THAT(sandbox_.SearchCommands(), ElementsAre("index_create fileindex_photo"));
+  EXPECT_EQ(sandbox_.ServiceRequests().back(), "start pkg-CorvLumex-fileindexd.service");
+  EXPECT_EQ(MgmtSandbox::Read(sandbox_.FoldersFile()), folders_before) << "not saved";
+  EXPECT_TRUE(sandbox_.DaemonCommands().empty());
+  EXPECT_TRUE(sandbox_.QueueEvents("photo").empty());
+
+  // The lock went with the failed call; the folder is still new to the file.
+  FolderAdd(JsonList({FolderJson("/photo/a")}), false);
+  EXPECT_THAT(sandbox_.SearchCommands(), ElementsAre("index_create fileindex_photo", "index_create fileindex_photo"));
+  EXPECT_EQ(sandbox_.QueueEvents("photo").size(), 1u);
+}
+
 TEST_F(FolderUpsertTest, UpdaterModeStoresRefusedPathsWithoutReindex) {
   FolderAdd(JsonList({FolderJson("/ro")}), true);
   Json::Value saved;

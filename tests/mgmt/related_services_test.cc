@@ -81,6 +81,13 @@ TEST(RelatedServicesTest, PrepareServicesFollowsTheFolderFile) {
   WriteFolders(sandbox, {FolderJson("/photo")});
   PrepareServices();
   EXPECT_EQ(sandbox.ServiceRequests().back(), "start pkg-CorvLumex-fileindexd.service");
+  // A file whose list is empty counts as nothing configured.
+  WriteFolders(sandbox, {});
+  PrepareServices();
+  const std::vector<std::string> requests = sandbox.ServiceRequests();
+  ASSERT_GE(requests.size(), 2u);
+  EXPECT_THAT(std::vector<std::string>(requests.end() - 2, requests.end()),
+              ElementsAre("--no-block stop corvcontentextractd.service", "stop pkg-CorvLumex-fileindexd.service"));
 }
 
 TEST(RelatedServicesTest, MonitorConfigurationListsTheShareFoldersOnly) {
@@ -98,9 +105,11 @@ TEST(RelatedServicesTest, MonitorConfigurationListsTheShareFoldersOnly) {
   EXPECT_EQ(cfg["config"][1]["mask"].asUInt(), 65478u);
   EXPECT_EQ(JsonToString(cfg["config"][1]["ignore"]), "[\"@eaDir\"]");
 
-  // A share without folders keeps its queue and watches nothing.
-  sandbox.AddShare("music");
+  // A share without folders keeps its queue and watches nothing: "config"
+  // is null, not an empty list.
+  const std::string music = sandbox.AddShare("music");
   UpsertCORVNotifydCfg("music", folder_mgr);
+  EXPECT_EQ(sandbox.MonitorCfg("music")["queue"].asString(), music + "/@eaDir/fileindex.queue");
   EXPECT_TRUE(sandbox.MonitorCfg("music").isMember("config"));
   EXPECT_TRUE(sandbox.MonitorCfg("music")["config"].isNull());
 
