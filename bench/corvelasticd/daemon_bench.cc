@@ -5,6 +5,7 @@
 // daemon's peak memory and the database size against the text indexed.
 //
 //   corvelasticd_bench --daemon BUILD/programs/corvelasticd/corvelasticd --docs 1000000 --work DIR
+#include <dirent.h>
 #include <fcntl.h>
 #include <grp.h>
 #include <pwd.h>
@@ -41,6 +42,8 @@ struct Options {
   std::string work = "/tmp/corvelasticd-bench";
   long docs = 100000;
   int queries = 300;
+  bool reuse = false;  // the work directory holds a finished ingest: measure searches (and the delete) again
+  bool keep = false;   // no delete, so the index can be measured again with --reuse
 };
 
 std::string g_socket;
@@ -158,6 +161,58 @@ double LoadAverage() {
   return one_minute;
 }
 
+// Time the daemon's threads spent on a CPU and waiting for one (scheduler
+// statistics, nanoseconds): the part of a query's latency that is the
+// daemon's own work, apart from the wait that a busy machine adds.
+struct ThreadTimes {
+  double cpu_ns = 0;
+  double wait_ns = 0;
+};
+
+ThreadTimes DaemonThreadTimes(pid_t pid) {
+  ThreadTimes times;
+  const std::string tasks = "/proc/" + std::to_string(pid) + "/task";
+  DIR* dir = opendir(tasks.c_str());
+  if (dir == nullptr) return times;
+  while (const struct dirent* entry = readdir(dir)) {
+    if (entry->d_name[0] == '.') continue;
+    std::ifstream stat(tasks + "/" + entry->d_name + "/schedstat");
+    double cpu = 0, wait = 0;
+    if (stat >> cpu >> wait) {
+      times.cpu_ns += cpu;
+      times.wait_ns += wait;
+    }
+  }
+  closedir(dir);
+  return times;
+}
+
+// Per query: latency, readable hits, daemon CPU, daemon wait for a CPU.
+struct QueryFigures {
+  std::vector<double> ms, cpu_ms, wait_ms;
+  double hits = 0;
+  void Print(const char* what) const;
+};
+
+void QueryFigures::Print(const char* what) const {
+  if (ms.empty()) return;
+  std::cout << what << ": median " << Percentile(ms, 0.5) << " ms, p99 " << Percentile(ms, 0.99) << " ms ("
+            << ms.size() << " queries, " << hits / ms.size() << " readable hits on average); the daemon's CPU per query: median "
+            << Percentile(cpu_ms, 0.5) << " ms, p99 " << Percentile(cpu_ms, 0.99) << " ms; its wait for a CPU: median "
+            << Percentile(wait_ms, 0.5) << " ms, p99 " << Percentile(wait_ms, 0.99) << " ms\n";
+}
+
+QueryFigures Split(const std::vector<double>& raw) {
+  QueryFigures figures;
+  for (size_t i = 0; i + 3 < raw.size(); i += 4) {
+    figures.ms.push_back(raw[i]);
+    figures.hits += raw[i + 1];
+    figures.cpu_ms.push_back(raw[i + 2]);
+    figures.wait_ms.push_back(raw[i + 3]);
+  }
+  return figures;
+}
+
 long PeakMemoryKb(pid_t pid) {
   std::ifstream status("/proc/" + std::to_string(pid) + "/status");
   std::string line;
@@ -207,20 +262,22 @@ int main(int argc, char** argv) {
     else if (key == "--work") options.work = argv[i + 1];
     else if (key == "--docs") options.docs = atol(argv[i + 1]);
     else if (key == "--queries") options.queries = atoi(argv[i + 1]);
+    else if (key == "--reuse") options.reuse = std::string(argv[i + 1]) == "1";
+    else if (key == "--keep") options.keep = std::string(argv[i + 1]) == "1";
   }
   if (options.daemon.empty()) {
-    std::cerr << "usage: corvelasticd_bench --daemon PATH [--docs N] [--work DIR] [--queries N]\n";
+    std::cerr << "usage: corvelasticd_bench --daemon PATH [--docs N] [--work DIR] [--queries N] [--reuse 1] [--keep 1]\n";
     return 2;
   }
   signal(SIGPIPE, SIG_IGN);
-  if (system(("rm -rf '" + options.work + "' && mkdir -p '" + options.work + "'").c_str()) != 0) return 1;
+  if (!options.reuse && system(("rm -rf '" + options.work + "' && mkdir -p '" + options.work + "'").c_str()) != 0) return 1;
   chmod(options.work.c_str(), 0755);
   g_socket = options.work + "/corvelasticd.sock";
   const std::string share = options.work + "/share";
 
   // The files exist, readable by everybody, so an ordinary user's searches find them.
-  std::cerr << "creating " << options.docs << " files...\n";
-  for (long i = 0; i < options.docs; ++i) {
+  if (!options.reuse) std::cerr << "creating " << options.docs << " files...\n";
+  for (long i = 0; i < options.docs && !options.reuse; ++i) {
     const std::string path = PathOf(share, i);
     const int fd = open(path.c_str(), O_CREAT | O_WRONLY | O_CLOEXEC, 0644);
     if (fd < 0) {
@@ -230,7 +287,7 @@ int main(int argc, char** argv) {
       close(fd);
     }
   }
-  if (system(("chmod -R a+rX '" + share + "'").c_str()) != 0) return 1;
+  if (!options.reuse && system(("chmod -R a+rX '" + share + "'").c_str()) != 0) return 1;
 
   pid_t daemon = StartDaemon(options);
 
@@ -244,7 +301,7 @@ int main(int argc, char** argv) {
       "CORVMDFSContentChangeDate": {"type": "int"}, "CORVMDIsDir": {"type": "bool", "_all": false},
       "CORVMDTitle": {"type": "text"}, "CORVMDTextContent": {"type": "text"},
       "CORVMDSearchFileName": {"type": "text", "analyzer": "white space", "preprocess": ["tolower", "ngram"]}}})");
-  Command("index_create", create);
+  if (!options.reuse) Command("index_create", create);
 
   Words words;
   std::vector<std::string> names;
@@ -273,10 +330,11 @@ int main(int argc, char** argv) {
     Json::Value data;
     data["doc_id"] = path;
     data["data"] = doc;
+    if (options.reuse) continue;  // the same documents, already indexed
     Command("document_upsert_by_id", data);
     if ((i + 1) % 1000 == 0) Command("commit", Json::Value(Json::objectValue));
   }
-  Command("commit", Json::Value(Json::objectValue));
+  if (!options.reuse) Command("commit", Json::Value(Json::objectValue));
   const double ingest_seconds = std::chrono::duration<double>(Clock::now() - ingest_start).count();
   const double ingest_cpu = CpuSeconds(daemon);
   const double client_cpu = CpuSeconds(getpid()) - client_cpu_start;
@@ -315,27 +373,29 @@ int main(int argc, char** argv) {
         request["command"] = "search";
         request["data"] = data;
         request["data"]["id"] = "fileindex_bench";
+        const ThreadTimes before = DaemonThreadTimes(daemon);
         const auto start = Clock::now();
         const Json::Value answer = Request(request);
         ms.push_back(std::chrono::duration<double, std::milli>(Clock::now() - start).count());
+        const ThreadTimes after = DaemonThreadTimes(daemon);
         ms.push_back(answer["data"]["total"].asDouble());
+        ms.push_back((after.cpu_ns - before.cpu_ns) / 1e6);
+        ms.push_back((after.wait_ns - before.wait_ns) / 1e6);
       }
       return ms;
     });
   };
   std::vector<double> name_raw = timed(substrings, "CORVMDSearchFileName");
   std::vector<double> word_raw = timed(terms, "_all");
-  auto split = [](const std::vector<double>& raw, std::vector<double>* ms, double* hits) {
-    for (size_t i = 0; i + 1 < raw.size(); i += 2) {
-      ms->push_back(raw[i]);
-      *hits += raw[i + 1];
-    }
-  };
-  std::vector<double> name_ms, word_ms;
-  double name_hits = 0, word_hits = 0;
-  split(name_raw, &name_ms, &name_hits);
-  split(word_raw, &word_ms, &word_hits);
+  QueryFigures names_found = Split(name_raw), words_found = Split(word_raw);
 
+  if (options.keep) {
+    StopDaemon(daemon);
+    std::cout << "documents: " << options.docs << "\n";
+    names_found.Print("name substring search");
+    words_found.Print("word search");
+    return 0;
+  }
   Json::Value del;
   del["query"]["qsl"]["prefix"]["CORVMDPath"] = share + "/g3/";
   const auto delete_start = Clock::now();
@@ -351,14 +411,8 @@ int main(int argc, char** argv) {
             << " s; daemon CPU " << ingest_cpu << " s = " << static_cast<long>(options.docs / std::max(ingest_cpu, 1e-3))
             << " documents per CPU second; the client's CPU " << client_cpu << " s; load average " << ingest_load << ")\n";
   std::cout << "reopening the index after a restart: " << restart_seconds << " s\n";
-  if (!name_ms.empty()) {
-    std::cout << "name substring search: median " << Percentile(name_ms, 0.5) << " ms, p99 " << Percentile(name_ms, 0.99)
-              << " ms (" << name_ms.size() << " queries, " << name_hits / name_ms.size() << " readable hits on average)\n";
-  }
-  if (!word_ms.empty()) {
-    std::cout << "word search: median " << Percentile(word_ms, 0.5) << " ms, p99 " << Percentile(word_ms, 0.99) << " ms ("
-              << word_ms.size() << " queries, " << word_hits / word_ms.size() << " readable hits on average)\n";
-  }
+  names_found.Print("name substring search");
+  words_found.Print("word search");
   std::cout << "prefix delete of " << deleted["data"]["deleted"].asInt64() << " documents: " << delete_seconds << " s\n";
   std::cout << "peak memory of the daemon: " << peak_kb / 1024 << " MB\n";
   std::cout << "database after ingest: " << db_bytes / 1048576.0 << " MB; documents as JSON: " << raw_json / 1048576.0

@@ -89,6 +89,31 @@ TEST_F(DaemonTest, WritesBecomeVisibleToSearchesAtCommitButTheWriterSeesThemAtOn
   EXPECT_EQ(answer["data"]["hits"][0]["fields"]["CORVMDTextContent"].asString(), "quarterly figures");
 }
 
+TEST_F(DaemonTest, WordQueriesThroughTheWriterSeeUncommittedWritesInOrder) {
+  // Word-index rows wait for the commit; queries through the writer and the
+  // commit itself must still see every change, in the order it was made.
+  Upsert("/volume1/share/a.txt", "alpha beta");
+  Upsert("/volume1/share/b.txt", "alpha");
+  Json::Value get;
+  get["query"]["qsl"]["match"]["_all"] = "alpha";
+  get["query"]["load_field"].append("CORVMDPath");
+  EXPECT_EQ(Run("document_get_by_query", get)["data"].size(), 2u);
+  Json::Value bad;
+  bad["doc_id"] = "/volume1/share/a.txt";
+  bad["data"]["CORVMDFSSize"] = "not a number";
+  EXPECT_EQ(Run("document_set_by_id", bad)["error"]["code"].asInt(), 2021);
+  Upsert("/volume1/share/a.txt", "gamma");
+  Json::Value del;
+  del["query"]["qsl"]["match"]["_all"] = "alpha";
+  EXPECT_EQ(Run("document_del_by_query", del)["data"]["deleted"].asInt(), 1);
+  Upsert("/volume1/share/c.txt", "beta gamma");
+  Commit();
+  EXPECT_EQ(HitIds(Search(R"({"match": {"_all": "gamma"}})")),
+            std::vector<std::string>({"/volume1/share/a.txt", "/volume1/share/c.txt"}));
+  EXPECT_EQ(HitIds(Search(R"({"match": {"_all": "beta"}})")), std::vector<std::string>({"/volume1/share/c.txt"}));
+  EXPECT_EQ(Search(R"({"match": {"_all": "alpha"}})")["data"]["total"].asInt(), 0);
+}
+
 TEST_F(DaemonTest, UpsertReplacesTheWholeDocument) {
   Upsert("/volume1/share/a.txt", "old words", 5);
   Upsert("/volume1/share/a.txt", "", 7);
