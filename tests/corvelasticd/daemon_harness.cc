@@ -176,7 +176,12 @@ std::string SendRaw(const std::string& socket, const std::string& bytes) {
 }
 
 Json::Value Exchange(int fd, const Json::Value& request) {
-  fileindex::WriteFrame(fd, JsonToString(request));
+  signal(SIGPIPE, SIG_IGN);
+  try {
+    fileindex::WriteFrame(fd, JsonToString(request));
+  } catch (const Error&) {
+    // A refused connection is answered and closed before it is read.
+  }
   std::string text;
   Json::Value answer;
   if (elasticd::ReadRequestFrame(fd, 1u << 30, 20000, 20000, &text) != elasticd::FrameStatus::kOk || !JsonFromString(answer, text)) {
