@@ -26,6 +26,11 @@ bool IsSelfOrAncestor(const std::string& folder_full_path, const std::string& fu
   return StringStartWith(full_path + "/", folder_full_path + "/");
 }
 
+// Matches the folder whose share-form path is exactly `path`.
+auto PathIs(const std::string& path) {
+  return [&path](const std::shared_ptr<Folder>& folder) { return folder->GetPath() == path; };
+}
+
 // Orders two folders by one stored field; negative, zero or positive.
 using FieldCompare = std::function<int(const Folder&, const Folder&)>;
 
@@ -74,7 +79,15 @@ FolderMgr::FolderMgr() {
                         kErrorLoadJson, "Cannot load json: " + path);
   // Valid JSON that is not a list is as unusable as a torn file.
   CORV_CHECK_THROW(!folders.isNull() && !folders.isArray(), kErrorLoadJson, "Cannot load json: " + path);
-  for (const Json::Value& element : folders) folders_.push_back(std::make_shared<Folder>(element));
+  for (const Json::Value& element : folders) {
+    try {
+      folders_.push_back(std::make_shared<Folder>(element));
+    } catch (const Error& error) {
+      // The JSON getters only throw; the line tells the administrator that
+      // it is the folder file that holds the bad entry.
+      CORV_CHECK_THROW_TEXT(true, "make_shared<Folder>(element)", error.code, error.reason);
+    }
+  }
 }
 
 void FolderMgr::Save() const {
@@ -95,40 +108,29 @@ void FolderMgr::Save() const {
 }
 
 void FolderMgr::Get(std::shared_ptr<Folder>& folder, const std::string& path) const {
-  for (const std::shared_ptr<Folder>& candidate : folders_) {
-    if (candidate->GetPath() == path) {
-      folder = candidate;
-      return;
-    }
-  }
-  CORV_CHECK_THROW_TEXT(true, "!HasFolder(path)", kErrorFolderNotFound, "Folder not found: " + path);
+  const auto it = std::find_if(folders_.begin(), folders_.end(), PathIs(path));
+  CORV_CHECK_THROW(it == folders_.end(), kErrorFolderNotFound, "Folder not found: " + path);
+  folder = *it;
 }
 
 bool FolderMgr::HasFolder(const std::string& path) const {
-  return std::any_of(folders_.begin(), folders_.end(),
-                     [&path](const std::shared_ptr<Folder>& folder) { return folder->GetPath() == path; });
+  return std::any_of(folders_.begin(), folders_.end(), PathIs(path));
 }
 
 void FolderMgr::Upsert(std::shared_ptr<Folder>& old, std::shared_ptr<Folder> folder_new) {
   const std::shared_ptr<Folder> cfg = GetMostSuitableCfg(folder_new->GetFullPath());
   old = DiffCfg(folder_new, cfg);
   const std::string& path = folder_new->GetPath();
-  folders_.erase(std::remove_if(folders_.begin(), folders_.end(),
-                                [&path](const std::shared_ptr<Folder>& folder) { return folder->GetPath() == path; }),
-                 folders_.end());
+  folders_.erase(std::remove_if(folders_.begin(), folders_.end(), PathIs(path)), folders_.end());
   folders_.push_back(folder_new);
   CORV_CHECK_THROW(folders_.size() > kFileIndexFoldersMax, kErrorTooManyFolders);
 }
 
 void FolderMgr::Delete(std::shared_ptr<Folder>& removed, const std::string& path) {
-  for (auto it = folders_.begin(); it != folders_.end(); ++it) {
-    if ((*it)->GetPath() == path) {
-      removed = *it;
-      folders_.erase(it);
-      return;
-    }
-  }
-  CORV_CHECK_THROW_TEXT(true, "!HasFolder(path)", kErrorFolderNotFound, "Folder not found: " + path);
+  const auto it = std::find_if(folders_.begin(), folders_.end(), PathIs(path));
+  CORV_CHECK_THROW(it == folders_.end(), kErrorFolderNotFound, "Folder not found: " + path);
+  removed = *it;
+  folders_.erase(it);
 }
 
 std::vector<std::shared_ptr<Folder>> FolderMgr::DeleteByShare(const std::string& share) {

@@ -78,9 +78,15 @@ TEST_F(FolderMgrTest, BadFilesAreRefused) {
   WriteFolders("{\"path\":\"/s/a\"}");
   EXPECT_EQ(ErrorOf([] { FolderMgr(); }).code, kErrorLoadJson);
   WriteFolders("[{\"path\":\"/s/a\",\"name\":\"n\"}]");
+  LogCapture log;
   const Error malformed = ErrorOf([] { FolderMgr(); });
   EXPECT_EQ(malformed.code, kErrorBadArgument);
   EXPECT_EQ(malformed.reason.rfind("Missing property: document", 0), 0u) << malformed.reason;
+  // Logged like every other load failure, from the folder manager.
+  const auto lines = log.Matching("(FolderMgr) Failed [");
+  ASSERT_EQ(lines.size(), 1u);
+  EXPECT_EQ(lines[0].rfind("folder_mgr.cc:", 0), 0u) << lines[0];
+  EXPECT_NE(lines[0].find("], reason: " + malformed.reason), std::string::npos) << lines[0];
 }
 
 TEST_F(FolderMgrTest, GoverningFolderIsTheLongestAncestorOnSlashBoundaries) {
@@ -193,7 +199,11 @@ TEST_F(FolderMgrTest, GetAndDeleteFindExactPaths) {
   std::shared_ptr<Folder> found;
   mgr.Get(found, "/s/b");
   EXPECT_EQ(found->GetPath(), "/s/b");
-  EXPECT_EQ(ErrorOf([&] { mgr.Get(found, "/s/c"); }).code, kErrorFolderNotFound);
+  {
+    LogCapture log;
+    EXPECT_EQ(ErrorOf([&] { mgr.Get(found, "/s/c"); }).code, kErrorFolderNotFound);
+    EXPECT_EQ(log.Matching("(Get) Failed [it == folders_.end()], reason: Folder not found: /s/c").size(), 1u);
+  }
   std::shared_ptr<Folder> removed;
   mgr.Delete(removed, "/s/a");
   EXPECT_EQ(removed->GetPath(), "/s/a");

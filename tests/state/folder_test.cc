@@ -112,6 +112,8 @@ TEST(FolderRecord, AdditionalMustBeAnArrayOfKnownNames) {
     EXPECT_EQ(ErrorOf([&] { folder.GetDataWithAdditional(Parse("[1]")); }).code, kErrorBadArgument);
     EXPECT_EQ(log.Matching("Failed [!it.isString()]").size(), 1u);
   }
+  // An empty object is not an empty list.
+  EXPECT_EQ(ErrorOf([&] { folder.GetDataWithAdditional(Parse("{}")); }).code, kErrorBadArgument);
   const Error unknown = ErrorOf([&] { folder.GetDataWithAdditional(Parse(R"(["size"])")); });
   EXPECT_EQ(unknown.reason, "Unknown additioal: size");
   const Json::Value plain = folder.GetDataWithAdditional(Parse("[]"));
