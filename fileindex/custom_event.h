@@ -14,7 +14,8 @@ namespace fileindex {
 // the share holding `full_path`, under the queue's lock, unless a pending
 // reindex already covers the path. When the share or its queue cannot be
 // resolved, the share is marked for a full reindex and the Error is
-// rethrown. A queue file that cannot be opened loses the event silently.
+// rethrown. A queue file that cannot be opened loses the event silently; a
+// queue lock that cannot be taken is Error 506 (the event is not written).
 void AddCustomEvent(int event, const std::string& full_path, const std::string& path_old, const Json::Value& data);
 
 // Runs the administrators' notification tool with `args`, without a shell;

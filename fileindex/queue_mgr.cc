@@ -113,36 +113,49 @@ bool QueueMgr::IsFullPathHasReindex(const std::string& full_path) {
   return FindQueue(covers, queue_path_) || FindQueue(covers, queue_path_tmp_);
 }
 
-bool AppendQueueLines(const std::string& queue_path, const std::string& lines, std::string* error) {
-  // Without a folder for the queue there is nothing to lock or append to
-  // (and the lock would be refused with a logged failure).
-  const std::string folder = Dirname(queue_path);
-  if (!folder.empty() && !IsDirExist(folder, true)) {
-    *error = "the folder " + folder + " of the queue does not exist";
+namespace {
+
+// Appends `lines` in one write; the caller holds the queue's lock. On failure
+// the file is cut back to its former length, so no half line is left.
+bool AppendLocked(const std::string& queue_path, const std::string& lines, std::string* error) {
+  const int fd = open(queue_path.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC, 0644);
+  if (fd < 0) {
+    *error = std::string("cannot open the queue: ") + strerror(errno);
+    errno = 0;
     return false;
   }
+  struct stat before;
+  bool ok = fstat(fd, &before) == 0;
+  if (!ok) *error = std::string("cannot stat the queue: ") + strerror(errno);
+  if (ok && !WriteWhole(fd, lines)) {
+    ok = false;
+    *error = std::string("write failed: ") + (errno != 0 ? strerror(errno) : "nothing written");
+    // Part of a line would make the reader fail on it: back to the last whole line.
+    if (ftruncate(fd, before.st_size) != 0) *error += std::string(", cut back failed: ") + strerror(errno);
+  }
+  close(fd);
+  errno = 0;
+  return ok;
+}
+
+// Without a folder for the queue there is nothing to lock or append to
+// (and the lock would be refused with a logged failure).
+bool QueueFolderExists(const std::string& queue_path, std::string* error) {
+  const std::string folder = Dirname(queue_path);
+  if (folder.empty() || IsDirExist(folder, true)) return true;
+  *error = "the folder " + folder + " of the queue does not exist";
+  return false;
+}
+
+}  // namespace
+
+bool AppendQueueLines(const std::string& queue_path, const std::string& lines, std::string* error) {
+  if (!QueueFolderExists(queue_path, error)) return false;
   try {
     // The lock makes the append and a take-over (rename) exclusive: a line
     // is either in the file that is taken over or in the next live queue.
     const LockFile lock(queue_path, true);
-    const int fd = open(queue_path.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC, 0644);
-    if (fd < 0) {
-      *error = std::string("cannot open the queue: ") + strerror(errno);
-      errno = 0;
-      return false;
-    }
-    struct stat before;
-    bool ok = fstat(fd, &before) == 0;
-    if (!ok) *error = std::string("cannot stat the queue: ") + strerror(errno);
-    if (ok && !WriteWhole(fd, lines)) {
-      ok = false;
-      *error = std::string("write failed: ") + (errno != 0 ? strerror(errno) : "nothing written");
-      // Part of a line would make the reader fail on it: back to the last whole line.
-      if (ftruncate(fd, before.st_size) != 0) *error += std::string(", cut back failed: ") + strerror(errno);
-    }
-    close(fd);
-    errno = 0;
-    return ok;
+    return AppendLocked(queue_path, lines, error);
   } catch (const Error& lock_error) {
     *error = "cannot lock the queue: " + lock_error.reason;
     errno = 0;
@@ -152,7 +165,20 @@ bool AppendQueueLines(const std::string& queue_path, const std::string& lines, s
 
 bool AppendQueueLine(const std::string& queue_path, const std::string& line) {
   std::string ignored;
-  return AppendQueueLines(queue_path, line + "\n", &ignored);
+  if (!QueueFolderExists(queue_path, &ignored)) return false;
+  // A queue that cannot be opened (even for its lock) loses the line quietly;
+  // a lock that stays held past every retry is an error the caller sees,
+  // since the line could be written a moment later.
+  {
+    const int fd = open(queue_path.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC, 0644);
+    if (fd < 0) {
+      errno = 0;
+      return false;
+    }
+    close(fd);
+  }
+  const LockFile lock(queue_path, true);
+  return AppendLocked(queue_path, line + "\n", &ignored);
 }
 
 }  // namespace fileindex

@@ -66,7 +66,8 @@ class QueueMgr {
 
 // Appends one event line to a queue file under the queue's lock, so that a
 // take-over never loses it. The file is created when missing; false when it
-// cannot be opened or written (nothing is thrown for that).
+// cannot be opened or written (nothing is thrown for that). Error 506 when
+// the lock stays held by others past its retries: the line is not written.
 bool AppendQueueLine(const std::string& queue_path, const std::string& line);
 
 // Appends `lines` (whole lines, each ended by "\n") in one write under the

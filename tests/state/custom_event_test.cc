@@ -1,3 +1,5 @@
+#include <fcntl.h>
+#include <sys/file.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -96,6 +98,25 @@ TEST_F(CustomEventTest, AMissingQueueDirectoryLosesTheEventSilently) {
   EXPECT_FALSE(IsFileExist(queue_));
   EXPECT_TRUE(log.Lines().empty());
   EXPECT_EQ(StatusMgr().GetShareStatus("docs"), 0u);
+}
+
+TEST_F(CustomEventTest, AQueueLockHeldPastEveryRetryIsAnErrorNotASilentLoss) {
+  std::ofstream(queue_) << "";
+  const int holder = open(queue_.c_str(), O_RDONLY);
+  ASSERT_GE(holder, 0);
+  ASSERT_EQ(flock(holder, LOCK_EX), 0);
+  try {
+    AddCustomEvent(kEventCreate, share_ + "/a", "", Json::Value());
+    ADD_FAILURE() << "no throw";
+  } catch (const Error& error) {
+    EXPECT_EQ(error.code, kErrorLockFile);
+  }
+  close(holder);
+  EXPECT_TRUE(Lines(queue_).empty());
+  EXPECT_FALSE(sleeps_.Sleeps().empty()) << "the lock was retried";
+  // Once the lock is free the same call goes through.
+  AddCustomEvent(kEventCreate, share_ + "/a", "", Json::Value());
+  EXPECT_EQ(Lines(queue_).size(), 1u);
 }
 
 // --- Notifications ---
