@@ -1,0 +1,74 @@
+// fileindexd: the indexing daemon. Serves the command socket and runs one
+// worker per indexed share until SIGTERM or SIGINT.
+#include <signal.h>
+#include <unistd.h>
+
+#include <CLI/CLI.hpp>
+#include <cstring>
+#include <iostream>
+
+#include "common/log.h"
+#include "common/sys.h"
+#include "fileindex/constants.h"
+#include "programs/fileindexd/command_server.h"
+#include "programs/fileindexd/daemon.h"
+
+namespace {
+
+corvlumex::fileindexd::CommandServer* g_server = nullptr;
+
+void OnSignal(int) {
+  if (g_server != nullptr) g_server->Stop();
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  using namespace corvlumex;
+  using namespace corvlumex::fileindexd;
+
+  CLI::App app{"fileindexd: keeps the search index of every indexed folder in step with the disk"};
+  std::string socket_path = SysPath(fileindex::kFileIndexDaemonSocketPath);
+  bool log_stderr = false;
+  long settle_ms = 1000, settle_max_ms = 60000, poll_ms = 1000;
+  app.add_option("--socket", socket_path, "command socket (default: <root>/var/run/fileindexd.sock)");
+  app.add_flag("--log-stderr,--foreground", log_stderr, "log to standard error instead of syslog");
+  app.add_option("--settle-ms", settle_ms, "first settle interval of a file that keeps changing")
+      ->check(CLI::Range(0L, 3600000L));
+  app.add_option("--settle-max-ms", settle_max_ms, "longest settle interval")->check(CLI::Range(0L, 86400000L));
+  app.add_option("--poll-ms", poll_ms, "queue poll when its folder cannot be watched")
+      ->check(CLI::Range(10L, 600000L));
+  CLI11_PARSE(app, argc, argv);
+
+  if (log_stderr) SetLogSink([](int, const std::string& line) { std::cerr << line << std::endl; });
+  signal(SIGPIPE, SIG_IGN);
+
+  WorkerOptions options;
+  options.fallback_poll = std::chrono::milliseconds(poll_ms);
+  options.settle.initial = std::chrono::milliseconds(settle_ms);
+  options.settle.ceiling = std::chrono::milliseconds(std::max(settle_ms, settle_max_ms));
+  Daemon daemon(options);
+  CommandServer server(
+      socket_path, [&daemon](const std::string& type, const Json::Value& data) { return daemon.Handle(type, data); },
+      &Daemon::IsReadOnly);
+  try {
+    server.Listen();
+  } catch (const std::exception& error) {
+    std::cerr << "fileindexd: " << error.what() << std::endl;
+    return 1;
+  }
+  g_server = &server;
+  struct sigaction action;
+  memset(&action, 0, sizeof(action));
+  action.sa_handler = OnSignal;
+  sigaction(SIGTERM, &action, nullptr);
+  sigaction(SIGINT, &action, nullptr);
+
+  daemon.Start();
+  CORV_LOG("fileindexd serving %s", socket_path.c_str());
+  server.Run();
+  g_server = nullptr;
+  daemon.Stop();
+  CORV_LOG("fileindexd stopped");
+  return 0;
+}

@@ -1,0 +1,340 @@
+#include "programs/fileindexd/op_applier.h"
+
+#include <sys/stat.h>
+
+#include <cerrno>
+#include <unordered_set>
+
+#include "common/file_util.h"
+#include "common/json_util.h"
+#include "common/log.h"
+#include "fileindex/elastic/elastic_control.h"
+#include "fileindex/elastic/schema.h"
+#include "programs/fileindexd/folder_walker.h"
+
+namespace corvlumex {
+namespace fileindexd {
+namespace elastic = fileindex::elastic;
+
+namespace {
+
+// Codes of the search daemon (docs/corvelasticd.md) that concern the index
+// as a whole.
+constexpr int kSearchBusy = 1400;
+constexpr int kSearchOpening = 1401;
+constexpr int kSearchIndexNotFound = 2010;
+constexpr int kSearchIndexFailed = 2014;
+constexpr int kSearchStorage = 2040;
+constexpr int kSearchNoSpace = 2041;
+constexpr int kSearchDocumentNotFound = 2020;
+
+constexpr char kFieldContentDate[] = "CORVMDFSContentChangeDate";
+constexpr char kFieldAttrDate[] = "CORVMDAttributeChangeDate";
+constexpr char kFieldSize[] = "CORVMDFSSize";
+
+enum class Kind { kMissing, kFile, kDir };
+
+Kind KindOf(const std::string& path, struct stat* st = nullptr) {
+  struct stat local;
+  struct stat* target = st != nullptr ? st : &local;
+  if (lstat(path.c_str(), target) != 0) {
+    errno = 0;
+    return Kind::kMissing;
+  }
+  return S_ISDIR(target->st_mode) ? Kind::kDir : Kind::kFile;
+}
+
+long long IntField(const Json::Value& doc, const char* name) {
+  const Json::Value& value = doc[name];
+  return value.isIntegral() ? value.asInt64() : -1;
+}
+
+}  // namespace
+
+bool IsBatchError(const Error& error) {
+  switch (static_cast<int>(error.code)) {
+    case kErrorSearchRequest:  // the daemon cannot be reached or answered nonsense
+    case kErrorNoSpace:
+    case kSearchBusy:
+    case kSearchOpening:
+    case kSearchIndexNotFound:
+    case kSearchIndexFailed:
+    case kSearchStorage:
+    case kSearchNoSpace:
+      return true;
+    default:
+      return false;
+  }
+}
+
+OpApplier::OpApplier(const std::string& share, const IndexRules& rules, ProgressBoard& progress,
+                     SettleTracker& settle)
+    : share_(share), rules_(rules), progress_(progress), settle_(settle) {}
+
+void OpApplier::Guard(const std::string& what, const std::string& path, const std::function<void()>& step) {
+  try {
+    step();
+  } catch (const Error& error) {
+    if (IsBatchError(error)) throw;
+    progress_.Failed(share_);
+    CORV_LOG("%s of %s skipped: code=%d, reason=%s", what.c_str(), path.c_str(), error.code, error.reason.c_str());
+  }
+}
+
+void OpApplier::Apply(const fileindex::OP& op) {
+  const std::string path = op.node_->GetPath();
+  switch (op.op_) {
+    case fileindex::kOPUpsert: Upsert(path); break;
+    case fileindex::kOPAttr: Attr(path); break;
+    case fileindex::kOPDelete: Delete(path); break;
+    case fileindex::kOPRename: Rename(op.path_, path); break;
+    case fileindex::kOPReindex: Reindex(path); break;
+    case fileindex::kOPUpdateCfg: UpdateCfg(path, op.data_); break;
+    case fileindex::kOPFullReindex: FullReindex(); break;
+    default: break;
+  }
+  progress_.Done(share_);
+}
+
+void OpApplier::UpsertFile(const std::string& path, bool need_meta, bool settle) {
+  if (settle && !settle_.Admit(path, SettleTracker::Clock::now())) return;  // its turn comes later
+  Guard("upsert", path, [&] {
+    elastic::IndexUpsert(share_, path, need_meta);
+    progress_.Extracted(share_);
+  });
+}
+
+void OpApplier::DeleteTree(const std::string& path) {
+  settle_.Forget(path);
+  Guard("delete", path, [&] {
+    elastic::IndexDel(share_, path);
+    elastic::IndexDelDir(share_, path);
+  });
+}
+
+void OpApplier::Upsert(const std::string& path) {
+  const Kind kind = KindOf(path);
+  if (kind == Kind::kMissing) {
+    // Gone again since the event; whatever the index holds of it goes too.
+    DeleteTree(path);
+  } else {
+    const Verdict verdict = rules_.Judge(path, kind == Kind::kDir);
+    if (!verdict.index) {
+      Delete(path);
+    } else {
+      UpsertFile(path, verdict.need_meta, kind == Kind::kFile);
+    }
+  }
+}
+
+void OpApplier::UpsertSettled(const std::string& path) {
+  const Kind kind = KindOf(path);
+  if (kind == Kind::kMissing) return;  // its delete was (or will be) queued
+  const Verdict verdict = rules_.Judge(path, kind == Kind::kDir);
+  if (verdict.index) UpsertFile(path, verdict.need_meta, false);
+}
+
+void OpApplier::Attr(const std::string& path) {
+  const Kind kind = KindOf(path);
+  if (kind == Kind::kMissing) {
+    DeleteTree(path);
+  } else {
+    const Verdict verdict = rules_.Judge(path, kind == Kind::kDir);
+    if (!verdict.index) {
+      Delete(path);
+    } else if (kind == Kind::kDir || settle_.Admit(path, SettleTracker::Clock::now())) {
+      Guard("attribute update", path, [&] {
+        try {
+          elastic::IndexAttr(share_, path);
+          progress_.Extracted(share_);
+        } catch (const Error& error) {
+          // Never stored (its category was off, or its create was lost): store it whole.
+          if (error.code != kSearchDocumentNotFound) throw;
+          elastic::IndexUpsert(share_, path, verdict.need_meta);
+          progress_.Extracted(share_);
+        }
+      });
+    }
+  }
+}
+
+void OpApplier::Delete(const std::string& path) {
+  settle_.Forget(path);
+  Guard("delete", path, [&] { elastic::IndexDel(share_, path); });
+}
+
+bool OpApplier::SameSettings(const std::string& a, const std::string& b, bool is_dir) const {
+  const auto folder_a = rules_.folders().GetMostSuitableCfg(a);
+  const auto folder_b = rules_.folders().GetMostSuitableCfg(b);
+  if (!folder_a || !folder_b) return false;
+  if (is_dir) {
+    return folder_a->IsDocument() == folder_b->IsDocument() && folder_a->IsAudio() == folder_b->IsAudio() &&
+           folder_a->IsVideo() == folder_b->IsVideo() && folder_a->IsPhoto() == folder_b->IsPhoto();
+  }
+  // A file keeps its document when the category of its new name is treated
+  // alike; a changed category (a.txt -> a.mp3) asks for a fresh extraction.
+  return IndexRules::CategoryKey(a) == IndexRules::CategoryKey(b) &&
+         IndexRules::CategoryOn(*folder_a, a) == IndexRules::CategoryOn(*folder_b, b);
+}
+
+void OpApplier::Rename(const std::string& from, const std::string& to) {
+  const Kind kind = KindOf(to);
+  const bool is_dir = kind == Kind::kDir;
+  const bool from_indexed = rules_.folders().GetMostSuitableCfg(from) && !rules_.IsExcluded(from);
+  const Verdict verdict = rules_.Judge(to, is_dir);
+  settle_.Forget(from);
+  if (kind != Kind::kMissing && !verdict.index) {
+    // Moved where nothing is indexed (a recycle bin, a hidden folder, a
+    // category switched off): its documents leave the index.
+    DeleteTree(from);
+    DeleteTree(to);
+    return;
+  }
+  bool moved = false;
+  if (from_indexed) {
+    Guard("rename", from, [&] {
+      try {
+        elastic::IndexRename(share_, from, to);
+        moved = true;
+      } catch (const Error& error) {
+        // Nothing stored under the old name (it was never indexed, or the
+        // queue folded a chain of renames): the new place is read from disk.
+        if (error.code != kSearchDocumentNotFound) throw;
+      }
+    });
+  }
+  if (kind == Kind::kMissing) {
+    // Moved on again already; the event that moved it is queued behind this one.
+    return;
+  }
+  if (!moved) {
+    DeleteTree(from);
+    if (is_dir) {
+      Reindex(to);
+    } else {
+      Upsert(to);
+    }
+    return;
+  }
+  if (is_dir) {
+    // Checks the moved documents against the disk; unchanged files are not
+    // extracted again, so this costs a walk and one query.
+    Reindex(to);
+  } else if (!SameSettings(from, to, false)) {
+    Upsert(to);
+  }
+}
+
+std::unordered_map<std::string, OpApplier::Stamp> OpApplier::LoadIndexed(const std::string& prefix) {
+  Json::Value req(Json::objectValue);
+  req["command"] = "document_get_by_query";
+  req["data"]["id"] = elastic::GetFileIndexID(share_);
+  req["data"]["query"]["qsl"]["prefix"][elastic::kFieldPath] = prefix + "/";
+  Json::Value fields(Json::arrayValue);
+  for (const char* field : {elastic::kFieldPath, kFieldContentDate, kFieldAttrDate, kFieldSize}) fields.append(field);
+  req["data"]["query"]["load_field"] = fields;
+  Json::Value res;
+  elastic::SendRequestWithRetry(res, req);
+  std::unordered_map<std::string, Stamp> indexed;
+  const Json::Value& docs = res["data"];
+  CORV_CHECK_THROW(!docs.isArray(), kErrorQueryAnswer, "Malformed answer to the documents below " + prefix);
+  indexed.reserve(docs.size());
+  for (const Json::Value& doc : docs) {
+    if (!doc[elastic::kFieldPath].isString()) continue;
+    indexed[doc[elastic::kFieldPath].asString()] =
+        Stamp{IntField(doc, kFieldContentDate), IntField(doc, kFieldAttrDate), IntField(doc, kFieldSize)};
+  }
+  return indexed;
+}
+
+void OpApplier::Resync(const std::vector<std::string>& roots, const std::string& index_prefix) {
+  std::unordered_map<std::string, Stamp> indexed = LoadIndexed(index_prefix);
+  std::unordered_set<std::string> keep;
+  const auto skip_dir = [this](const std::string& dir) { return rules_.IsExcluded(dir); };
+  for (const std::string& root : roots) {
+    const std::vector<DiskEntry> entries = WalkFolder(root, skip_dir);
+    if (entries.empty()) continue;
+    progress_.AddTodo(share_, entries.size());
+    for (const DiskEntry& entry : entries) {
+      CheckInterrupt();
+      const Verdict verdict = rules_.Judge(entry.path, entry.is_dir);
+      if (verdict.index) {
+        keep.insert(entry.path);
+        struct stat st;
+        const auto stored = indexed.find(entry.path);
+        const bool unchanged = stored != indexed.end() && lstat(entry.path.c_str(), &st) == 0 &&
+                               stored->second.mtime == st.st_mtime && stored->second.ctime == st.st_ctime &&
+                               stored->second.size == st.st_size;
+        errno = 0;
+        if (!unchanged) UpsertFile(entry.path, verdict.need_meta, false);
+      }
+      progress_.Done(share_);
+    }
+  }
+  for (const auto& [path, stamp] : indexed) {
+    if (keep.count(path) != 0) continue;
+    CheckInterrupt();
+    settle_.Forget(path);
+    Guard("delete", path, [&] { elastic::IndexDel(share_, path); });
+  }
+}
+
+void OpApplier::Reindex(const std::string& path) {
+  const Kind kind = KindOf(path);
+  if (kind == Kind::kMissing || !rules_.Judge(path, kind == Kind::kDir).index) {
+    DeleteTree(path);
+    return;
+  }
+  if (kind == Kind::kFile) {
+    Upsert(path);
+    return;
+  }
+  Resync({path}, path);
+}
+
+void OpApplier::UpdateCfg(const std::string& path, const Json::Value& changed) {
+  bool all = true;
+  std::unordered_set<std::string> categories;
+  for (const char* key : {"document", "audio", "video", "photo"}) {
+    bool on = false;
+    GetJsonValue(on, changed, key, false);
+    if (on) categories.insert(key);
+    all = all && on;
+  }
+  if (all) {
+    // A new folder: everything in it, with the files of no category.
+    Reindex(path);
+    return;
+  }
+  const auto skip_dir = [this](const std::string& dir) { return rules_.IsExcluded(dir); };
+  const std::vector<DiskEntry> entries = WalkFolder(path, skip_dir);
+  progress_.AddTodo(share_, entries.size());
+  for (const DiskEntry& entry : entries) {
+    CheckInterrupt();
+    if (!entry.is_dir && categories.count(IndexRules::CategoryKey(entry.path)) != 0) {
+      const Verdict verdict = rules_.Judge(entry.path, false);
+      if (verdict.index) {
+        UpsertFile(entry.path, verdict.need_meta, false);
+      } else {
+        settle_.Forget(entry.path);
+        Guard("delete", entry.path, [&] { elastic::IndexDel(share_, entry.path); });
+      }
+    }
+    progress_.Done(share_);
+  }
+}
+
+void OpApplier::FullReindex() {
+  // The outermost folders of the share; nested ones are walked with them.
+  std::vector<std::string> roots;
+  for (const auto& folder : rules_.folders().Folders()) {
+    if (folder->GetShare() != share_) continue;
+    const std::string full = folder->GetFullPath();
+    const auto governing_parent = rules_.folders().GetMostSuitableCfg(Dirname(full));
+    if (!governing_parent) roots.push_back(full);
+  }
+  Resync(roots, rules_.share_dir());
+}
+
+}  // namespace fileindexd
+}  // namespace corvlumex

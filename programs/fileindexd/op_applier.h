@@ -1,0 +1,90 @@
+// Applies the operations of a share's queue to the share's index. The table
+// from operation kind to index commands is in docs/system.md; in short:
+//
+//   upsert      the file is extracted and stored (deleted when it vanished
+//               or is no longer to be indexed)
+//   attr        its file-system fields are refreshed
+//   delete      its document is deleted
+//   rename      the documents move (IndexRename), then a folder is checked
+//               against the disk, so a chain of renames folded by the queue
+//               still ends with exactly what is on disk
+//   reindex     the folder is walked: what is there is stored, documents
+//               of what is no longer there are deleted
+//   settings    the files of the categories switched on are stored, those
+//               of the categories switched off are deleted
+//   full        every folder of the share is walked
+//
+// Errors of one file are logged and skipped; errors of the search daemon
+// itself (unreachable, index missing or broken) leave Apply so the batch is
+// tried again, since skipping them would lose work.
+#pragma once
+
+#include <json/json.h>
+
+#include <functional>
+#include <memory>
+#include <string>
+#include <unordered_map>
+#include <vector>
+
+#include "common/error.h"
+#include "fileindex/optree.h"
+#include "programs/fileindexd/index_rules.h"
+#include "programs/fileindexd/progress.h"
+#include "programs/fileindexd/settle_tracker.h"
+
+namespace corvlumex {
+namespace fileindexd {
+
+// Thrown from the interrupt check when the worker must stop or pause.
+struct BatchInterrupted {};
+
+// True for failures that concern the whole index or the search daemon
+// rather than one file: the batch must be retried, not skipped.
+bool IsBatchError(const Error& error);
+
+class OpApplier {
+ public:
+  OpApplier(const std::string& share, const IndexRules& rules, ProgressBoard& progress, SettleTracker& settle);
+
+  // Called between files of long walks; throws BatchInterrupted to stop.
+  void SetInterruptCheck(std::function<void()> check) { interrupt_check_ = std::move(check); }
+
+  // One operation of the queue. Throws only batch errors and BatchInterrupted.
+  void Apply(const fileindex::OP& op);
+
+  void Upsert(const std::string& path);
+  void Attr(const std::string& path);
+  void Delete(const std::string& path);
+  void Rename(const std::string& from, const std::string& to);
+  void Reindex(const std::string& path);
+  void UpdateCfg(const std::string& path, const Json::Value& changed);
+  void FullReindex();
+  // A file whose settle interval has passed.
+  void UpsertSettled(const std::string& path);
+
+ private:
+  struct Stamp {
+    long long mtime = -1, ctime = -1, size = -1;
+  };
+  // Runs one file's step; a per-file error is logged and counted.
+  void Guard(const std::string& what, const std::string& path, const std::function<void()>& step);
+  void UpsertFile(const std::string& path, bool need_meta, bool settle);
+  void DeleteTree(const std::string& path);
+  // Walks `roots` and makes the documents below `index_prefix` match them.
+  void Resync(const std::vector<std::string>& roots, const std::string& index_prefix);
+  std::unordered_map<std::string, Stamp> LoadIndexed(const std::string& prefix);
+  bool SameSettings(const std::string& a, const std::string& b, bool is_dir) const;
+  void CheckInterrupt() {
+    if (interrupt_check_) interrupt_check_();
+  }
+
+  std::string share_;
+  const IndexRules& rules_;
+  ProgressBoard& progress_;
+  SettleTracker& settle_;
+  std::function<void()> interrupt_check_;
+};
+
+}  // namespace fileindexd
+}  // namespace corvlumex

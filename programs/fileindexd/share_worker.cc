@@ -1,0 +1,177 @@
+#include "programs/fileindexd/share_worker.h"
+
+#include <time.h>
+
+#include <algorithm>
+
+#include "common/error.h"
+#include "common/file_util.h"
+#include "common/log.h"
+#include "fileindex/constants.h"
+#include "fileindex/custom_event.h"
+#include "fileindex/elastic/elastic_control.h"
+#include "fileindex/folder_mgr.h"
+#include "fileindex/index_mgr.h"
+#include "fileindex/optree.h"
+#include "fileindex/queue_mgr.h"
+#include "fileindex/status_mgr.h"
+#include "programs/fileindexd/index_rules.h"
+#include "programs/fileindexd/op_applier.h"
+#include "sdk/share.h"
+
+namespace corvlumex {
+namespace fileindexd {
+namespace {
+
+constexpr int kSearchIndexNotFound = 2010;
+// Saved beside the queue: the files whose extraction waits out their settle interval.
+constexpr char kSettleSuffix[] = ".settle";
+
+long long Now() { return static_cast<long long>(time(nullptr)); }
+
+}  // namespace
+
+ShareWorker::ShareWorker(const std::string& share, WorkerOptions options, PauseState& pause, ProgressBoard& progress)
+    : share_(share), options_(options), pause_(pause), progress_(progress) {
+  // An unknown share throws here (Error 800): no worker for it.
+  queue_path_ = sdk::SDKShare(share).GetQueuePath();
+  watch_ = std::make_unique<QueueWatch>(queue_path_, options_.fallback_poll);
+  settle_ = std::make_unique<SettleTracker>(queue_path_ + kSettleSuffix, options_.settle);
+}
+
+ShareWorker::~ShareWorker() { Stop(); }
+
+void ShareWorker::Start() {
+  progress_.SetState(share_, kStateIdle);
+  thread_ = std::thread([this] { Run(); });
+}
+
+void ShareWorker::Stop() {
+  stopping_ = true;
+  watch_->Wake();
+  if (thread_.joinable()) thread_.join();
+}
+
+void ShareWorker::CheckInterrupt() const {
+  if (stopping_ || pause_.IsPaused(Now())) throw BatchInterrupted{};
+}
+
+void ShareWorker::Run() {
+  settle_->Load();
+  std::chrono::milliseconds backoff{0};
+  while (!stopping_) {
+    long long until = -1;
+    if (pause_.IsPaused(Now(), &until)) {
+      progress_.SetState(share_, kStatePaused, until == 0 ? "" : "until " + std::to_string(until));
+      const long long left = until == 0 ? 3600 : std::max(1LL, until - Now());
+      watch_->Wait(std::chrono::seconds(std::min(left, 3600LL)));
+      continue;
+    }
+    bool worked = false;
+    try {
+      worked = RunOnce();
+      backoff = std::chrono::milliseconds(0);
+    } catch (const BatchInterrupted&) {
+      continue;
+    } catch (const Error& error) {
+      if (error.code == kErrorNoSpace) {
+        // The index cannot be written: stop here, tell the administrators.
+        // The share is marked for a full reindex (IndexCommit did), which the
+        // next worker of this share runs once there is room again.
+        CORV_LOG("indexing of share %s stopped: %s", share_.c_str(), error.reason.c_str());
+        progress_.SetState(share_, kStateNoSpace, error.reason);
+        fileindex::SendVXMNotify();
+        finished_ = true;
+        return;
+      }
+      OnFailure(error, backoff);
+      continue;
+    } catch (const std::exception& error) {
+      OnFailure(Error(kErrorUnexpected, error.what()), backoff);
+      continue;
+    }
+    if (worked) continue;
+    progress_.SetState(share_, kStateIdle);
+    progress_.SetDeferred(share_, settle_->DeferredCount());
+    const auto now = SettleTracker::Clock::now();
+    const auto next_due = settle_->NextDue();
+    std::chrono::milliseconds timeout = std::chrono::minutes(10);
+    if (next_due != SettleTracker::Clock::time_point::max()) {
+      timeout = std::min(timeout, std::max(std::chrono::milliseconds(1),
+                                           std::chrono::duration_cast<std::chrono::milliseconds>(next_due - now)));
+    }
+    watch_->Wait(timeout);
+  }
+  progress_.SetState(share_, kStateStopped);
+}
+
+void ShareWorker::OnFailure(const Error& error, std::chrono::milliseconds& backoff) {
+  CORV_LOG("indexing of share %s failed, retrying: code=%d, reason=%s", share_.c_str(), error.code,
+           error.reason.c_str());
+  if (error.code == kSearchIndexNotFound) {
+    // The search daemon lost the share's index: make it again and rebuild it
+    // whole, unless the share stopped being indexed meanwhile.
+    try {
+      if (fileindex::FolderMgr().IsShareIndexed(share_)) {
+        fileindex::elastic::ShareIndexCreate(share_);
+        fileindex::StatusMgr().SetShareStatus(share_, fileindex::kShareStatusNeedReindex);
+      }
+    } catch (const Error& again) {
+      CORV_LOG("cannot recreate the index of share %s: %s", share_.c_str(), again.reason.c_str());
+    }
+  }
+  backoff = std::min(options_.retry_max, std::max(options_.retry_first, backoff * 2));
+  progress_.SetState(share_, kStateRetrying, "code " + std::to_string(error.code) + ": " + error.reason);
+  watch_->Wait(backoff);
+}
+
+bool ShareWorker::RunOnce() {
+  const fileindex::FolderMgr folders;
+  const unsigned int status = fileindex::StatusMgr().GetShareStatus(share_);
+  if (!folders.IsShareIndexed(share_) || (status & fileindex::kShareStatusPauseMask) != 0) {
+    return false;  // the daemon stops this worker when told; nothing to do meanwhile
+  }
+  const IndexRules rules(folders, sdk::SDKShare(share_).GetPath());
+  OpApplier applier(share_, rules, progress_, *settle_);
+  applier.SetInterruptCheck([this] { CheckInterrupt(); });
+  bool worked = false;
+
+  if (status & fileindex::kShareStatusNeedReindex) {
+    progress_.StartBatch(share_, 1);
+    applier.FullReindex();
+    progress_.Done(share_);
+    fileindex::elastic::IndexCommit(share_);
+    fileindex::StatusMgr().UnsetShareStatus(share_, fileindex::kShareStatusNeedReindex);
+    progress_.EndBatch(share_);
+    worked = true;
+  }
+
+  fileindex::QueueMgr queue(queue_path_);
+  std::vector<std::shared_ptr<fileindex::OP>> ops;
+  queue.ProcessOP([&ops](std::shared_ptr<fileindex::OP> op) { ops.push_back(std::move(op)); }, true);
+  const bool taken_over = IsFileExist(queue.GetQueuePathTmp());
+  const auto now = SettleTracker::Clock::now();
+  std::vector<std::string> due = settle_->DueNow(now);
+  if (!taken_over && due.empty()) return worked;
+
+  progress_.StartBatch(share_, ops.size() + due.size());
+  for (const auto& op : ops) {
+    CheckInterrupt();
+    applier.Apply(*op);
+  }
+  for (const std::string& path : due) {
+    applier.UpsertSettled(path);
+    progress_.Done(share_);
+  }
+  fileindex::elastic::IndexCommit(share_);
+  settle_->Confirm(due, SettleTracker::Clock::now());
+  // The deferred files must be on disk before the queue that named them goes.
+  CORV_CHECK_THROW(!settle_->Save(), kErrorSaveJson, "Failed to save json: " + queue_path_ + kSettleSuffix);
+  if (taken_over) queue.DeleteTmp();
+  progress_.EndBatch(share_);
+  progress_.SetDeferred(share_, settle_->DeferredCount());
+  return true;
+}
+
+}  // namespace fileindexd
+}  // namespace corvlumex

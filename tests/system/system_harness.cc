@@ -1,0 +1,247 @@
+#include "tests/system/system_harness.h"
+
+#include <fcntl.h>
+#include <signal.h>
+#include <stdlib.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+#include <thread>
+
+#include "common/error.h"
+#include "common/json_util.h"
+#include "fileindex/elastic/elastic_control.h"
+#include "fileindex/index_mgr.h"
+#include "tests/system/cli_runner.h"
+
+namespace corvlumex {
+namespace testing_support {
+namespace fs = std::filesystem;
+
+namespace {
+
+std::string ProgramPath(const std::string& name) {
+  const char* build = getenv("FILEINDEX_BUILD_DIR");
+  return std::string(build != nullptr ? build : ".") + "/programs/" + name + "/" + name;
+}
+
+bool WaitForSocket(const std::string& path) {
+  return PollUntil([&] { return access(path.c_str(), F_OK) == 0; }, std::chrono::seconds(20));
+}
+
+Json::Value FolderObject(const std::string& relative, bool document, bool audio, bool video, bool photo) {
+  Json::Value folder(Json::objectValue);
+  folder["path"] = relative.empty() ? "/share" : "/share/" + relative;
+  folder["name"] = relative.empty() ? "share" : relative;
+  folder["document"] = document;
+  folder["audio"] = audio;
+  folder["video"] = video;
+  folder["photo"] = photo;
+  Json::Value list(Json::arrayValue);
+  list.append(folder);
+  return list;
+}
+
+}  // namespace
+
+bool PollUntil(const std::function<bool()>& condition, std::chrono::milliseconds timeout) {
+  const auto deadline = std::chrono::steady_clock::now() + timeout;
+  for (;;) {
+    if (condition()) return true;
+    if (std::chrono::steady_clock::now() >= deadline) return false;
+    std::this_thread::sleep_for(std::chrono::milliseconds(10));
+  }
+}
+
+void WriteText(const std::string& path, const std::string& content) {
+  std::ofstream out(path, std::ios::binary | std::ios::trunc);
+  out << content;
+}
+
+DaemonProcess::DaemonProcess(const std::string& program, const std::vector<std::string>& args,
+                             const std::string& log_path, const std::map<std::string, std::string>& env)
+    : log_path_(log_path) {
+  const std::string path = ProgramPath(program);
+  std::vector<std::string> words{path};
+  words.insert(words.end(), args.begin(), args.end());
+  pid_ = fork();
+  if (pid_ == 0) {
+    for (const auto& [key, value] : env) setenv(key.c_str(), value.c_str(), 1);
+    const int log = open(log_path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
+    dup2(log, STDOUT_FILENO);
+    dup2(log, STDERR_FILENO);
+    std::vector<char*> argv;
+    for (std::string& word : words) argv.push_back(&word[0]);
+    argv.push_back(nullptr);
+    execv(path.c_str(), argv.data());
+    _exit(127);
+  }
+}
+
+DaemonProcess::~DaemonProcess() {
+  if (pid_ > 0) Stop(SIGKILL);
+}
+
+int DaemonProcess::Stop(int signal) {
+  if (pid_ <= 0) return -1;
+  kill(pid_, signal);
+  int status = 0;
+  waitpid(pid_, &status, 0);
+  pid_ = -1;
+  return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+}
+
+std::string DaemonProcess::Log() const {
+  std::ifstream in(log_path_);
+  std::stringstream text;
+  text << in.rdbuf();
+  return text.str();
+}
+
+SystemSandbox::SystemSandbox() {
+  // tmpfs keeps bursts of file changes quick; the root holds everything else.
+  std::string pattern = access("/dev/shm", W_OK) == 0 ? "/dev/shm/fileindex-system-XXXXXX" : root() + "/volXXXXXX";
+  volume_ = mkdtemp(&pattern[0]) != nullptr ? pattern : root() + "/volume1";
+  share_dir_ = volume_ + "/share";
+  fs::create_directories(share_dir_);
+  root_.MakeDir("var/run");
+  root_.MakeDir("tmp");
+  root_.MakeDir("var/packages/CorvLumex/etc");
+  root_.WriteFile("etc/corvlumex/shares.json", "[{\"name\": \"share\", \"path\": \"" + share_dir_ + "\"}]\n");
+}
+
+SystemSandbox::~SystemSandbox() {
+  indexer_.reset();
+  notifier_.reset();
+  search_daemon_.reset();
+  std::error_code ignored;
+  fs::remove_all(volume_, ignored);
+}
+
+void SystemSandbox::StartAll(const std::vector<std::string>& indexer_args,
+                             const std::map<std::string, std::string>& notifier_env) {
+  search_daemon_ = std::make_unique<DaemonProcess>("corvelasticd", std::vector<std::string>{"--log-stderr"},
+                                                   root() + "/corvelasticd.log");
+  if (!WaitForSocket(root() + "/var/run/corvelasticd.sock")) throw Error(kErrorSystem, "corvelasticd did not start");
+  notifier_ = std::make_unique<DaemonProcess>("corvnotifyd", std::vector<std::string>{"--foreground"},
+                                              root() + "/corvnotifyd.log", notifier_env);
+  StartIndexer(indexer_args);
+}
+
+void SystemSandbox::StartIndexer(const std::vector<std::string>& args) {
+  if (!args.empty() || indexer_args_.empty()) indexer_args_ = args;
+  std::vector<std::string> words{"--foreground"};
+  words.insert(words.end(), indexer_args_.begin(), indexer_args_.end());
+  indexer_ = std::make_unique<DaemonProcess>("fileindexd", words, root() + "/fileindexd.log");
+  if (!WaitForSocket(root() + "/var/run/fileindexd.sock")) throw Error(kErrorSystem, "fileindexd did not start");
+}
+
+void SystemSandbox::StopIndexer(int signal) {
+  indexer_->Stop(signal);
+  indexer_.reset();
+}
+
+std::string SystemSandbox::Logs() const {
+  std::string text;
+  for (const char* name : {"corvelasticd", "corvnotifyd", "fileindexd"}) {
+    std::ifstream in(root() + "/" + name + ".log");
+    std::stringstream content;
+    content << in.rdbuf();
+    text += std::string("---- ") + name + "\n" + content.str();
+  }
+  return text;
+}
+
+void SystemSandbox::AddFolder(const std::string& relative, bool document, bool audio, bool video, bool photo) {
+  fileindex::FolderAdd(FolderObject(relative, document, audio, video, photo), false);
+}
+
+void SystemSandbox::SetFolder(const std::string& relative, bool document, bool audio, bool video, bool photo) {
+  fileindex::FolderSet(FolderObject(relative, document, audio, video, photo), false);
+}
+
+std::set<std::string> SystemSandbox::Search(const std::string& words, const std::string& field) const {
+  Json::Value qsl(Json::objectValue);
+  if (words.empty()) {
+    qsl["match_all"] = Json::Value(Json::objectValue);
+  } else {
+    qsl["match"][field]["query"] = words;
+    qsl["match"][field]["operator"] = "and";
+  }
+  return Query(qsl);
+}
+
+std::set<std::string> SystemSandbox::SearchTerm(const std::string& field, const std::string& value) const {
+  Json::Value qsl(Json::objectValue);
+  qsl["term"][field] = value;
+  return Query(qsl);
+}
+
+std::set<std::string> SystemSandbox::Query(const Json::Value& qsl) const {
+  std::set<std::string> paths;
+  constexpr int kPage = 1000;
+  for (int from = 0;; from += kPage) {
+    Json::Value request(Json::objectValue);
+    request["command"] = "search";
+    request["data"]["ids"].append(fileindex::elastic::GetFileIndexID("share"));
+    request["data"]["query"]["qsl"] = qsl;
+    request["data"]["sort"] = "_key";
+    request["data"]["from"] = from;
+    request["data"]["size"] = kPage;
+    request["data"]["load_field"].append("CORVMDPath");
+    Json::Value answer;
+    try {
+      fileindex::elastic::SendRequestWithRetry(answer, request);
+    } catch (const Error& error) {
+      return {"<search failed: " + error.reason + ">"};
+    }
+    const Json::Value& hits = answer["data"]["hits"];
+    for (const Json::Value& hit : hits) paths.insert(hit["fields"]["CORVMDPath"].asString());
+    if (hits.size() < static_cast<unsigned>(kPage)) return paths;
+  }
+}
+
+std::set<std::string> SystemSandbox::IndexedPaths() const { return Search(""); }
+
+std::set<std::string> SystemSandbox::DiskPaths(const std::string& relative,
+                                               const std::function<bool(const std::string&)>& exclude) const {
+  std::set<std::string> paths;
+  const std::string top = relative.empty() ? share_dir_ : Path(relative);
+  if (!fs::exists(fs::symlink_status(top))) return paths;
+  paths.insert(top);
+  for (auto it = fs::recursive_directory_iterator(top); it != fs::recursive_directory_iterator(); ++it) {
+    const std::string path = it->path().string();
+    const std::string name = it->path().filename().string();
+    if (name == "@eaDir" || name == "#recycle" || (exclude && exclude(path))) {
+      if (it->is_directory()) it.disable_recursion_pending();
+      continue;
+    }
+    paths.insert(path);
+  }
+  return paths;
+}
+
+std::string SystemSandbox::Converge(const std::set<std::string>& expected, std::chrono::milliseconds timeout) const {
+  std::set<std::string> indexed;
+  if (PollUntil([&] { return (indexed = IndexedPaths()) == expected; }, timeout)) return "";
+  std::string report = "index differs from the disk\n";
+  for (const auto& path : expected) {
+    if (indexed.count(path) == 0) report += "  missing: " + path + "\n";
+  }
+  for (const auto& path : indexed) {
+    if (expected.count(path) == 0) report += "  stale:   " + path + "\n";
+  }
+  return report + "status: " + IndexerStatus() + "\n" + Logs();
+}
+
+std::string SystemSandbox::IndexerStatus() const {
+  CliResult result = RunCli({"--json", "status"});
+  return result.out;
+}
+
+}  // namespace testing_support
+}  // namespace corvlumex

@@ -1,0 +1,104 @@
+// The whole system in a sandbox root for end-to-end tests: a share "share"
+// (on tmpfs when there is one), the real corvelasticd, corvnotifyd and
+// fileindexd started as child processes on the sandbox's private sockets,
+// the management operations called in-process, and the index read back the
+// way a user sees it: through corvelasticd's "search" command.
+#pragma once
+
+#include <json/json.h>
+#include <sys/types.h>
+
+#include <chrono>
+#include <functional>
+#include <map>
+#include <memory>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "tests/support/log_capture.h"
+
+namespace corvlumex {
+namespace testing_support {
+
+// Polls `condition` every 10 ms until it holds or `timeout` passes.
+bool PollUntil(const std::function<bool()>& condition, std::chrono::milliseconds timeout);
+
+// One of the system's programs, started from the build folder with standard
+// error into a log file.
+class DaemonProcess {
+ public:
+  DaemonProcess(const std::string& program, const std::vector<std::string>& args, const std::string& log_path,
+                const std::map<std::string, std::string>& env = {});
+  ~DaemonProcess();  // SIGKILL when still running
+  // Sends `signal` and waits; the exit status, or 128 + the signal.
+  int Stop(int signal);
+  pid_t pid() const { return pid_; }
+  std::string Log() const;
+
+ private:
+  pid_t pid_ = -1;
+  std::string log_path_;
+};
+
+class SystemSandbox {
+ public:
+  SystemSandbox();
+  ~SystemSandbox();
+
+  const std::string& root() const { return root_.path(); }
+  const std::string& share_dir() const { return share_dir_; }  // the share "share"
+  std::string Path(const std::string& relative) const { return share_dir_ + "/" + relative; }
+
+  // Starts the three daemons (fileindexd with `indexer_args`) and waits for
+  // their sockets.
+  void StartAll(const std::vector<std::string>& indexer_args = {},
+                const std::map<std::string, std::string>& notifier_env = {});
+  void StartIndexer(const std::vector<std::string>& args = {});
+  // kill -9 (or another signal) of fileindexd.
+  void StopIndexer(int signal);
+  DaemonProcess& indexer() { return *indexer_; }
+  std::string Logs() const;
+
+  // FolderAdd of /share/<relative> (relative may be empty: the whole share)
+  // with the four categories.
+  void AddFolder(const std::string& relative, bool document = true, bool audio = true, bool video = true,
+                 bool photo = true);
+  void SetFolder(const std::string& relative, bool document, bool audio, bool video, bool photo);
+
+  // Every document path of the share's index, as a search shows it.
+  std::set<std::string> IndexedPaths() const;
+  // Paths of a search of `words` in `field` ("_all", "CORVMDTextContent", ...).
+  std::set<std::string> Search(const std::string& words, const std::string& field = "_all") const;
+  // Paths whose `field` holds exactly `value` (a keyword field).
+  std::set<std::string> SearchTerm(const std::string& field, const std::string& value) const;
+  // Everything at or below /share/<relative> on disk, the hidden metadata
+  // folder and what `exclude` says true for left out.
+  std::set<std::string> DiskPaths(const std::string& relative,
+                                  const std::function<bool(const std::string&)>& exclude = nullptr) const;
+
+  // Polls until the index holds exactly `expected`; on a timeout the
+  // differences are reported through the returned text (empty = converged).
+  std::string Converge(const std::set<std::string>& expected,
+                       std::chrono::milliseconds timeout = std::chrono::seconds(30)) const;
+
+  // fileindexd's answer to "status".
+  std::string IndexerStatus() const;
+
+ private:
+  std::set<std::string> Query(const Json::Value& qsl) const;
+
+  SandboxRoot root_;
+  std::string volume_;
+  std::string share_dir_;
+  std::unique_ptr<DaemonProcess> search_daemon_;
+  std::unique_ptr<DaemonProcess> notifier_;
+  std::unique_ptr<DaemonProcess> indexer_;
+  std::vector<std::string> indexer_args_;
+};
+
+// Writes `content` to `path` (created or truncated).
+void WriteText(const std::string& path, const std::string& content);
+
+}  // namespace testing_support
+}  // namespace corvlumex
