@@ -1,0 +1,229 @@
+// The parts of fileindexd on their own: the settle tracker, the indexing
+// rules, the folder walk, the command answers and the progress board.
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <filesystem>
+#include <fstream>
+
+#include "common/error.h"
+#include "common/file_util.h"
+#include "common/json_util.h"
+#include "fileindex/folder_mgr.h"
+#include "programs/fileindexd/command_server.h"
+#include "programs/fileindexd/folder_walker.h"
+#include "programs/fileindexd/index_rules.h"
+#include "programs/fileindexd/progress.h"
+#include "programs/fileindexd/settle_tracker.h"
+#include "tests/support/log_capture.h"
+
+namespace corvlumex {
+namespace fileindexd {
+namespace {
+namespace fs = std::filesystem;
+using testing_support::SandboxRoot;
+using std::chrono::milliseconds;
+using Clock = SettleTracker::Clock;
+
+SettleOptions Options() {
+  SettleOptions options;
+  options.initial = milliseconds(1000);
+  options.ceiling = milliseconds(3000);
+  return options;
+}
+
+TEST(SettleTrackerTest, ThirdChangeWithinTheIntervalWaitsAndTheIntervalGrows) {
+  SandboxRoot root;
+  SettleTracker tracker(root.path() + "/q.settle", Options());
+  const Clock::time_point t0 = Clock::now();
+  EXPECT_TRUE(tracker.Admit("/v/s/log", t0));                    // the create
+  EXPECT_TRUE(tracker.Admit("/v/s/log", t0 + milliseconds(10)));  // its first write
+  EXPECT_FALSE(tracker.Admit("/v/s/log", t0 + milliseconds(20)));
+  EXPECT_FALSE(tracker.Admit("/v/s/log", t0 + milliseconds(30)));  // already waiting
+  EXPECT_EQ(tracker.DeferredCount(), 1u);
+  EXPECT_TRUE(tracker.DueNow(t0 + milliseconds(500)).empty());
+  // Due one interval after the last extraction.
+  EXPECT_EQ(tracker.NextDue(), t0 + milliseconds(10) + milliseconds(1000));
+  const auto due = tracker.DueNow(t0 + milliseconds(1010));
+  ASSERT_EQ(due, std::vector<std::string>{"/v/s/log"});
+  tracker.Confirm(due, t0 + milliseconds(1010));
+  EXPECT_EQ(tracker.DeferredCount(), 0u);
+  // Still noisy: the next change within the (now doubled) interval waits 2 s.
+  EXPECT_FALSE(tracker.Admit("/v/s/log", t0 + milliseconds(1100)));
+  EXPECT_EQ(tracker.NextDue(), t0 + milliseconds(1010) + milliseconds(2000));
+}
+
+TEST(SettleTrackerTest, QuietFilesStartOverAndForgottenFilesLeave) {
+  SandboxRoot root;
+  SettleTracker tracker(root.path() + "/q.settle", Options());
+  const Clock::time_point t0 = Clock::now();
+  tracker.Admit("/a", t0);
+  tracker.Admit("/a", t0);
+  EXPECT_FALSE(tracker.Admit("/a", t0));
+  tracker.Forget("/a");
+  EXPECT_EQ(tracker.DeferredCount(), 0u);
+  EXPECT_EQ(tracker.NextDue(), Clock::time_point::max());
+  EXPECT_TRUE(tracker.Admit("/b", t0));
+  EXPECT_TRUE(tracker.Admit("/b", t0 + milliseconds(1)));
+  // Quiet for twice its interval: admitted at once, twice again.
+  EXPECT_TRUE(tracker.Admit("/b", t0 + milliseconds(2100)));
+  EXPECT_TRUE(tracker.Admit("/b", t0 + milliseconds(2101)));
+}
+
+TEST(SettleTrackerTest, DeferredFilesSurviveARestart) {
+  SandboxRoot root;
+  const std::string state = root.path() + "/q.settle";
+  const Clock::time_point t0 = Clock::now();
+  {
+    SettleTracker tracker(state, Options());
+    for (int i = 0; i < 3; ++i) tracker.Admit("/v/s/a b\"c", t0);
+    ASSERT_TRUE(tracker.Save());
+  }
+  SettleTracker restarted(state, Options());
+  restarted.Load();
+  const auto due = restarted.DueNow(Clock::now());
+  ASSERT_EQ(due, std::vector<std::string>{"/v/s/a b\"c"});
+  restarted.Confirm(due, Clock::now());
+  ASSERT_TRUE(restarted.Save());
+  EXPECT_FALSE(IsFileExist(state));  // nothing deferred: no file
+}
+
+TEST(SettleTrackerTest, AnUnreadableStateFileIsIgnoredWithALogLine) {
+  SandboxRoot root;
+  testing_support::LogCapture log;
+  const std::string state = root.WriteFile("q.settle", "{not json");
+  SettleTracker tracker(state, Options());
+  tracker.Load();
+  EXPECT_EQ(tracker.DeferredCount(), 0u);
+  EXPECT_EQ(log.Matching("unreadable list of deferred files").size(), 1u);
+}
+
+class IndexRulesTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    share_ = root_.MakeDir("volume1/share");
+    root_.WriteFile("etc/corvlumex/shares.json", "[{\"name\": \"share\", \"path\": \"" + share_ + "\"}]");
+  }
+  void Folders(const std::string& text) { root_.WriteFile("var/packages/CorvLumex/etc/fileindex.folders", text); }
+
+  SandboxRoot root_;
+  std::string share_;
+};
+
+TEST_F(IndexRulesTest, CategoriesOfTheGoverningFolderDecide) {
+  Folders(R"([{"path": "/share/docs", "name": "docs", "document": false, "audio": true, "video": true, "photo": true},
+              {"path": "/share/docs/papers", "name": "papers", "document": true, "audio": false, "video": false, "photo": false}])");
+  const fileindex::FolderMgr folders;
+  const IndexRules rules(folders, share_);
+  EXPECT_FALSE(rules.Judge(share_ + "/docs/a.txt", false).index);
+  EXPECT_TRUE(rules.Judge(share_ + "/docs/papers/a.txt", false).index);  // the nearest folder governs
+  EXPECT_FALSE(rules.Judge(share_ + "/docs/papers/song.mp3", false).index);
+  const Verdict song = rules.Judge(share_ + "/docs/song.mp3", false);
+  EXPECT_TRUE(song.index);
+  EXPECT_TRUE(song.need_meta);
+  const Verdict code = rules.Judge(share_ + "/docs/main.c", false);  // no category: always, without metadata
+  EXPECT_TRUE(code.index);
+  EXPECT_FALSE(code.need_meta);
+  EXPECT_TRUE(rules.Judge(share_ + "/docs/sub.txt", true).index);  // a folder whatever its name
+  EXPECT_FALSE(rules.Judge(share_ + "/other/main.c", false).index);
+  EXPECT_FALSE(rules.Judge(share_ + "/docsx/main.c", false).index);
+}
+
+TEST_F(IndexRulesTest, PreservedNamesBinsAndSnapshotsAreNeverIndexed) {
+  Folders(R"([{"path": "/share", "name": "share", "document": true, "audio": true, "video": true, "photo": true}])");
+  fs::create_directories(share_ + "/#snapshot/daily");
+  const fileindex::FolderMgr folders;
+  const IndexRules rules(folders, share_);
+  for (const char* path : {"/a/.DS_Store", "/.TemporaryItems/x.txt", "/@eaDir/fileindex.queue", "/a/@tmp",
+                           "/#recycle/old.txt", "/#snapshot/daily/a.txt"}) {
+    EXPECT_TRUE(rules.IsExcluded(share_ + path)) << path;
+    EXPECT_FALSE(rules.Judge(share_ + path, false).index) << path;
+  }
+  for (const char* path : {"/a/.ds_store", "/a/#recycled.txt", "/a/eaDir/x", "/notes/#snapshot.txt"}) {
+    EXPECT_FALSE(rules.IsExcluded(share_ + path)) << path;
+  }
+}
+
+TEST(FolderWalkerTest, ListsTheTreeWithoutEnteringLinksOrExcludedFolders) {
+  SandboxRoot root;
+  const std::string top = root.MakeDir("top");
+  root.MakeDir("top/a/b");
+  root.MakeDir("top/@eaDir");
+  root.MakeDir("top/skip/inner");
+  root.WriteFile("top/a/b/f.txt", "x");
+  root.WriteFile("top/@eaDir/q", "x");
+  root.WriteFile("top/skip/inner/g", "x");
+  ASSERT_EQ(symlink((top + "/a").c_str(), (top + "/link").c_str()), 0);
+  std::vector<std::string> listed;
+  for (const DiskEntry& entry : WalkFolder(top, [&](const std::string& dir) { return dir == top + "/skip"; })) {
+    listed.push_back(entry.path + (entry.is_dir ? "/" : ""));
+  }
+  std::sort(listed.begin(), listed.end());
+  EXPECT_EQ(listed, (std::vector<std::string>{top + "/", top + "/a/", top + "/a/b/", top + "/a/b/f.txt", top + "/link",
+                                              top + "/skip/"}));
+  EXPECT_TRUE(WalkFolder(top + "/missing").empty());
+  ASSERT_EQ(WalkFolder(top + "/a/b/f.txt").size(), 1u);  // a file is its own walk
+}
+
+TEST(CommandServerTest, AnswersCarryTheCodeAndRefuseChangesFromOtherUsers) {
+  std::vector<std::string> seen;
+  CommandServer server(
+      "/nonexistent/sock",
+      [&](const std::string& type, const Json::Value& data) {
+        seen.push_back(type);
+        if (type == "boom") throw Error(kErrorShareNotFound, "no share");
+        Json::Value out(Json::objectValue);
+        out["echo"] = data;
+        return out;
+      },
+      [](const std::string& type) { return type == "status"; });
+  Json::Value answer;
+  ASSERT_TRUE(JsonFromString(answer, server.Answer("{\"type\":\"pause\",\"data\":{\"resume_time\":0}}", 0)));
+  EXPECT_TRUE(answer["success"].asBool());
+  EXPECT_EQ(answer["data"]["echo"]["resume_time"].asInt(), 0);
+  ASSERT_TRUE(JsonFromString(answer, server.Answer("{\"type\":\"boom\"}", 0)));
+  EXPECT_FALSE(answer["success"].asBool());
+  EXPECT_EQ(answer["error"]["code"].asInt(), 800);
+  EXPECT_EQ(answer["error"]["msg"].asString(), "no share");
+  ASSERT_TRUE(JsonFromString(answer, server.Answer("not json", 0)));
+  EXPECT_EQ(answer["error"]["code"].asInt(), 120);
+  const uid_t stranger = geteuid() == 0 ? 4242 : 0;
+  if (stranger != 0) {
+    ASSERT_TRUE(JsonFromString(answer, server.Answer("{\"type\":\"resume\"}", stranger)));
+    EXPECT_FALSE(answer["success"].asBool());
+    ASSERT_TRUE(JsonFromString(answer, server.Answer("{\"type\":\"status\"}", stranger)));
+    EXPECT_TRUE(answer["success"].asBool());
+  }
+  // The refused command never reached the handler.
+  EXPECT_EQ(std::count(seen.begin(), seen.end(), "resume"), 0);
+}
+
+TEST(ProgressBoardTest, CountsPerShareAndResetsAtTheEndOfABatch) {
+  ProgressBoard board;
+  board.StartBatch("music", 10);
+  board.Done("music", 4);
+  board.AddTodo("music", 5);
+  board.Failed("music");
+  board.Extracted("music");
+  Json::Value snapshot = board.Snapshot();
+  EXPECT_EQ(snapshot["music"]["state"].asString(), "indexing");
+  EXPECT_EQ(snapshot["music"]["done"].asUInt64(), 4u);
+  EXPECT_EQ(snapshot["music"]["todo"].asUInt64(), 15u);
+  EXPECT_EQ(snapshot["music"]["total_failed"].asUInt64(), 1u);
+  board.Done("music", 20);  // a walk that found more than announced
+  EXPECT_EQ(board.Snapshot()["music"]["todo"].asUInt64(), 24u);
+  board.EndBatch("music");
+  snapshot = board.Snapshot();
+  EXPECT_EQ(snapshot["music"]["state"].asString(), "idle");
+  EXPECT_EQ(snapshot["music"]["done"].asUInt64(), 0u);
+  EXPECT_EQ(snapshot["music"]["total_done"].asUInt64(), 24u);
+  EXPECT_EQ(snapshot["music"]["eta_seconds"].asDouble(), -1.0);
+  board.Remove("music");
+  EXPECT_FALSE(board.Snapshot().isMember("music"));
+}
+
+}  // namespace
+}  // namespace fileindexd
+}  // namespace corvlumex
