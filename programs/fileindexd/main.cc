@@ -4,6 +4,7 @@
 #include <unistd.h>
 
 #include <CLI/CLI.hpp>
+#include <cerrno>
 #include <cstring>
 #include <iostream>
 
@@ -30,7 +31,7 @@ int main(int argc, char** argv) {
   CLI::App app{"fileindexd: keeps the search index of every indexed folder in step with the disk"};
   std::string socket_path = SysPath(fileindex::kFileIndexDaemonSocketPath);
   bool log_stderr = false;
-  long settle_ms = 1000, settle_max_ms = 60000, poll_ms = 1000;
+  long settle_ms = 1000, settle_max_ms = 60000, poll_ms = 250;
   app.add_option("--socket", socket_path, "command socket (default: <root>/var/run/fileindexd.sock)");
   app.add_flag("--log-stderr,--foreground", log_stderr, "log to standard error instead of syslog");
   app.add_option("--settle-ms", settle_ms, "first settle interval of a file that keeps changing")
@@ -65,6 +66,7 @@ int main(int argc, char** argv) {
   sigaction(SIGINT, &action, nullptr);
 
   daemon.Start();
+  errno = 0;  // what the start-up left in errno is no failure of this line
   CORV_LOG("fileindexd serving %s", socket_path.c_str());
   server.Run();
   g_server = nullptr;

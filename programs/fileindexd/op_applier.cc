@@ -32,16 +32,15 @@ constexpr char kFieldContentDate[] = "CORVMDFSContentChangeDate";
 constexpr char kFieldAttrDate[] = "CORVMDAttributeChangeDate";
 constexpr char kFieldSize[] = "CORVMDFSSize";
 
-enum class Kind { kMissing, kFile, kDir };
+using Kind = OpApplier::Kind;
 
-Kind KindOf(const std::string& path, struct stat* st = nullptr) {
-  struct stat local;
-  struct stat* target = st != nullptr ? st : &local;
-  if (lstat(path.c_str(), target) != 0) {
+Kind KindOf(const std::string& path) {
+  struct stat st;
+  if (lstat(path.c_str(), &st) != 0) {
     errno = 0;
     return Kind::kMissing;
   }
-  return S_ISDIR(target->st_mode) ? Kind::kDir : Kind::kFile;
+  return S_ISDIR(st.st_mode) ? Kind::kDir : Kind::kFile;
 }
 
 long long IntField(const Json::Value& doc, const char* name) {
@@ -112,19 +111,25 @@ void OpApplier::DeleteTree(const std::string& path) {
   });
 }
 
-void OpApplier::Upsert(const std::string& path) {
-  const Kind kind = KindOf(path);
-  if (kind == Kind::kMissing) {
+bool OpApplier::Present(const std::string& path, Kind* kind, Verdict* verdict) {
+  *kind = KindOf(path);
+  if (*kind == Kind::kMissing) {
     // Gone again since the event; whatever the index holds of it goes too.
     DeleteTree(path);
-  } else {
-    const Verdict verdict = rules_.Judge(path, kind == Kind::kDir);
-    if (!verdict.index) {
-      Delete(path);
-    } else {
-      UpsertFile(path, verdict.need_meta, kind == Kind::kFile);
-    }
+    return false;
   }
+  *verdict = rules_.Judge(path, *kind == Kind::kDir);
+  if (!verdict->index) {
+    Delete(path);
+    return false;
+  }
+  return true;
+}
+
+void OpApplier::Upsert(const std::string& path) {
+  Kind kind;
+  Verdict verdict;
+  if (Present(path, &kind, &verdict)) UpsertFile(path, verdict.need_meta, kind == Kind::kFile);
 }
 
 void OpApplier::UpsertSettled(const std::string& path) {
@@ -135,27 +140,21 @@ void OpApplier::UpsertSettled(const std::string& path) {
 }
 
 void OpApplier::Attr(const std::string& path) {
-  const Kind kind = KindOf(path);
-  if (kind == Kind::kMissing) {
-    DeleteTree(path);
-  } else {
-    const Verdict verdict = rules_.Judge(path, kind == Kind::kDir);
-    if (!verdict.index) {
-      Delete(path);
-    } else if (kind == Kind::kDir || settle_.Admit(path, SettleTracker::Clock::now())) {
-      Guard("attribute update", path, [&] {
-        try {
-          elastic::IndexAttr(share_, path);
-          progress_.Extracted(share_);
-        } catch (const Error& error) {
-          // Never stored (its category was off, or its create was lost): store it whole.
-          if (error.code != kSearchDocumentNotFound) throw;
-          elastic::IndexUpsert(share_, path, verdict.need_meta);
-          progress_.Extracted(share_);
-        }
-      });
+  Kind kind;
+  Verdict verdict;
+  if (!Present(path, &kind, &verdict)) return;
+  if (kind == Kind::kFile && !settle_.Admit(path, SettleTracker::Clock::now())) return;
+  Guard("attribute update", path, [&] {
+    try {
+      elastic::IndexAttr(share_, path);
+      progress_.Extracted(share_);
+    } catch (const Error& error) {
+      // Never stored (its category was off, or its create was lost): store it whole.
+      if (error.code != kSearchDocumentNotFound) throw;
+      elastic::IndexUpsert(share_, path, verdict.need_meta);
+      progress_.Extracted(share_);
     }
-  }
+  });
 }
 
 void OpApplier::Delete(const std::string& path) {

@@ -63,7 +63,13 @@ class OpApplier {
   // A file whose settle interval has passed.
   void UpsertSettled(const std::string& path);
 
+ public:
+  enum class Kind { kMissing, kFile, kDir };
+
  private:
+  // Deletes what the index holds of a path that is gone or not to be
+  // indexed; true, with its kind and verdict, when it is to be indexed.
+  bool Present(const std::string& path, Kind* kind, Verdict* verdict);
   struct Stamp {
     long long mtime = -1, ctime = -1, size = -1;
   };

@@ -19,6 +19,9 @@ class QueueWatch {
 
   // Any thread.
   void Wake();
+  // Sets the watch up (when the folder exists). Call it before looking at
+  // the queue, so that a queue made after the look wakes the next Wait.
+  void Arm() { EnsureWatch(); }
   // Returns after a change of the queue file, a Wake(), or `timeout`.
   void Wait(std::chrono::milliseconds timeout);
 

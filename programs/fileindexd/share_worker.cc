@@ -60,6 +60,7 @@ void ShareWorker::Run() {
   settle_->Load();
   std::chrono::milliseconds backoff{0};
   while (!stopping_) {
+    watch_->Arm();
     long long until = -1;
     if (pause_.IsPaused(Now(), &until)) {
       progress_.SetState(share_, kStatePaused, until == 0 ? "" : "until " + std::to_string(until));
@@ -72,6 +73,13 @@ void ShareWorker::Run() {
       worked = RunOnce();
       backoff = std::chrono::milliseconds(0);
     } catch (const BatchInterrupted&) {
+      // Paused or stopped between two files: make what was done visible.
+      // The taken-over queue stays and is applied again, whole, later.
+      try {
+        fileindex::elastic::IndexCommit(share_);
+      } catch (const Error& error) {
+        CORV_LOG("commit of share %s before pausing failed: %s", share_.c_str(), error.reason.c_str());
+      }
       continue;
     } catch (const Error& error) {
       if (error.code == kErrorNoSpace) {
@@ -95,7 +103,8 @@ void ShareWorker::Run() {
     progress_.SetDeferred(share_, settle_->DeferredCount());
     const auto now = SettleTracker::Clock::now();
     const auto next_due = settle_->NextDue();
-    std::chrono::milliseconds timeout = std::chrono::minutes(10);
+    // Woken by the queue's inotify watch; the timeout is only a safety net.
+    std::chrono::milliseconds timeout = std::chrono::seconds(30);
     if (next_due != SettleTracker::Clock::time_point::max()) {
       timeout = std::min(timeout, std::max(std::chrono::milliseconds(1),
                                            std::chrono::duration_cast<std::chrono::milliseconds>(next_due - now)));

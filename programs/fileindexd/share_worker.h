@@ -22,7 +22,7 @@ namespace corvlumex {
 namespace fileindexd {
 
 struct WorkerOptions {
-  std::chrono::milliseconds fallback_poll{1000};  // when the queue's folder cannot be watched
+  std::chrono::milliseconds fallback_poll{250};  // when the queue's folder cannot be watched
   std::chrono::milliseconds retry_first{1000};    // back-off after a failed batch, doubling
   std::chrono::milliseconds retry_max{60000};
   SettleOptions settle;

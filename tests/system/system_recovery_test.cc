@@ -1,15 +1,10 @@
-// End to end: names that are never indexed, a crash of fileindexd in the
-// middle of a batch, and lost notifications.
+// End to end: names that are never indexed, and the command line.
 #include <gtest/gtest.h>
-#include <fcntl.h>
-#include <signal.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <filesystem>
-#include <fstream>
 
-#include "common/json_util.h"
 #include "tests/system/cli_runner.h"
 #include "tests/system/system_harness.h"
 
@@ -42,77 +37,6 @@ TEST(SystemRecoveryTest, PreservedNamesAndTheRecycleBinAreNeverIndexed) {
   ASSERT_EQ(rename(box.Path("#recycle/keep.txt").c_str(), box.Path("photos/keep.txt").c_str()), 0);
   ASSERT_EQ(box.Converge(box.DiskPaths("", IsHiddenName)), "");
   EXPECT_EQ(box.Search("holiday").size(), 1u);
-}
-
-// Waits until fileindexd reports a batch under way with some files done.
-bool MidBatch(SystemSandbox& box) {
-  return PollUntil(
-      [&] {
-        Json::Value status;
-        if (!JsonFromString(status, box.IndexerStatus())) return false;
-        const Json::Value& share = status["shares"]["share"];
-        return share["state"].asString() == "indexing" && share["done"].asUInt64() > 0;
-      },
-      std::chrono::seconds(30));
-}
-
-TEST(SystemRecoveryTest, KillDuringALargeBatchThenRestartConverges) {
-  SystemSandbox box;
-  fs::create_directories(box.Path("bulk"));
-  box.StartAll();
-  box.AddFolder("bulk");
-  ASSERT_EQ(box.Converge(box.DiskPaths("bulk")), "");
-
-  for (int dir = 0; dir < 10; ++dir) {
-    fs::create_directories(box.Path("bulk/d" + std::to_string(dir)));
-    for (int i = 0; i < 150; ++i) {
-      WriteText(box.Path("bulk/d" + std::to_string(dir) + "/f" + std::to_string(i) + ".txt"),
-                "bulk file " + std::to_string(dir * 1000 + i));
-    }
-  }
-  ASSERT_TRUE(MidBatch(box)) << box.Logs();
-  box.StopIndexer(SIGKILL);
-  // Changes while the indexer is down wait in the queue.
-  ASSERT_EQ(unlink(box.Path("bulk/d0/f0.txt").c_str()), 0);
-  ASSERT_EQ(rename(box.Path("bulk/d1").c_str(), box.Path("bulk/moved").c_str()), 0);
-  box.StartIndexer();
-  ASSERT_EQ(box.Converge(box.DiskPaths("bulk"), std::chrono::seconds(120)), "");
-}
-
-long KernelQueueLimit() {
-  std::ifstream in("/proc/sys/fs/inotify/max_queued_events");
-  long value = 0;
-  in >> value;
-  return value;
-}
-
-TEST(SystemRecoveryTest, LostNotificationsLeadToAFullReindexThatConverges) {
-  const long limit = KernelQueueLimit();
-  if (limit <= 0 || limit > 1000000) GTEST_SKIP() << "kernel queue limit unusable: " << limit;
-  SystemSandbox box;
-  fs::create_directories(box.Path("docs/sub"));
-  WriteText(box.Path("docs/sub/stays.txt"), "stays");
-  WriteText(box.Path("docs/goes.txt"), "goes");
-  const std::string pause = box.root() + "/notifier-pause";
-  box.StartAll({}, {{"CORVNOTIFYD_TEST_PAUSE_FILE", pause}});
-  box.AddFolder("docs");
-  ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
-
-  // The notifier stops reading; the kernel's queue overflows while files change.
-  WriteText(pause, "");
-  ASSERT_TRUE(PollUntil([&] { return access((pause + ".paused").c_str(), F_OK) == 0; }, std::chrono::seconds(10)));
-  // Alternating attribute changes of two files are not folded by the kernel:
-  // they fill its queue, so the changes after them are lost.
-  const std::string a = box.Path("docs/sub/stays.txt"), b = box.Path("docs/goes.txt");
-  for (long i = 0; i < limit + 100; ++i) utimensat(AT_FDCWD, (i % 2 ? a : b).c_str(), nullptr, 0);
-  ASSERT_EQ(unlink(box.Path("docs/goes.txt").c_str()), 0);
-  WriteText(box.Path("docs/sub/came.txt"), "came while nobody listened");
-  ASSERT_EQ(rename(box.Path("docs/sub").c_str(), box.Path("docs/renamed").c_str()), 0);
-  unlink(pause.c_str());
-  ASSERT_EQ(box.Converge(box.DiskPaths("docs"), std::chrono::seconds(60)), "");
-  EXPECT_EQ(box.Search("nobody listened").size(), 1u);
-  // It was the queue's crash marker, not the events, that brought the index back.
-  EXPECT_NE(box.indexer().Log().find("Queue crashed"), std::string::npos) << box.Logs();
 }
 
 TEST(SystemRecoveryTest, CommandLineStatusFoldersAndSearch) {
