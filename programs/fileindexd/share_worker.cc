@@ -24,6 +24,7 @@ namespace fileindexd {
 namespace {
 
 constexpr int kSearchIndexNotFound = 2010;
+constexpr int kSearchNoSpace = 2041;  // the search daemon's volume is full
 // Saved beside the queue: the files whose extraction waits out their settle interval.
 constexpr char kSettleSuffix[] = ".settle";
 
@@ -82,10 +83,10 @@ void ShareWorker::Run() {
       }
       continue;
     } catch (const Error& error) {
-      if (error.code == kErrorNoSpace) {
-        // The index cannot be written: stop here, tell the administrators.
-        // The share is marked for a full reindex (IndexCommit did), which the
-        // next worker of this share runs once there is room again.
+      if (IsVolumeFull(error)) {
+        // The index cannot be written: stop here, tell the administrators,
+        // and leave the share marked for a full reindex, which the next
+        // worker of this share runs once there is room again.
         CORV_LOG("indexing of share %s stopped: %s", share_.c_str(), error.reason.c_str());
         progress_.SetState(share_, kStateNoSpace, error.reason);
         fileindex::SendVXMNotify();
@@ -112,6 +113,18 @@ void ShareWorker::Run() {
     watch_->Wait(timeout);
   }
   progress_.SetState(share_, kStateStopped);
+}
+
+bool ShareWorker::IsVolumeFull(const Error& error) const {
+  if (error.code == kErrorNoSpace) return true;  // IndexCommit marked the share already
+  if (static_cast<int>(error.code) != kSearchNoSpace) return false;
+  try {
+    if (sdk::SDKShare(share_).IsSpaceEnough()) return false;  // another volume's trouble: retry
+    fileindex::StatusMgr().SetShareStatus(share_, fileindex::kShareStatusNeedReindex);
+  } catch (const Error& again) {
+    CORV_LOG("cannot mark share %s for a reindex: %s", share_.c_str(), again.reason.c_str());
+  }
+  return true;
 }
 
 void ShareWorker::OnFailure(const Error& error, std::chrono::milliseconds& backoff) {

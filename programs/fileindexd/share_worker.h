@@ -48,6 +48,9 @@ class ShareWorker {
   bool RunOnce();
   void CheckInterrupt() const;
   void OnFailure(const Error& error, std::chrono::milliseconds& backoff);
+  // A failure because the share's volume is full (the share is then marked
+  // for a full reindex).
+  bool IsVolumeFull(const Error& error) const;
 
   std::string share_;
   WorkerOptions options_;

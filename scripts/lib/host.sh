@@ -32,6 +32,10 @@ host_run() {  # folder
   system_build
   echo "== installing the programs and their systemd units"
   cmake --install "$build" > /dev/null
+  ldconfig  # the library went to /usr/local/lib
+  # The library runs the administrators' notice tool from this fixed place.
+  mkdir -p /usr/corv/bin
+  [ -e /usr/corv/bin/corvvxmnotify ] || ln -s "$(command -v corvvxmnotify)" /usr/corv/bin/corvvxmnotify
   systemctl daemon-reload
   host_register_share "$share" "$folder"
   systemctl enable --now "${HOST_UNITS[@]}"

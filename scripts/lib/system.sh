@@ -9,7 +9,7 @@
 #                    to $CORVLUMEX_ROOT/var/log/corvlumex and .../var/run
 
 SYSTEM_PROGRAMS=(corvelasticd corvnotifyd fileindexd)
-SYSTEM_TARGETS=(corvelasticd corvnotifyd fileindexd fileindex_cli corvcontentextractd)
+SYSTEM_TARGETS=(corvelasticd corvnotifyd fileindexd fileindex_cli corvcontentextractd corvvxmnotify)
 
 system_build() {  # builds only what is needed, reusing an existing build folder
   local build="${FILEINDEX_BUILD:-$FILEINDEX_SRC/build}"
@@ -19,7 +19,7 @@ system_build() {  # builds only what is needed, reusing an existing build folder
       { cat "$build.configure.log"; return 1; }
   fi
   cmake --build "$build" -j "$(nproc)" --target "${SYSTEM_TARGETS[@]}" 2>&1 | grep -E 'error|warning:|Built target' || true
-  for target in fileindexd fileindex corvelasticd corvnotifyd corvcontentextractd; do
+  for target in fileindexd fileindex corvelasticd corvnotifyd corvcontentextractd corvvxmnotify; do
     [ -x "$(system_program "$target")" ] || { echo "build failed: $target is missing" >&2; return 1; }
   done
 }
@@ -49,6 +49,9 @@ system_start() {  # starts the three daemons in the sandbox root (those not runn
   local logs; logs="$(system_log_dir)"
   mkdir -p "$logs" "$CORVLUMEX_ROOT/var/run" "$CORVLUMEX_ROOT/etc/corvlumex/monitor.d" "$CORVLUMEX_ROOT/tmp" \
     "$CORVLUMEX_ROOT/var/packages/CorvLumex/etc"
+  # The administrators' notice tool, where the library runs it.
+  mkdir -p "$CORVLUMEX_ROOT/usr/corv/bin"
+  ln -sf "$(system_program corvvxmnotify)" "$CORVLUMEX_ROOT/usr/corv/bin/corvvxmnotify"
   # The extraction worker is not a service: the library starts it on demand.
   export CORVLUMEX_EXTRACT_WORKER; CORVLUMEX_EXTRACT_WORKER="$(system_program corvcontentextractd)"
   local program args

@@ -3,13 +3,16 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <signal.h>
+#include <sys/mount.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <filesystem>
 #include <fstream>
+#include <sstream>
 
 #include "common/json_util.h"
+#include "fileindex/communication.h"
 #include "tests/system/system_harness.h"
 
 namespace corvlumex {
@@ -18,6 +21,19 @@ namespace {
 namespace fs = std::filesystem;
 
 // Waits until fileindexd reports a batch under way with some files done.
+std::string ReadText(const std::string& path) {
+  std::ifstream in(path);
+  std::stringstream text;
+  text << in.rdbuf();
+  return text.str();
+}
+
+Json::Value ShareData() {
+  Json::Value data(Json::objectValue);
+  data["share_name"] = "share";
+  return data;
+}
+
 bool MidBatch(SystemSandbox& box) {
   return PollUntil(
       [&] {
@@ -86,6 +102,52 @@ TEST(SystemCrashTest, LostNotificationsLeadToAFullReindexThatConverges) {
   EXPECT_EQ(box.Search("nobody listened").size(), 1u);
   // It was the queue's crash marker, not the events, that brought the index back.
   EXPECT_NE(box.indexer().Log().find("Queue crashed"), std::string::npos) << box.Logs();
+}
+
+// Fills the volume holding `path` with one file until it is full.
+void FillVolume(const std::string& path) {
+  const int fd = open(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
+  ASSERT_GE(fd, 0);
+  const std::string block(1 << 16, 'x');
+  while (write(fd, block.data(), block.size()) > 0) {
+  }
+  close(fd);
+}
+
+TEST(SystemCrashTest, AFullVolumeStopsTheShareUntilThereIsRoomAgain) {
+  SystemSandbox box;
+  // The share on a volume of its own, just above the 100 MiB the indexer wants free.
+  if (geteuid() != 0 || mount("tmpfs", box.share_dir().c_str(), "tmpfs", 0, "size=110m") != 0) {
+    GTEST_SKIP() << "cannot mount a small volume here";
+  }
+  struct Unmount {
+    std::string path;
+    ~Unmount() { umount2(path.c_str(), MNT_DETACH); }
+  } unmount{box.share_dir()};
+  const std::string notices = box.root() + "/notices";
+  box.InstallNoticeTool(notices);
+  fs::create_directories(box.Path("docs"));
+  WriteText(box.Path("docs/first.txt"), "written with room to spare");
+  box.StartAll();
+  box.AddFolder("docs");
+  ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
+
+  FillVolume(box.Path("filler"));
+  for (int i = 0; i < 50; ++i) WriteText(box.Path("docs/late" + std::to_string(i) + ".txt"), std::string(4096, 'y'));
+  ASSERT_TRUE(PollUntil([&] { return box.IndexerStatus().find("\"no_space\"") != std::string::npos; },
+                        std::chrono::seconds(60)))
+      << box.IndexerStatus() << box.Logs();
+  EXPECT_TRUE(PollUntil([&] { return ReadText(notices).find("error:index_no_space") != std::string::npos; },
+                        std::chrono::seconds(10)));
+  EXPECT_NE(ReadText(box.root() + "/var/packages/CorvLumex/etc/fileindex.status").find("\"share\":1"), std::string::npos);
+
+  // Room again, and the share's worker asked for: the share is rebuilt whole.
+  ASSERT_EQ(unlink(box.Path("filler").c_str()), 0);
+  fileindex::SendCommandToDaemon("worker_create", ShareData());
+  ASSERT_EQ(box.Converge(box.DiskPaths("docs"), std::chrono::seconds(60)), "");
+  EXPECT_TRUE(PollUntil(
+      [&] { return ReadText(box.root() + "/var/packages/CorvLumex/etc/fileindex.status").find("\"share\":1") == std::string::npos; },
+      std::chrono::seconds(10)));
 }
 
 }  // namespace

@@ -122,6 +122,11 @@ SystemSandbox::~SystemSandbox() {
   fs::remove_all(volume_, ignored);
 }
 
+void SystemSandbox::InstallNoticeTool(const std::string& log_path) {
+  const std::string tool = root_.WriteFile("usr/corv/bin/corvvxmnotify", "#!/bin/sh\necho \"$*\" >> '" + log_path + "'\n");
+  chmod(tool.c_str(), 0755);
+}
+
 void SystemSandbox::StartAll(const std::vector<std::string>& indexer_args,
                              const std::map<std::string, std::string>& notifier_env) {
   search_daemon_ = std::make_unique<DaemonProcess>("corvelasticd", std::vector<std::string>{"--log-stderr"},

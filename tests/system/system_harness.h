@@ -50,6 +50,9 @@ class SystemSandbox {
   const std::string& share_dir() const { return share_dir_; }  // the share "share"
   std::string Path(const std::string& relative) const { return share_dir_ + "/" + relative; }
 
+  // Puts a stand-in for the administrators' notice tool in the sandbox root:
+  // it appends its arguments as one line to `log_path`.
+  void InstallNoticeTool(const std::string& log_path);
   // Starts the three daemons (fileindexd with `indexer_args`) and waits for
   // their sockets.
   void StartAll(const std::vector<std::string>& indexer_args = {},
