@@ -457,8 +457,13 @@ Json::Value IndexStore::GetByQuery(const Query& query, const std::vector<std::st
 CommitChanges IndexStore::Commit() {
   CommitChanges changes;
   if (in_transaction_) {
-    FlushIndexWrites();
-    writer_->Exec("COMMIT");
+    try {
+      FlushIndexWrites();
+      writer_->Exec("COMMIT");
+    } catch (const std::exception&) {
+      NoteLostTransaction();  // a full volume can make SQLite roll the transaction back
+      throw;
+    }
     in_transaction_ = false;
   }
   changes.upserted.assign(upserted_.begin(), upserted_.end());

@@ -31,9 +31,11 @@ int main(int argc, char** argv) {
   CLI::App app{"fileindexd: keeps the search index of every indexed folder in step with the disk"};
   std::string socket_path = SysPath(fileindex::kFileIndexDaemonSocketPath);
   bool log_stderr = false;
+  bool debug = false;
   long settle_ms = 1000, settle_max_ms = 60000, poll_ms = 250;
   app.add_option("--socket", socket_path, "command socket (default: <root>/var/run/fileindexd.sock)");
   app.add_flag("--log-stderr,--foreground", log_stderr, "log to standard error instead of syslog");
+  app.add_flag("--debug", debug, "also log every queued event as it is read");
   app.add_option("--settle-ms", settle_ms, "first settle interval of a file that keeps changing")
       ->check(CLI::Range(0L, 3600000L));
   app.add_option("--settle-max-ms", settle_max_ms, "longest settle interval")->check(CLI::Range(0L, 86400000L));
@@ -41,6 +43,8 @@ int main(int argc, char** argv) {
       ->check(CLI::Range(10L, 600000L));
   CLI11_PARSE(app, argc, argv);
 
+  // The library's debug lines (one per queued event) only when asked for.
+  corvlumex::fileindex::log_level = debug ? 7 : 6;
   if (log_stderr) SetLogSink([](int, const std::string& line) { std::cerr << line << std::endl; });
   signal(SIGPIPE, SIG_IGN);
 

@@ -13,6 +13,7 @@
 
 #include "common/json_util.h"
 #include "fileindex/communication.h"
+#include "fileindex/status_mgr.h"
 #include "tests/system/system_harness.h"
 
 namespace corvlumex {
@@ -132,8 +133,14 @@ TEST(SystemCrashTest, AFullVolumeStopsTheShareUntilThereIsRoomAgain) {
   box.AddFolder("docs");
   ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
 
-  FillVolume(box.Path("filler"));
+  // New files are queued while indexing is paused; then the volume fills
+  // up, and indexing them fails for want of room.
+  fileindex::StatusMgr().Pause(0);
   for (int i = 0; i < 50; ++i) WriteText(box.Path("docs/late" + std::to_string(i) + ".txt"), std::string(4096, 'y'));
+  ASSERT_TRUE(PollUntil([&] { return ReadText(box.Path("@eaDir/fileindex.queue")).find("late49") != std::string::npos; },
+                        std::chrono::seconds(10)));
+  FillVolume(box.Path("filler"));
+  fileindex::StatusMgr().Resume();
   ASSERT_TRUE(PollUntil([&] { return box.IndexerStatus().find("\"no_space\"") != std::string::npos; },
                         std::chrono::seconds(60)))
       << box.IndexerStatus() << box.Logs();
@@ -147,7 +154,8 @@ TEST(SystemCrashTest, AFullVolumeStopsTheShareUntilThereIsRoomAgain) {
   ASSERT_EQ(box.Converge(box.DiskPaths("docs"), std::chrono::seconds(60)), "");
   EXPECT_TRUE(PollUntil(
       [&] { return ReadText(box.root() + "/var/packages/CorvLumex/etc/fileindex.status").find("\"share\":1") == std::string::npos; },
-      std::chrono::seconds(10)));
+      std::chrono::seconds(10)))
+      << ReadText(box.root() + "/var/packages/CorvLumex/etc/fileindex.status") << box.IndexerStatus() << box.Logs();
 }
 
 }  // namespace
