@@ -13,11 +13,10 @@ SYSTEM_TARGETS=(corvelasticd corvnotifyd fileindexd fileindex_cli corvcontentext
 
 system_build() {  # builds only what is needed, reusing an existing build folder
   local build="${FILEINDEX_BUILD:-$FILEINDEX_SRC/build}"
-  if [ ! -f "$build/CMakeCache.txt" ]; then
-    mkdir -p "$build"
-    cmake -S "$FILEINDEX_SRC" -B "$build" -DCMAKE_BUILD_TYPE=RelWithDebInfo > "$build.configure.log" 2>&1 ||
-      { cat "$build.configure.log"; return 1; }
-  fi
+  mkdir -p "$build"
+  # Configured every time: an older build folder learns about new programs.
+  cmake -S "$FILEINDEX_SRC" -B "$build" -DCMAKE_BUILD_TYPE=RelWithDebInfo > "$build.configure.log" 2>&1 ||
+    { cat "$build.configure.log"; return 1; }
   cmake --build "$build" -j "$(nproc)" --target "${SYSTEM_TARGETS[@]}" 2>&1 | grep -E 'error|warning:|Built target' || true
   for target in fileindexd fileindex corvelasticd corvnotifyd corvcontentextractd corvvxmnotify; do
     [ -x "$(system_program "$target")" ] || { echo "build failed: $target is missing" >&2; return 1; }
