@@ -39,6 +39,9 @@ int main(int argc, char** argv) {
   app.add_option("--settle-ms", settle_ms, "first settle interval of a file that keeps changing")
       ->check(CLI::Range(0L, 3600000L));
   app.add_option("--settle-max-ms", settle_max_ms, "longest settle interval")->check(CLI::Range(0L, 86400000L));
+  unsigned walk_threads = 2;
+  app.add_option("--walk-threads", walk_threads, "threads extracting and storing the files of a folder walk")
+      ->check(CLI::Range(1u, 16u));
   app.add_option("--poll-ms", poll_ms, "queue poll when its folder cannot be watched")
       ->check(CLI::Range(10L, 600000L));
   CLI11_PARSE(app, argc, argv);
@@ -50,6 +53,7 @@ int main(int argc, char** argv) {
 
   WorkerOptions options;
   options.fallback_poll = std::chrono::milliseconds(poll_ms);
+  options.walk_threads = walk_threads;
   options.settle.initial = std::chrono::milliseconds(settle_ms);
   options.settle.ceiling = std::chrono::milliseconds(std::max(settle_ms, settle_max_ms));
   Daemon daemon(options);

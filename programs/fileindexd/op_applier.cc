@@ -2,7 +2,11 @@
 
 #include <sys/stat.h>
 
+#include <atomic>
 #include <cerrno>
+#include <exception>
+#include <mutex>
+#include <thread>
 #include <unordered_set>
 
 #include "common/file_util.h"
@@ -254,21 +258,27 @@ void OpApplier::Resync(const std::vector<std::string>& roots, const std::string&
     const std::vector<DiskEntry> entries = WalkFolder(root, skip_dir);
     if (entries.empty()) continue;
     progress_.AddTodo(share_, entries.size());
+    std::vector<Pending> work;
     for (const DiskEntry& entry : entries) {
       CheckInterrupt();
       const Verdict verdict = rules_.Judge(entry.path, entry.is_dir);
+      bool unchanged = true;
       if (verdict.index) {
         keep.insert(entry.path);
         struct stat st;
         const auto stored = indexed.find(entry.path);
-        const bool unchanged = stored != indexed.end() && lstat(entry.path.c_str(), &st) == 0 &&
-                               stored->second.mtime == st.st_mtime && stored->second.ctime == st.st_ctime &&
-                               stored->second.size == st.st_size;
+        unchanged = stored != indexed.end() && lstat(entry.path.c_str(), &st) == 0 &&
+                    stored->second.mtime == st.st_mtime && stored->second.ctime == st.st_ctime &&
+                    stored->second.size == st.st_size;
         errno = 0;
-        if (!unchanged) UpsertFile(entry.path, verdict.need_meta, false);
       }
-      progress_.Done(share_);
+      if (unchanged) {
+        progress_.Done(share_);
+      } else {
+        work.push_back(Pending{entry.path, verdict.need_meta});
+      }
     }
+    UpsertMany(work);
   }
   for (const auto& [path, stamp] : indexed) {
     if (keep.count(path) != 0) continue;
@@ -308,19 +318,47 @@ void OpApplier::UpdateCfg(const std::string& path, const Json::Value& changed) {
   const auto skip_dir = [this](const std::string& dir) { return rules_.IsExcluded(dir); };
   const std::vector<DiskEntry> entries = WalkFolder(path, skip_dir);
   progress_.AddTodo(share_, entries.size());
+  std::vector<Pending> work;
   for (const DiskEntry& entry : entries) {
     CheckInterrupt();
     if (!entry.is_dir && categories.count(IndexRules::CategoryKey(entry.path)) != 0) {
       const Verdict verdict = rules_.Judge(entry.path, false);
       if (verdict.index) {
-        UpsertFile(entry.path, verdict.need_meta, false);
-      } else {
-        settle_.Forget(entry.path);
-        Guard("delete", entry.path, [&] { elastic::IndexDel(share_, entry.path); });
+        work.push_back(Pending{entry.path, verdict.need_meta});
+        continue;
       }
+      settle_.Forget(entry.path);
+      Guard("delete", entry.path, [&] { elastic::IndexDel(share_, entry.path); });
     }
     progress_.Done(share_);
   }
+  UpsertMany(work);
+}
+
+void OpApplier::UpsertMany(const std::vector<Pending>& work) {
+  std::atomic<size_t> next{0};
+  std::atomic<bool> stop{false};
+  std::mutex mutex;
+  std::exception_ptr first_failure;
+  const auto run = [&] {
+    try {
+      for (size_t i = next++; !stop && i < work.size(); i = next++) {
+        CheckInterrupt();
+        UpsertFile(work[i].path, work[i].need_meta, false);
+        progress_.Done(share_);
+      }
+    } catch (...) {
+      std::lock_guard<std::mutex> lock(mutex);
+      if (!first_failure) first_failure = std::current_exception();
+      stop = true;
+    }
+  };
+  std::vector<std::thread> helpers;
+  const size_t threads = std::min<size_t>(walk_threads_, work.size());
+  for (size_t i = 1; i < threads; ++i) helpers.emplace_back(run);
+  run();
+  for (std::thread& helper : helpers) helper.join();
+  if (first_failure) std::rethrow_exception(first_failure);
 }
 
 void OpApplier::FullReindex() {

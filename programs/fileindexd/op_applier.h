@@ -48,7 +48,11 @@ class OpApplier {
   OpApplier(const std::string& share, const IndexRules& rules, ProgressBoard& progress, SettleTracker& settle);
 
   // Called between files of long walks; throws BatchInterrupted to stop.
+  // It is called from several threads at once.
   void SetInterruptCheck(std::function<void()> check) { interrupt_check_ = std::move(check); }
+  // Threads that extract and store the files a walk finds (at least 1):
+  // extraction, which runs in its own process, then overlaps the storing.
+  void SetWalkThreads(unsigned threads) { walk_threads_ = threads < 1 ? 1 : threads; }
 
   // One operation of the queue. Throws only batch errors and BatchInterrupted.
   void Apply(const fileindex::OP& op);
@@ -76,6 +80,13 @@ class OpApplier {
   // Runs one file's step; a per-file error is logged and counted.
   void Guard(const std::string& what, const std::string& path, const std::function<void()>& step);
   void UpsertFile(const std::string& path, bool need_meta, bool settle);
+  struct Pending {
+    std::string path;
+    bool need_meta = false;
+  };
+  // Upserts the files a walk found, on walk_threads_ threads; each counts
+  // as done. The first batch error or interruption stops them all and leaves.
+  void UpsertMany(const std::vector<Pending>& work);
   void DeleteTree(const std::string& path);
   // Walks `roots` and makes the documents below `index_prefix` match them.
   void Resync(const std::vector<std::string>& roots, const std::string& index_prefix);
@@ -90,6 +101,7 @@ class OpApplier {
   ProgressBoard& progress_;
   SettleTracker& settle_;
   std::function<void()> interrupt_check_;
+  unsigned walk_threads_ = 1;
 };
 
 }  // namespace fileindexd

@@ -156,6 +156,7 @@ bool ShareWorker::RunOnce() {
   const IndexRules rules(folders, sdk::SDKShare(share_).GetPath());
   OpApplier applier(share_, rules, progress_, *settle_);
   applier.SetInterruptCheck([this] { CheckInterrupt(); });
+  applier.SetWalkThreads(options_.walk_threads);
   bool worked = false;
 
   if (status & fileindex::kShareStatusNeedReindex) {

@@ -26,6 +26,7 @@ struct WorkerOptions {
   std::chrono::milliseconds retry_first{1000};    // back-off after a failed batch, doubling
   std::chrono::milliseconds retry_max{60000};
   SettleOptions settle;
+  unsigned walk_threads = 2;  // threads storing the files a folder walk finds
 };
 
 class ShareWorker {
