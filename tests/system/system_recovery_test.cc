@@ -5,6 +5,7 @@
 
 #include <filesystem>
 
+#include "common/json_util.h"
 #include "tests/system/cli_runner.h"
 #include "tests/system/system_harness.h"
 
@@ -49,6 +50,26 @@ TEST(SystemRecoveryTest, CommandLineStatusFoldersAndSearch) {
   CliResult found = RunCli({"search", "saffron"});
   EXPECT_EQ(found.status, 0) << found.err;
   EXPECT_NE(found.out.find(box.Path("docs/menu.txt")), std::string::npos) << found.out;
+  // Paging and the share filter, as scripts read them.
+  WriteText(box.Path("docs/menu2.txt"), "saffron risotto");
+  ASSERT_TRUE(PollUntil([&] { return box.Search("saffron").size() == 2; }, std::chrono::seconds(30)));
+  Json::Value page;
+  CliResult second = RunCli({"--json", "search", "saffron", "--share", "share", "--size", "1", "--from", "1"});
+  ASSERT_TRUE(JsonFromString(page, second.out)) << second.out << second.err;
+  EXPECT_EQ(page["total"].asInt(), 2);
+  EXPECT_EQ(page["hits"].size(), 1u);
+  CliResult by_name = RunCli({"--json", "search", "menu2", "--name"});
+  ASSERT_TRUE(JsonFromString(page, by_name.out)) << by_name.out;
+  ASSERT_EQ(page["hits"].size(), 1u);
+  EXPECT_EQ(page["hits"][0]["fields"]["CORVMDPath"].asString(), box.Path("docs/menu2.txt"));
+  CliResult other_share = RunCli({"search", "saffron", "--share", "nosuch"});
+  EXPECT_NE(other_share.status, 0);
+  EXPECT_NE(other_share.err.find("fileindex: error 2010"), std::string::npos) << other_share.err;
+  EXPECT_EQ(RunCli({"folder", "add", "--help"}).status, 0);
+  CliResult extracted = RunCli({"extract", box.Path("docs/menu.txt")});
+  ASSERT_TRUE(JsonFromString(page, extracted.out)) << extracted.err;
+  EXPECT_NE(page["CORVMDTextContent"].asString().find("paella"), std::string::npos);
+
   CliResult listed = RunCli({"--json", "folder", "list"});
   EXPECT_NE(listed.out.find("\"finished\""), std::string::npos) << listed.out;
   // Errors carry their code and reason, with a non-zero exit.
