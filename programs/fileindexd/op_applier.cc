@@ -166,14 +166,10 @@ void OpApplier::Delete(const std::string& path) {
   Guard("delete", path, [&] { elastic::IndexDel(share_, path); });
 }
 
-bool OpApplier::SameSettings(const std::string& a, const std::string& b, bool is_dir) const {
+bool OpApplier::SameSettings(const std::string& a, const std::string& b) const {
   const auto folder_a = rules_.folders().GetMostSuitableCfg(a);
   const auto folder_b = rules_.folders().GetMostSuitableCfg(b);
   if (!folder_a || !folder_b) return false;
-  if (is_dir) {
-    return folder_a->IsDocument() == folder_b->IsDocument() && folder_a->IsAudio() == folder_b->IsAudio() &&
-           folder_a->IsVideo() == folder_b->IsVideo() && folder_a->IsPhoto() == folder_b->IsPhoto();
-  }
   // A file keeps its document when the category of its new name is treated
   // alike; a changed category (a.txt -> a.mp3) asks for a fresh extraction.
   return IndexRules::CategoryKey(a) == IndexRules::CategoryKey(b) &&
@@ -223,7 +219,7 @@ void OpApplier::Rename(const std::string& from, const std::string& to) {
     // Checks the moved documents against the disk; unchanged files are not
     // extracted again, so this costs a walk and one query.
     Reindex(to);
-  } else if (!SameSettings(from, to, false)) {
+  } else if (!SameSettings(from, to)) {
     Upsert(to);
   }
 }

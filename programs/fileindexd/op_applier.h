@@ -91,7 +91,8 @@ class OpApplier {
   // Walks `roots` and makes the documents below `index_prefix` match them.
   void Resync(const std::vector<std::string>& roots, const std::string& index_prefix);
   std::unordered_map<std::string, Stamp> LoadIndexed(const std::string& prefix);
-  bool SameSettings(const std::string& a, const std::string& b, bool is_dir) const;
+  // A file renamed from `a` to `b` keeps its document as it is.
+  bool SameSettings(const std::string& a, const std::string& b) const;
   void CheckInterrupt() {
     if (interrupt_check_) interrupt_check_();
   }
