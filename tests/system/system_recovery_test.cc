@@ -6,6 +6,7 @@
 #include <filesystem>
 
 #include "common/json_util.h"
+#include "fileindex/communication.h"
 #include "tests/system/cli_runner.h"
 #include "tests/system/system_harness.h"
 
@@ -84,6 +85,24 @@ TEST(SystemRecoveryTest, CommandLineStatusFoldersAndSearch) {
   EXPECT_FALSE(PollUntil([&] { return !box.Search("paused").empty(); }, std::chrono::milliseconds(1500)));
   ASSERT_EQ(RunCli({"resume"}).status, 0);
   ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
+}
+
+TEST(SystemRecoveryTest, APauseWithAResumeTimeEndsByItself) {
+  SystemSandbox box;
+  fs::create_directories(box.Path("docs"));
+  box.StartAll();
+  box.AddFolder("docs");
+  ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
+  // What the status manager sends for a pause of some hours, two seconds long.
+  Json::Value pause(Json::objectValue);
+  const auto resume_time = std::chrono::system_clock::now() + std::chrono::seconds(2);
+  pause["resume_time"] = static_cast<Json::Int64>(std::chrono::system_clock::to_time_t(resume_time));
+  fileindex::SendCommandToDaemon("pause", pause);
+  WriteText(box.Path("docs/queued.txt"), "waits for the pause to end");
+  EXPECT_FALSE(PollUntil([&] { return !box.Search("waits").empty(); }, std::chrono::milliseconds(800)));
+  EXPECT_NE(box.IndexerStatus().find("\"paused\""), std::string::npos);
+  ASSERT_EQ(box.Converge(box.DiskPaths("docs"), std::chrono::seconds(30)), "");
+  EXPECT_GE(std::chrono::system_clock::now(), resume_time - std::chrono::seconds(1));
 }
 
 }  // namespace
