@@ -15,8 +15,11 @@ function(fileindex_add_test)
   if(NOT T_TIMEOUT)
     set(T_TIMEOUT 120)
   endif()
+  # The source folder is compiled in: a property list cannot carry two
+  # environment variables through test discovery.
+  target_compile_definitions(${T_NAME} PRIVATE FILEINDEX_SOURCE_DIR="${PROJECT_SOURCE_DIR}")
   gtest_discover_tests(${T_NAME}
     DISCOVERY_MODE PRE_TEST
     PROPERTIES LABELS "${T_LABELS}" TIMEOUT ${T_TIMEOUT}
-      ENVIRONMENT "FILEINDEX_BUILD_DIR=${PROJECT_BINARY_DIR};FILEINDEX_SOURCE_DIR=${PROJECT_SOURCE_DIR}")
+      ENVIRONMENT "FILEINDEX_BUILD_DIR=${PROJECT_BINARY_DIR}")
 endfunction()

@@ -120,7 +120,11 @@ bool JsonFromString(Json::Value& value, const std::string& text) {
   const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
   Json::Value parsed;
   std::string errors;
-  if (!reader->parse(text.data(), text.data() + text.size(), &parsed, &errors)) return false;
+  try {
+    if (!reader->parse(text.data(), text.data() + text.size(), &parsed, &errors)) return false;
+  } catch (const std::exception&) {
+    return false;  // jsoncpp throws on nesting deeper than it allows: not valid JSON for us
+  }
   value.swap(parsed);
   return true;
 }

@@ -103,6 +103,13 @@ TEST(JsonArrayTest, ConvertsBothWays) {
   EXPECT_TRUE(JsonArr2Vec<std::string>(Parse(R"({"a":"b"})")).empty());
 }
 
+TEST(JsonFileTest, TooDeepNestingIsInvalidNotAThrow) {
+  Json::Value value = Parse("{\"kept\":1}");
+  const std::string deep = std::string(5000, '[') + std::string(5000, ']');
+  EXPECT_FALSE(JsonFromString(value, deep));
+  EXPECT_EQ(value["kept"].asInt(), 1);
+}
+
 TEST(JsonFileTest, ConveniencesReportSuccess) {
   testing_support::SandboxRoot root(false);
   Json::Value value;
