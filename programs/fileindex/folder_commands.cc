@@ -5,8 +5,8 @@
 #include "common/error.h"
 #include "common/file_util.h"
 #include "fileindex/index_mgr.h"
-#include "fileindex/util.h"
 #include "programs/fileindex/commands.h"
+#include "programs/fileindex/folder_support.h"
 
 namespace corvlumex {
 namespace cli {
@@ -56,17 +56,6 @@ Json::Value PathList(const std::vector<std::string>& paths) {
 }
 
 }  // namespace
-
-std::string ToSharePath(const std::string& path) {
-  if (path.empty() || path[0] != '/') return path;  // the operation refuses it with its own message
-  std::string share_name, share_dir;
-  try {
-    fileindex::GetShareNamePathByFullPath(share_name, share_dir, path);
-  } catch (const Error&) {
-    return path;  // not inside a share's directory: already a share path
-  }
-  return "/" + share_name + path.substr(share_dir.size());
-}
 
 void AddFolderCommands(CLI::App& app, Output& output) {
   CLI::App* folder = app.add_subcommand("folder", "indexed folders: list, get, add, set, delete, reindex");

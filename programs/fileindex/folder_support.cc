@@ -3,13 +3,15 @@
 #include <chrono>
 #include <cstdio>
 #include <iostream>
+#include <algorithm>
 #include <set>
 
 #include "common/error.h"
 #include "common/sys.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/util.h"
-#include "programs/fileindex/commands.h"
+#include "programs/fileindex/cli_output.h"
+#include "programs/fileindex/folder_support.h"
 #include "programs/fileindex/daemon_client.h"
 
 namespace corvlumex {
@@ -24,6 +26,17 @@ std::string Bar(double fraction, size_t width) {
 }
 
 }  // namespace
+
+std::string ToSharePath(const std::string& path) {
+  if (path.empty() || path[0] != '/') return path;  // the operation refuses it with its own message
+  std::string share_name, share_dir;
+  try {
+    fileindex::GetShareNamePathByFullPath(share_name, share_dir, path);
+  } catch (const Error&) {
+    return path;  // not inside a share's directory: already a share path
+  }
+  return "/" + share_name + path.substr(share_dir.size());
+}
 
 bool WaitForIndexing(const std::vector<std::string>& share_paths, double timeout_seconds, bool quiet) {
   std::set<std::string> wanted(share_paths.begin(), share_paths.end());
