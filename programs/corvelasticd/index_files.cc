@@ -45,7 +45,17 @@ void MoveIndexFiles(const std::string& from_directory, const std::string& to_dir
   }
   const std::string from = IndexStore::DatabasePath(from_directory);
   const std::string to = IndexStore::DatabasePath(to_directory);
-  if (Exists(to)) throw DaemonError(kCodeIndexExists, "An index database already exists at " + to);
+  if (Exists(to)) {
+    // A share renamed or moved to another volume carries its database (it
+    // lives in the share's own metadata folder) to the new place before the
+    // index is told: the database already there is this index's, adopt it.
+    if (!Exists(from)) {
+      rmdir(from_directory.c_str());
+      errno = 0;
+      return;
+    }
+    throw DaemonError(kCodeIndexExists, "An index database already exists at " + to);
+  }
   for (const char* suffix : kSuffixes) {
     const std::string source = from + suffix;
     const std::string target = to + suffix;

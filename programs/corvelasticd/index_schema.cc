@@ -43,12 +43,12 @@ IndexSchema IndexSchema::FromMappings(const Json::Value& mappings) {
   for (const std::string& name : properties.getMemberNames()) {
     const Json::Value& field = properties[name];
     if (!field.isObject()) Bad("property " + name + " is not an object");
-    FieldSpec spec;
-    spec.name = name;
-    spec.code = static_cast<int>(schema.fields_.size());
-    spec.in_all = BoolAttribute(name, field, defaults, "_all", true);
-    spec.stored = BoolAttribute(name, field, defaults, "stored", true);
-    spec.required = BoolAttribute(name, field, defaults, "required", false);
+    FieldSpec field_def;
+    field_def.name = name;
+    field_def.code = static_cast<int>(schema.fields_.size());
+    field_def.in_all = BoolAttribute(name, field, defaults, "_all", true);
+    field_def.stored = BoolAttribute(name, field, defaults, "stored", true);
+    field_def.required = BoolAttribute(name, field, defaults, "required", false);
     const std::string type = StringAttribute(name, field, defaults, "type", "string");
     const std::string analyzer = StringAttribute(name, field, defaults, "analyzer", "corvstandard");
     bool ngram = false;
@@ -62,33 +62,33 @@ IndexSchema IndexSchema::FromMappings(const Json::Value& mappings) {
       if (step.asString() == "ngram") ngram = true;
     }
     if (analyzer == "keyword") {
-      spec.analyzer = Analyzer::kKeyword;
+      field_def.analyzer = Analyzer::kKeyword;
     } else if (analyzer == "white space") {
-      spec.analyzer = Analyzer::kWhitespace;
+      field_def.analyzer = Analyzer::kWhitespace;
     } else if (analyzer == "corvstandard" || analyzer == "standard") {
-      spec.analyzer = Analyzer::kStandard;
+      field_def.analyzer = Analyzer::kStandard;
     } else {
       Bad("unknown analyzer \"" + analyzer + "\" of " + name);
     }
     if (type == "int" || type == "double") {
-      spec.kind = FieldKind::kNumber;
-      spec.integer = type == "int";
+      field_def.kind = FieldKind::kNumber;
+      field_def.integer = type == "int";
     } else if (type == "bool") {
-      spec.kind = FieldKind::kBool;
+      field_def.kind = FieldKind::kBool;
     } else if (type == "string" || type == "text") {
       if (ngram) {
-        spec.kind = FieldKind::kNgram;
+        field_def.kind = FieldKind::kNgram;
         // The words of a name are searched with the standard rules, so
         // "report" finds "Report-2023.pdf" through the catch-all field.
-        spec.analyzer = Analyzer::kStandard;
+        field_def.analyzer = Analyzer::kStandard;
       } else {
-        spec.kind = spec.analyzer == Analyzer::kKeyword ? FieldKind::kKeyword : FieldKind::kText;
+        field_def.kind = field_def.analyzer == Analyzer::kKeyword ? FieldKind::kKeyword : FieldKind::kText;
       }
     } else {
       Bad("unknown type \"" + type + "\" of " + name);
     }
     schema.by_name_[name] = schema.fields_.size();
-    schema.fields_.push_back(spec);
+    schema.fields_.push_back(field_def);
   }
   const FieldSpec* key = schema.Find(schema.property_id_);
   if (key == nullptr) Bad("\"property_id\" " + schema.property_id_ + " is not a property");

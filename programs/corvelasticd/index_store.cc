@@ -641,8 +641,8 @@ SearchResult IndexStore::Search(const Query& query, const SortSpec& sort, size_t
 }
 
 std::vector<Suggestion> IndexStore::Suggest(const std::string& field, const std::string& prefix, size_t limit) {
-  const FieldSpec* spec = schema_.Find(field);
-  const std::string folded = spec != nullptr && spec->kind == FieldKind::kKeyword
+  const FieldSpec* field_def = schema_.Find(field);
+  const std::string folded = field_def != nullptr && field_def->kind == FieldKind::kKeyword
                                  ? [&] { std::vector<std::string> t; Analyze(Analyzer::kKeyword, prefix, &t); return t.empty() ? std::string() : t[0]; }()
                                  : Fold(prefix, FoldMode::kSearch);
   const std::string upper = PrefixUpperBound(folded);

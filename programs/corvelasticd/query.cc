@@ -78,12 +78,12 @@ class Parser {
   }
 
   const FieldSpec& Field(const std::string& name) const {
-    const FieldSpec* spec = schema_.Find(name);
-    if (spec == nullptr) Bad("unknown field \"" + name + "\"");
-    return *spec;
+    const FieldSpec* field_def = schema_.Find(name);
+    if (field_def == nullptr) Bad("unknown field \"" + name + "\"");
+    return *field_def;
   }
 
-  bool IsKey(const FieldSpec& spec) const { return spec.name == schema_.property_id(); }
+  bool IsKey(const FieldSpec& field_def) const { return field_def.name == schema_.property_id(); }
 
   static std::string ScalarText(const std::string& field, const Json::Value& value) {
     if (value.isString()) return value.asString();
@@ -91,13 +91,13 @@ class Parser {
     Bad("the value for \"" + field + "\" must be a string, a number or a bool");
   }
 
-  static SqlValue Number(const FieldSpec& spec, const Json::Value& value) {
-    if (spec.kind == FieldKind::kBool) {
+  static SqlValue Number(const FieldSpec& field_def, const Json::Value& value) {
+    if (field_def.kind == FieldKind::kBool) {
       if (value.isBool()) return static_cast<int64_t>(value.asBool() ? 1 : 0);
       if (value.isString() && (value.asString() == "true" || value.asString() == "false")) {
         return static_cast<int64_t>(value.asString() == "true" ? 1 : 0);
       }
-      Bad("\"" + spec.name + "\" takes true or false");
+      Bad("\"" + field_def.name + "\" takes true or false");
     }
     if (value.isInt64()) return static_cast<int64_t>(value.asInt64());
     if (value.isDouble()) return value.asDouble();
@@ -108,7 +108,7 @@ class Parser {
       const double number = strtod(text.c_str(), &end);
       if (!text.empty() && end != nullptr && *end == '\0' && std::isfinite(number)) return number;
     }
-    Bad("\"" + spec.name + "\" takes a number or a date (YYYY-MM-DD[THH:MM:SS[Z]]), got " + Short(value));
+    Bad("\"" + field_def.name + "\" takes a number or a date (YYYY-MM-DD[THH:MM:SS[Z]]), got " + Short(value));
   }
 
   // Dates of the range clause: UTC calendar dates, as seconds since 1970.
@@ -131,18 +131,18 @@ class Parser {
   // The text columns of a field, or of every catch-all field, grouped by analyzer.
   std::vector<std::pair<Analyzer, std::vector<std::string>>> ColumnsFor(const std::string& field) const {
     std::vector<std::pair<Analyzer, std::vector<std::string>>> groups;
-    auto add = [&](const FieldSpec& spec) {
+    auto add = [&](const FieldSpec& field_def) {
       for (auto& group : groups) {
-        if (group.first == spec.analyzer) {
-          group.second.push_back(spec.Column());
+        if (group.first == field_def.analyzer) {
+          group.second.push_back(field_def.Column());
           return;
         }
       }
-      groups.push_back({spec.analyzer, {spec.Column()}});
+      groups.push_back({field_def.analyzer, {field_def.Column()}});
     };
     if (field == kAllField) {
-      for (const FieldSpec* spec : schema_.TextFields()) {
-        if (spec->in_all) add(*spec);
+      for (const FieldSpec* field_def : schema_.TextFields()) {
+        if (field_def->in_all) add(*field_def);
       }
     } else {
       add(Field(field));
@@ -197,14 +197,14 @@ class Parser {
     }
   }
 
-  QueryNode Substring(const FieldSpec& spec, const std::string& text) {
+  QueryNode Substring(const FieldSpec& field_def, const std::string& text) {
     QueryNode node;
     node.type = QueryNode::Type::kName;
-    node.code = spec.code;
+    node.code = field_def.code;
     const std::string folded = Fold(text, FoldMode::kSearch);
     if (folded.empty()) return QueryNode{};  // every name holds the empty text
     if (CodePointCount(folded) >= 3) {
-      node.fts = "{" + spec.NameColumn() + "} : " + Phrase({folded});
+      node.fts = "{" + field_def.NameColumn() + "} : " + Phrase({folded});
     } else {
       node.substring = folded;
     }
@@ -218,15 +218,15 @@ class Parser {
     return node;
   }
 
-  QueryNode NumberIn(const FieldSpec& spec, std::vector<SqlValue> numbers) {
+  QueryNode NumberIn(const FieldSpec& field_def, std::vector<SqlValue> numbers) {
     QueryNode node;
     node.type = QueryNode::Type::kNumberIn;
-    node.code = spec.code;
+    node.code = field_def.code;
     node.numbers = std::move(numbers);
     return node;
   }
 
-  QueryNode KeywordToken(const FieldSpec& spec, const std::string& value) {
+  QueryNode KeywordToken(const FieldSpec& field_def, const std::string& value) {
     std::vector<std::string> tokens;
     Analyze(Analyzer::kKeyword, value, &tokens);
     QueryNode node;
@@ -235,7 +235,7 @@ class Parser {
       return node;
     }
     node.type = QueryNode::Type::kText;
-    node.fts = "{" + spec.Column() + "} : " + Phrase(tokens);
+    node.fts = "{" + field_def.Column() + "} : " + Phrase(tokens);
     return node;
   }
 
@@ -252,41 +252,41 @@ class Parser {
       text = ScalarText(field, argument);
     }
     if (field == kAllField) return Words(field, text, any, negated);
-    const FieldSpec& spec = Field(field);
-    if (IsKey(spec)) return KeyIn({text});
-    switch (spec.kind) {
-      case FieldKind::kNgram: return Substring(spec, text);
-      case FieldKind::kKeyword: return KeywordToken(spec, text);
+    const FieldSpec& field_def = Field(field);
+    if (IsKey(field_def)) return KeyIn({text});
+    switch (field_def.kind) {
+      case FieldKind::kNgram: return Substring(field_def, text);
+      case FieldKind::kKeyword: return KeywordToken(field_def, text);
       case FieldKind::kText: return Words(field, text, any, negated);
-      default: return NumberIn(spec, {Number(spec, argument)});
+      default: return NumberIn(field_def, {Number(field_def, argument)});
     }
   }
 
   QueryNode Term(const std::string& field, const Json::Value& argument, bool negated) {
     const Json::Value& value = argument.isObject() ? argument["value"] : argument;
     if (field == kAllField) return Words(field, ScalarText(field, value), false, negated);
-    const FieldSpec& spec = Field(field);
-    if (IsKey(spec)) return KeyIn({ScalarText(field, value)});
-    switch (spec.kind) {
-      case FieldKind::kKeyword: return KeywordToken(spec, ScalarText(field, value));
-      case FieldKind::kNgram: return Substring(spec, ScalarText(field, value));
+    const FieldSpec& field_def = Field(field);
+    if (IsKey(field_def)) return KeyIn({ScalarText(field, value)});
+    switch (field_def.kind) {
+      case FieldKind::kKeyword: return KeywordToken(field_def, ScalarText(field, value));
+      case FieldKind::kNgram: return Substring(field_def, ScalarText(field, value));
       case FieldKind::kText: return Words(field, ScalarText(field, value), false, negated);
-      default: return NumberIn(spec, {Number(spec, value)});
+      default: return NumberIn(field_def, {Number(field_def, value)});
     }
   }
 
   QueryNode Terms(const std::string& field, const Json::Value& argument, bool negated) {
     if (!argument.isArray()) Bad("\"terms\" on \"" + field + "\" needs an array");
-    const FieldSpec* spec = field == kAllField ? nullptr : &Field(field);
-    if (spec != nullptr && IsKey(*spec)) {
+    const FieldSpec* field_def = field == kAllField ? nullptr : &Field(field);
+    if (field_def != nullptr && IsKey(*field_def)) {
       std::vector<std::string> keys;
       for (const Json::Value& value : argument) keys.push_back(ScalarText(field, value));
       return KeyIn(std::move(keys));
     }
-    if (spec != nullptr && (spec->kind == FieldKind::kNumber || spec->kind == FieldKind::kBool)) {
+    if (field_def != nullptr && (field_def->kind == FieldKind::kNumber || field_def->kind == FieldKind::kBool)) {
       std::vector<SqlValue> numbers;
-      for (const Json::Value& value : argument) numbers.push_back(Number(*spec, value));
-      return NumberIn(*spec, std::move(numbers));
+      for (const Json::Value& value : argument) numbers.push_back(Number(*field_def, value));
+      return NumberIn(*field_def, std::move(numbers));
     }
     QueryNode node;
     node.type = QueryNode::Type::kBool;
@@ -302,24 +302,24 @@ class Parser {
     std::vector<std::string> columns;
     std::vector<std::string> tokens;
     if (field == kAllField) {
-      for (const FieldSpec* spec : schema_.TextFields()) {
-        if (spec->in_all && spec->kind != FieldKind::kKeyword) columns.push_back(spec->Column());
+      for (const FieldSpec* field_def : schema_.TextFields()) {
+        if (field_def->in_all && field_def->kind != FieldKind::kKeyword) columns.push_back(field_def->Column());
       }
       for (const auto& group : AnalyzeQuery(Analyzer::kStandard, text)) tokens.insert(tokens.end(), group.begin(), group.end());
     } else {
-      const FieldSpec& spec = Field(field);
-      if (IsKey(spec)) {
+      const FieldSpec& field_def = Field(field);
+      if (IsKey(field_def)) {
         QueryNode node;
         node.type = QueryNode::Type::kKeyPrefix;
         node.prefix = text;
         return node;
       }
-      if (!spec.HasTextColumn()) Bad("\"prefix\" needs a text or keyword field, \"" + field + "\" is not one");
-      columns.push_back(spec.Column());
-      if (spec.kind == FieldKind::kKeyword) {
+      if (!field_def.HasTextColumn()) Bad("\"prefix\" needs a text or keyword field, \"" + field + "\" is not one");
+      columns.push_back(field_def.Column());
+      if (field_def.kind == FieldKind::kKeyword) {
         Analyze(Analyzer::kKeyword, text, &tokens);
       } else {
-        for (const auto& group : AnalyzeQuery(spec.analyzer, text)) tokens.insert(tokens.end(), group.begin(), group.end());
+        for (const auto& group : AnalyzeQuery(field_def.analyzer, text)) tokens.insert(tokens.end(), group.begin(), group.end());
       }
     }
     if (tokens.empty()) return QueryNode{};  // every value starts with ""
@@ -330,14 +330,14 @@ class Parser {
   }
 
   QueryNode Range(const std::string& field, const Json::Value& argument) {
-    const FieldSpec& spec = Field(field);
-    if (spec.kind != FieldKind::kNumber) Bad("\"range\" needs a number or date field, \"" + field + "\" is not one");
+    const FieldSpec& field_def = Field(field);
+    if (field_def.kind != FieldKind::kNumber) Bad("\"range\" needs a number or date field, \"" + field + "\" is not one");
     if (!argument.isObject() || argument.empty()) Bad("\"range\" on \"" + field + "\" needs gt, gte, lt or lte");
     QueryNode node;
     node.type = QueryNode::Type::kNumberRange;
-    node.code = spec.code;
+    node.code = field_def.code;
     for (const std::string& bound : argument.getMemberNames()) {
-      const SqlValue number = Number(spec, argument[bound]);
+      const SqlValue number = Number(field_def, argument[bound]);
       if (bound == "gt" || bound == "gte") {
         node.low = number;
         node.low_inclusive = bound == "gte";

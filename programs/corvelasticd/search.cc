@@ -45,20 +45,20 @@ SortRequest ParseSort(const Json::Value& sort) {
 }
 
 SortSpec SortFor(const SortRequest& request, const IndexSchema& schema) {
-  SortSpec spec;
-  spec.descending = request.descending;
+  SortSpec field_def;
+  field_def.descending = request.descending;
   if (request.field == "_score") {
-    spec.by = SortSpec::By::kScore;
+    field_def.by = SortSpec::By::kScore;
   } else if (request.field == "_key" || request.field == schema.property_id()) {
-    spec.by = SortSpec::By::kKey;
+    field_def.by = SortSpec::By::kKey;
   } else {
     const FieldSpec* field = schema.Find(request.field);
     if (field == nullptr) throw DaemonError(kCodeBadArgument, "Cannot sort by the unknown field \"" + request.field + "\"");
-    spec.by = SortSpec::By::kField;
-    spec.code = field->code;
-    spec.text = field->kind != FieldKind::kNumber && field->kind != FieldKind::kBool;
+    field_def.by = SortSpec::By::kField;
+    field_def.code = field->code;
+    field_def.text = field->kind != FieldKind::kNumber && field->kind != FieldKind::kBool;
   }
-  return spec;
+  return field_def;
 }
 
 std::vector<std::shared_ptr<IndexHandle>> TargetIndexes(const IndexRegistry& registry, const Json::Value& data) {
@@ -139,9 +139,9 @@ Json::Value RunSearch(const IndexRegistry& registry, const Json::Value& data, co
   for (size_t i = 0; i < handles.size(); ++i) {
     const std::shared_ptr<IndexStore> store = handles[i]->Store();
     const Query query = Query::Parse(clause, store->schema());
-    SortSpec spec = SortFor(sort, store->schema());
-    if (spec.by == SortSpec::By::kScore && !query.HasRankedClause()) spec.by = SortSpec::By::kKey, spec.descending = false;
-    SearchResult result = store->Search(query, spec, static_cast<size_t>(from + size),
+    SortSpec field_def = SortFor(sort, store->schema());
+    if (field_def.by == SortSpec::By::kScore && !query.HasRankedClause()) field_def.by = SortSpec::By::kKey, field_def.descending = false;
+    SearchResult result = store->Search(query, field_def, static_cast<size_t>(from + size),
                                         track_total ? static_cast<size_t>(-1) : kDefaultCheckBudget, readable);
     total += result.total;
     exact = exact && result.total_exact;

@@ -4,6 +4,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <filesystem>
 #include <fstream>
 #include <sstream>
 
@@ -295,6 +296,32 @@ TEST_F(DaemonTest, ConfigSetMovesTheDatabaseAndRenamesTheIndex) {
   Json::Value again;
   for (int i = 0; i < 1000 && (again = Run("search", Data(R"({"id": "fileindex_share2"})")))["error"]["code"].asInt() == 1401; ++i) {}
   EXPECT_EQ(again["data"]["total"].asInt(), 1);
+}
+
+// A renamed share takes its metadata folder, and so the database, along
+// before the index is told: the daemon adopts what it finds at the new place.
+TEST_F(DaemonTest, ConfigSetAdoptsADatabaseThatAlreadyMovedWithItsShare) {
+  Upsert("/volume1/share/r.txt", "renamed along");
+  Commit();
+  ASSERT_EQ(rename((root_.path() + "/volume1/share").c_str(), (root_.path() + "/volume1/share3").c_str()), 0);
+  Json::Value data;
+  data["data"]["id"] = "fileindex_share3";
+  data["data"]["path"] = root_.path() + "/volume1/share3/@eaDir/index";
+  ASSERT_TRUE(Run("index_config_set", data)["success"].asBool()) << daemon_->LogText();
+  const Json::Value answer = Run("search", Data(R"({"id": "fileindex_share3", "query": {"qsl": {"match": {"_all": "renamed"}}}})"));
+  EXPECT_EQ(answer["data"]["total"].asInt(), 1) << JsonToString(answer);
+}
+
+TEST_F(DaemonTest, ConfigSetRefusesToOverwriteAnotherDatabase) {
+  const std::string other = root_.path() + "/volume2/other/@eaDir/index";
+  std::filesystem::create_directories(other);
+  { std::ofstream(other + "/corvelasticd.db") << "someone else's"; }
+  Json::Value data;
+  data["data"]["id"] = "fileindex_other";
+  data["data"]["path"] = other;
+  EXPECT_FALSE(Run("index_config_set", data)["success"].asBool());
+  const Json::Value answer = Run("search", Data(R"({"id": "fileindex_share"})"));
+  EXPECT_TRUE(answer["success"].asBool()) << JsonToString(answer);
 }
 
 TEST_F(DaemonTest, DeleteRemovesTheIndexAndItsFiles) {
