@@ -87,6 +87,24 @@ TEST(SystemRecoveryTest, CommandLineStatusFoldersAndSearch) {
   ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
 }
 
+TEST(SystemRecoveryTest, APausedShareHasNoWorkerUntilResumed) {
+  SystemSandbox box;
+  fs::create_directories(box.Path("docs"));
+  box.StartAll();
+  box.AddFolder("docs");
+  ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
+  CliResult paused = RunCli({"share", "pause", "share"});
+  ASSERT_EQ(paused.status, 0) << paused.err;
+  Json::Value status;
+  ASSERT_TRUE(JsonFromString(status, box.IndexerStatus()));
+  EXPECT_EQ(status["shares"]["share"]["state"].asString(), "no worker");  // "worker_delete" was heard
+  WriteText(box.Path("docs/held.txt"), "held back while the share is paused");
+  EXPECT_FALSE(PollUntil([&] { return !box.Search("held").empty(); }, std::chrono::milliseconds(800)));
+  CliResult resumed = RunCli({"share", "resume", "share"});
+  ASSERT_EQ(resumed.status, 0) << resumed.err;
+  ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
+}
+
 TEST(SystemRecoveryTest, APauseWithAResumeTimeEndsByItself) {
   SystemSandbox box;
   fs::create_directories(box.Path("docs"));
