@@ -116,7 +116,13 @@ std::vector<std::string> JsonArr2Vec<std::string>(const Json::Value& array) {
 
 bool JsonFromString(Json::Value& value, const std::string& text) {
   Json::CharReaderBuilder builder;
+  // Only valid JSON is accepted: the lenient defaults would take text after
+  // the value ("{...}}"), comments or trailing commas for a good record.
+  // Top-level scalars stay allowed: they are valid JSON.
   builder["collectComments"] = false;
+  builder["allowComments"] = false;
+  builder["allowTrailingCommas"] = false;
+  builder["failIfExtra"] = true;
   const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
   Json::Value parsed;
   std::string errors;

@@ -128,6 +128,24 @@ TEST(JsonFileTest, ConveniencesReportSuccess) {
   EXPECT_FALSE(JsonToFile(stored, root.path() + "/no/such/dir/x.json"));
 }
 
+// Text that merely starts with a value is not JSON: a queue line or a reply
+// with something after the value, a comment or a trailing comma is refused,
+// and the value keeps what it held.
+TEST(JsonFileTest, OnlyValidJsonIsAccepted) {
+  Json::Value value = Parse(R"({"kept":1})");
+  for (const char* text : {R"({"a":1} junk)", R"({"a":1}})", "// c\n{}", R"({"a":1} // c)", "[1,]",
+                           R"({"a":1,})", "", "  "}) {
+    EXPECT_FALSE(JsonFromString(value, text)) << text;
+    EXPECT_EQ(value, Parse(R"({"kept":1})")) << text;
+  }
+  for (const char* text : {"{}\n", " [1, 2] ", "3", "\"text\"", "null"}) {
+    EXPECT_TRUE(JsonFromString(value, text)) << text;
+  }
+  testing_support::SandboxRoot root(false);
+  root.WriteFile("extra.json", "{\"a\":1}\n{\"b\":2}\n");
+  EXPECT_FALSE(JsonFromFile(value, root.path() + "/extra.json"));
+}
+
 // A writer rewrites the file as fast as it can while a reader parses it: the
 // reader must only ever see a whole old or a whole new file.
 TEST(JsonFileTest, ReaderNeverSeesATornFile) {
