@@ -37,9 +37,8 @@ void SetLastError(int code, const char* file, int line, const std::string& messa
 void ClearLastError() { last_error = ErrorRecord(); }
 
 void LogPlatformError(const char* file, int line, const char* function, const char* what) {
-  // The platform's own record says what failed; a stale errno would only
-  // add a misleading system text to the line.
-  errno = 0;
+  // Like every failure line: the system text is added when errno is set
+  // (the platform call may have failed on a system call), then cleared.
   const ErrorRecord& error = LastError();
   LogErrorLine("%s:%d (%d, %u) (%s) %s: err=[0x%04X %s:%d]", file, line, static_cast<int>(getpid()),
                static_cast<unsigned>(geteuid()), function, what, static_cast<unsigned>(error.code),

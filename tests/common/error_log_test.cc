@@ -15,6 +15,8 @@ TEST(ErrorTest, MessageWithoutReasonHasNoBrackets) {
   EXPECT_STREQ(Error(kErrorSystem).what(), "CorvLumex error, code=502");
   EXPECT_TRUE(Error(kErrorSystem).reason.empty());
   EXPECT_STREQ(Error(kErrorUnexpected).what(), "CorvLumex error, code=9999");
+  EXPECT_STREQ(Error(kErrorNoSpace, "Share (s) space not enough").what(),
+               "CorvLumex error, code=1003, reason=[Share (s) space not enough]");
 }
 
 TEST(ErrorTest, ReasonIsCopiedUnchangedInsideBrackets) {

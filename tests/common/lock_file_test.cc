@@ -30,10 +30,17 @@ int OpenDescriptors() {
 TEST(LockFileTest, MissingFileIsCreatedAndKept) {
   SandboxRoot root(false);
   const std::string path = root.path() + "/cfg.lock";
+  // With no umask in the way the mode is exactly the one the lock asks for:
+  // readable by every process that must share (take) the lock.
+  const mode_t previous_umask = umask(0);
   { LockFile lock(path, true); }
+  umask(previous_umask);
   struct stat st;
   ASSERT_EQ(stat(path.c_str(), &st), 0);
   EXPECT_TRUE(S_ISREG(st.st_mode));
+  EXPECT_EQ(st.st_mode & 07777, 0644u);
+  { LockFile again(path, false); }  // an existing lock file is reused and kept
+  EXPECT_EQ(stat(path.c_str(), &st), 0);
 }
 
 TEST(LockFileTest, SharedLocksCoexist) {

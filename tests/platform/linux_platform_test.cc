@@ -207,9 +207,12 @@ TEST(LastErrorTest, LogLineShowsNumberFileAndLine) {
   LogPlatformError("index_mgr.cc", 7, "SetupRelatedServices", "KLIBServiceRestart failed");
   ASSERT_EQ(log.Lines().size(), 1u);
   EXPECT_EQ(log.Lines()[0], StringPrintf("index_mgr.cc:7 (%d, %u) (SetupRelatedServices) KLIBServiceRestart failed: "
-                                         "err=[0x0800 services.cc:42]",
+                                         "err=[0x0800 services.cc:42] [err: Input/output error]",
                                          static_cast<int>(getpid()), static_cast<unsigned>(geteuid())));
   EXPECT_EQ(errno, 0);
+  // With errno clear the line ends with the platform's record.
+  LogPlatformError("index_mgr.cc", 8, "SetupRelatedServices", "KLIBServiceRestart failed");
+  EXPECT_EQ(log.Lines().back().find(" [err:"), std::string::npos) << log.Lines().back();
   ClearLastError();
   EXPECT_EQ(LastError().code, kPlatformErrNone);
   EXPECT_EQ(LastError().file, "");
