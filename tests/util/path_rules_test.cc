@@ -194,6 +194,21 @@ TEST_F(PathRulesTest, RemoteImageAndPseudoFileSystemsAreRefused) {
   }
 }
 
+// The snapshot and file-system rules come before the share is resolved: a
+// path that they refuse is answered "no" even when no share holds it, while
+// a path that passes them and lies in no share throws.
+TEST_F(PathRulesTest, EarlyRulesRefuseBeforeTheShareIsResolved) {
+  const std::string outside = sandbox_.MakeDir(sandbox_.volume() + "/video");
+  sandbox_.MakeDir(outside + "/#snapshot/daily");
+  EXPECT_FALSE(CanFullPathBeIndexed(outside + "/#snapshot/daily"));
+  EXPECT_FALSE(CanFullPathBeIndexed(outside + "/missing"));  // no file-system type
+  {
+    ScopedPlatform installed(std::make_shared<FileSystemPlatform>(0x6969));  // nfs
+    EXPECT_FALSE(CanFullPathBeIndexed(outside));
+  }
+  EXPECT_THROW(CanFullPathBeIndexed(outside), Error);
+}
+
 // Every share directory is a mount point; the encryption setting is
 // reported apart from the "encrypted" flag, as an appliance may.
 class MountedSharesPlatform : public LinuxPlatform {
