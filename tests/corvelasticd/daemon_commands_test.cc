@@ -4,7 +4,10 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <filesystem>
+#include <functional>
+#include <thread>
 #include <fstream>
 #include <sstream>
 
@@ -15,6 +18,18 @@
 namespace corvlumex {
 namespace elasticd_test {
 namespace {
+
+// Repeats `ask` while the index answers 1401 (still opening), for at most
+// 30 seconds: a loaded machine can take a while to reopen it.
+Json::Value WhileOpening(const std::function<Json::Value()>& ask) {
+  const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(30);
+  Json::Value answer = ask();
+  while (answer["error"]["code"].asInt() == 1401 && std::chrono::steady_clock::now() < deadline) {
+    std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    answer = ask();
+  }
+  return answer;
+}
 
 using testing_support::SandboxRoot;
 
@@ -255,8 +270,7 @@ TEST_F(DaemonTest, APausedIndexAnswersBusyForWritesAndStillSearches) {
   // The pause survives a restart.
   daemon_->Terminate();
   daemon_->Start();
-  Json::Value answer;
-  for (int i = 0; i < 1000 && (answer = Run("document_upsert_by_id", data))["error"]["code"].asInt() == 1401; ++i) {}
+  const Json::Value answer = WhileOpening([&] { return Run("document_upsert_by_id", data); });
   EXPECT_EQ(answer["error"]["code"].asInt(), 1400);
   ASSERT_TRUE(Run("index_resume", Json::Value(Json::objectValue))["success"].asBool());
   EXPECT_TRUE(Run("document_upsert_by_id", data)["success"].asBool());
@@ -268,11 +282,9 @@ TEST_F(DaemonTest, KillNineKeepsCommittedDataAndLosesTheRest) {
   Upsert("/volume1/share/lost.txt", "volatile");
   daemon_->Kill9();
   daemon_->Start();
-  Json::Value answer;
   // Named, the index answers 1401 while it reopens (unnamed, a search skips it).
-  for (int i = 0; i < 1000 && (answer = Search(R"({"match_all": {}})", R"({"id": "fileindex_share"})"))["error"]["code"].asInt() == 1401;
-       ++i) {
-  }
+  const Json::Value answer =
+      WhileOpening([&] { return Search(R"({"match_all": {}})", R"({"id": "fileindex_share"})"); });
   EXPECT_EQ(HitIds(answer), std::vector<std::string>({"/volume1/share/kept.txt"})) << JsonToString(answer);
   Upsert("/volume1/share/new.txt");
   Commit();
@@ -293,8 +305,7 @@ TEST_F(DaemonTest, ConfigSetMovesTheDatabaseAndRenamesTheIndex) {
   EXPECT_EQ(answer["data"]["total"].asInt(), 1) << JsonToString(answer);
   daemon_->Kill9();
   daemon_->Start();
-  Json::Value again;
-  for (int i = 0; i < 1000 && (again = Run("search", Data(R"({"id": "fileindex_share2"})")))["error"]["code"].asInt() == 1401; ++i) {}
+  const Json::Value again = WhileOpening([&] { return Run("search", Data(R"({"id": "fileindex_share2"})")); });
   EXPECT_EQ(again["data"]["total"].asInt(), 1);
 }
 
