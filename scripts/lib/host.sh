@@ -37,6 +37,8 @@ host_run() {  # folder
   mkdir -p /usr/corv/bin
   [ -e /usr/corv/bin/corvvxmnotify ] || ln -s "$(command -v corvvxmnotify)" /usr/corv/bin/corvvxmnotify
   systemctl daemon-reload
+  # The state files' folder and the notifier's configuration folder.
+  mkdir -p /var/packages/CorvLumex/etc /etc/corvlumex/monitor.d
   host_register_share "$share" "$folder"
   systemctl enable --now "${HOST_UNITS[@]}"
   command -v fileindex > /dev/null || { echo "fileindex is not on PATH after the install" >&2; return 1; }
