@@ -1,0 +1,166 @@
+// The operation table of fileindexd, command by command, against a scripted
+// search daemon; extraction is a stand-in platform answer.
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <filesystem>
+#include <memory>
+
+#include "common/error.h"
+#include "fileindex/folder_mgr.h"
+#include "fileindex/optree.h"
+#include "platform/linux/linux_platform.h"
+#include "programs/fileindexd/index_rules.h"
+#include "programs/fileindexd/op_applier.h"
+#include "programs/fileindexd/progress.h"
+#include "programs/fileindexd/settle_tracker.h"
+#include "tests/elastic/fake_search_daemon.h"
+#include "tests/support/log_capture.h"
+
+namespace corvlumex {
+namespace fileindexd {
+namespace {
+namespace fs = std::filesystem;
+using testing_support::FakeAnswer;
+
+// Extraction without the worker: the document of a file is its path fields;
+// a file named "broken.txt" cannot be read.
+class StandInPlatform : public platform::LinuxPlatform {
+ public:
+  void ParseFile(const std::string& path, const Json::Value&, Json::Value& document) override {
+    if (fs::path(path).filename() == "broken.txt") throw std::runtime_error("not a readable file");
+    document["CORVMDPath"] = path;
+    document["CORVMDFSName"] = fs::path(path).filename().string();
+  }
+};
+
+class OpApplierTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    platform::Install(std::make_shared<StandInPlatform>());
+    share_ = root_.MakeDir("volume1/share");
+    root_.MakeDir("volume1/share/docs");
+    root_.WriteFile("etc/corvlumex/shares.json", "[{\"name\": \"share\", \"path\": \"" + share_ + "\"}]");
+    root_.WriteFile("var/packages/CorvLumex/etc/fileindex.folders",
+                    R"([{"path": "/share/docs", "name": "docs", "document": false, "audio": true, "video": true, "photo": true}])");
+    folders_ = std::make_unique<fileindex::FolderMgr>();
+    rules_ = std::make_unique<IndexRules>(*folders_, share_);
+    settle_ = std::make_unique<SettleTracker>(root_.path() + "/settle", SettleOptions());
+    applier_ = std::make_unique<OpApplier>("share", *rules_, progress_, *settle_);
+    daemon_.SetHandler(testing_support::AnswerSuccess);
+  }
+  void TearDown() override { platform::Install(nullptr); }
+
+  std::string Docs(const std::string& name) const { return share_ + "/docs/" + name; }
+  // "command doc_id" (or the query's prefix) of each request.
+  std::vector<std::string> Sent() const {
+    std::vector<std::string> out;
+    for (const Json::Value& request : daemon_.Requests()) {
+      const Json::Value& data = request["data"];
+      std::string target = data["doc_id"].asString();
+      if (target.empty()) target = data["query"]["qsl"]["prefix"]["CORVMDPath"].asString();
+      out.push_back(request["command"].asString() + " " + target);
+    }
+    return out;
+  }
+
+  testing_support::SandboxRoot root_;
+  testing_support::LogCapture log_;
+  testing_support::FakeSearchDaemon daemon_;
+  std::string share_;
+  std::unique_ptr<fileindex::FolderMgr> folders_;
+  std::unique_ptr<IndexRules> rules_;
+  ProgressBoard progress_;
+  std::unique_ptr<SettleTracker> settle_;
+  std::unique_ptr<OpApplier> applier_;
+};
+
+using Lines = std::vector<std::string>;
+
+TEST_F(OpApplierTest, UpsertStoresDeletesOrClearsByWhatIsOnDisk) {
+  root_.WriteFile("volume1/share/docs/main.c", "int x;");
+  root_.WriteFile("volume1/share/docs/notes.txt", "documents are off here");
+  applier_->Upsert(Docs("main.c"));
+  applier_->Upsert(Docs("notes.txt"));
+  applier_->Upsert(Docs("gone"));
+  EXPECT_EQ(Sent(), (Lines{"document_upsert_by_id " + Docs("main.c"), "document_del_by_id " + Docs("notes.txt"),
+                                  "document_del_by_id " + Docs("gone"), "document_del_by_query " + Docs("gone") + "/"}));
+}
+
+TEST_F(OpApplierTest, AnAttributeChangeOfAFileNeverStoredStoresItWhole) {
+  root_.WriteFile("volume1/share/docs/a.c", "x");
+  daemon_.Enqueue(FakeAnswer::Failure(2020, "No document with the id"));
+  applier_->Attr(Docs("a.c"));
+  EXPECT_EQ(Sent(), (Lines{"document_set_by_id " + Docs("a.c"), "document_upsert_by_id " + Docs("a.c")}));
+}
+
+TEST_F(OpApplierTest, ARenameWithoutAnOldDocumentIsReadFromDisk) {
+  root_.WriteFile("volume1/share/docs/new.c", "x");
+  daemon_.Enqueue(FakeAnswer::Failure(2020, "No document with the id"));
+  applier_->Rename(Docs("old.c"), Docs("new.c"));
+  EXPECT_EQ(Sent(), (Lines{"document_set_by_id " + Docs("old.c"), "document_del_by_id " + Docs("old.c"),
+                                  "document_del_by_query " + Docs("old.c") + "/", "document_upsert_by_id " + Docs("new.c")}));
+}
+
+TEST_F(OpApplierTest, ARenameIntoAHiddenFolderRemovesTheDocuments) {
+  root_.MakeDir("volume1/share/docs/@tmp");
+  root_.WriteFile("volume1/share/docs/@tmp/a.c", "x");
+  applier_->Rename(Docs("a.c"), Docs("@tmp/a.c"));
+  EXPECT_EQ(Sent(), (Lines{"document_del_by_id " + Docs("a.c"), "document_del_by_query " + Docs("a.c") + "/",
+                                  "document_del_by_id " + Docs("@tmp/a.c"),
+                                  "document_del_by_query " + Docs("@tmp/a.c") + "/"}));
+}
+
+TEST_F(OpApplierTest, AReindexStoresWhatChangedAndDeletesWhatIsGone) {
+  root_.MakeDir("volume1/share/docs/sub");
+  root_.WriteFile("volume1/share/docs/sub/same.c", "same");
+  root_.WriteFile("volume1/share/docs/sub/new.c", "new");
+  struct stat st;
+  ASSERT_EQ(lstat(Docs("sub/same.c").c_str(), &st), 0);
+  Json::Value listed(Json::arrayValue);
+  Json::Value same(Json::objectValue);
+  same["CORVMDPath"] = Docs("sub/same.c");
+  same["CORVMDFSContentChangeDate"] = static_cast<Json::Int64>(st.st_mtime);
+  same["CORVMDAttributeChangeDate"] = static_cast<Json::Int64>(st.st_ctime);
+  same["CORVMDFSSize"] = static_cast<Json::Int64>(st.st_size);
+  listed.append(same);
+  Json::Value stale(Json::objectValue);
+  stale["CORVMDPath"] = Docs("sub/stale.c");
+  listed.append(stale);
+  daemon_.Enqueue(FakeAnswer::Success(listed));
+  applier_->SetWalkThreads(2);
+  applier_->Reindex(Docs("sub"));
+  Lines commands = Sent();
+  ASSERT_EQ(commands.size(), 4u);
+  EXPECT_EQ(commands[0], "document_get_by_query " + Docs("sub") + "/");
+  std::sort(commands.begin() + 1, commands.begin() + 3);  // the walk's upserts run on two threads
+  EXPECT_EQ(commands[1], "document_upsert_by_id " + Docs("sub"));
+  EXPECT_EQ(commands[2], "document_upsert_by_id " + Docs("sub/new.c"));
+  EXPECT_EQ(commands[3], "document_del_by_id " + Docs("sub/stale.c"));
+}
+
+TEST_F(OpApplierTest, OneFileFailsAloneButAnIndexFailureStopsTheBatch) {
+  root_.WriteFile("volume1/share/docs/broken.txt", "x");
+  root_.WriteFile("volume1/share/docs/ok.c", "x");
+  folders_ = nullptr;
+  root_.WriteFile("var/packages/CorvLumex/etc/fileindex.folders",
+                  R"([{"path": "/share/docs", "name": "docs", "document": true, "audio": true, "video": true, "photo": true}])");
+  folders_ = std::make_unique<fileindex::FolderMgr>();
+  rules_ = std::make_unique<IndexRules>(*folders_, share_);
+  applier_ = std::make_unique<OpApplier>("share", *rules_, progress_, *settle_);
+  applier_->Upsert(Docs("broken.txt"));  // extraction fails: logged and skipped
+  EXPECT_EQ(progress_.Snapshot()["share"]["total_failed"].asUInt64(), 1u);
+  EXPECT_EQ(log_.Matching("upsert of " + Docs("broken.txt") + " skipped: code=914").size(), 1u);
+  daemon_.Enqueue(FakeAnswer::Failure(2010, "No index fileindex_share"));
+  try {
+    applier_->Upsert(Docs("ok.c"));
+    FAIL() << "a missing index must stop the batch";
+  } catch (const Error& error) {
+    EXPECT_EQ(error.code, 2010);
+  }
+}
+
+}  // namespace
+}  // namespace fileindexd
+}  // namespace corvlumex
