@@ -1,18 +1,12 @@
 #include "tests/corvelasticd/daemon_harness.h"
 
 #include <signal.h>
-#include <sys/prctl.h>
 #include <sys/socket.h>
 #include <sys/un.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
-#include <chrono>
 #include <cstring>
-#include <fstream>
-#include <sstream>
 #include <stdexcept>
-#include <thread>
 
 #include "common/error.h"
 #include "common/json_util.h"
@@ -24,12 +18,16 @@ namespace elasticd_test {
 namespace {
 
 std::string DaemonBinary() {
-  const char* build = getenv("FILEINDEX_BUILD_DIR");
-  if (build != nullptr && *build != '\0') return std::string(build) + "/programs/corvelasticd/corvelasticd";
-  return CORVELASTICD_BINARY;
+  return getenv("FILEINDEX_BUILD_DIR") != nullptr ? testing_support::ProgramPath("corvelasticd") : CORVELASTICD_BINARY;
 }
 
 }  // namespace
+
+Json::Value Data(const std::string& text) {
+  Json::Value value;
+  EXPECT_TRUE(JsonFromString(value, text)) << text;
+  return value;
+}
 
 int ConnectTo(const std::string& path) {
   const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
@@ -45,7 +43,7 @@ int ConnectTo(const std::string& path) {
 }
 
 Json::Value LibraryMappings() {
-  const char* text = R"({
+  return Data(R"({
     "property_id": "CORVMDPath",
     "default": {"type": "string", "analyzer": "corvstandard", "required": false, "stored": true, "_all": true},
     "properties": {
@@ -66,10 +64,7 @@ Json::Value LibraryMappings() {
       "CORVMDKeywords": {},
       "CORVMDSearchFileName": {"type": "text", "analyzer": "white space", "preprocess": ["tolower", "ngram"]},
       "_CORVMDUserTags": {"type": "text"}
-    }})";
-  Json::Value mappings;
-  JsonFromString(mappings, text);
-  return mappings;
+    }})");
 }
 
 Json::Value FileDocument(const std::string& path, const std::string& text, long long size) {
@@ -91,64 +86,30 @@ Json::Value FileDocument(const std::string& path, const std::string& text, long 
 Daemon::Daemon(const std::string& root, std::vector<std::string> extra_args)
     : root_(root), socket_(root + "/corvelasticd.sock"), log_(root + "/corvelasticd.log"), extra_args_(std::move(extra_args)) {}
 
-Daemon::~Daemon() {
-  if (pid_ > 0) Kill9();
-}
-
 void Daemon::Start() {
-  const std::string binary = DaemonBinary();
-  pid_ = fork();
-  if (pid_ == 0) {
-    // A test process that dies leaves no daemon behind.
-    prctl(PR_SET_PDEATHSIG, SIGKILL);
-    setenv("CORVLUMEX_ROOT", root_.c_str(), 1);
-    freopen(log_.c_str(), "a", stderr);
-    std::vector<std::string> args = {binary, "--socket", socket_, "--log-stderr"};
-    args.insert(args.end(), extra_args_.begin(), extra_args_.end());
-    std::vector<char*> argv;
-    for (std::string& arg : args) argv.push_back(&arg[0]);
-    argv.push_back(nullptr);
-    execv(binary.c_str(), argv.data());
-    _exit(127);
-  }
+  std::vector<std::string> args = {"--socket", socket_, "--log-stderr"};
+  args.insert(args.end(), extra_args_.begin(), extra_args_.end());
+  process_ = std::make_unique<testing_support::ChildProcess>(DaemonBinary(), args, log_,
+                                                             std::map<std::string, std::string>{{"CORVLUMEX_ROOT", root_}});
+  bool exited = false;
   // Ready when the socket answers.
-  for (int attempt = 0; attempt < 2000; ++attempt) {
-    const int fd = ConnectTo(socket_);
-    if (fd >= 0) {
-      close(fd);
-      return;
-    }
-    int status = 0;
-    if (waitpid(pid_, &status, WNOHANG) == pid_) {
-      pid_ = -1;
-      throw std::runtime_error("corvelasticd exited at start: " + LogText());
-    }
-    std::this_thread::sleep_for(std::chrono::milliseconds(5));
-  }
-  throw std::runtime_error("corvelasticd did not start: " + LogText());
-}
-
-void Daemon::Kill9() {
-  if (pid_ <= 0) return;
-  kill(pid_, SIGKILL);
-  waitpid(pid_, nullptr, 0);
-  pid_ = -1;
+  const bool ready = testing_support::PollUntil(
+      [&] {
+        const int fd = ConnectTo(socket_);
+        if (fd >= 0) close(fd);
+        exited = fd < 0 && !process_->Running();
+        return fd >= 0 || exited;
+      },
+      std::chrono::seconds(10));
+  if (exited) throw std::runtime_error("corvelasticd exited at start: " + LogText());
+  if (!ready) throw std::runtime_error("corvelasticd did not start: " + LogText());
 }
 
 int Daemon::Terminate() {
-  if (pid_ <= 0) return -1;
-  kill(pid_, SIGTERM);
-  int status = 0;
-  waitpid(pid_, &status, 0);
-  pid_ = -1;
+  if (!process_) return -1;
+  const int status = process_->Stop(SIGTERM);
+  process_.reset();
   return status;
-}
-
-std::string Daemon::LogText() const {
-  std::ifstream input(log_);
-  std::stringstream text;
-  text << input.rdbuf();
-  return text.str();
 }
 
 std::string Frame(const std::string& text) {
@@ -208,6 +169,39 @@ std::vector<std::string> HitIds(const Json::Value& answer) {
   std::vector<std::string> ids;
   for (const Json::Value& hit : answer["data"]["hits"]) ids.push_back(hit["doc_id"].asString());
   return ids;
+}
+
+void DaemonTest::SetUp() {
+  daemon_ = std::make_unique<Daemon>(root_.path(), ExtraArgs());
+  daemon_->Start();
+  Json::Value data;
+  data["path"] = root_.path() + "/volume1/share/@eaDir/index";
+  data["settings"] = Json::Value(Json::objectValue);
+  data["mappings"] = LibraryMappings();
+  data["event_handler"]["lib_path"] = root_.path() + "/no/such/handler.so";
+  const Json::Value answer = Run("index_create", data);
+  ASSERT_TRUE(answer["success"].asBool()) << JsonToString(answer);
+}
+
+Json::Value DaemonTest::Run(const std::string& command, Json::Value data) {
+  if (!data.isMember("id") && command != "search" && command != "suggest") data["id"] = kIndex;
+  return Command(daemon_->socket_path(), command, data);
+}
+
+void DaemonTest::Upsert(const std::string& path, const std::string& text, long long size) {
+  Json::Value data;
+  data["doc_id"] = path;
+  data["data"] = FileDocument(path, text, size);
+  const Json::Value answer = Run("document_upsert_by_id", data);
+  ASSERT_TRUE(answer["success"].asBool()) << JsonToString(answer);
+}
+
+void DaemonTest::Commit() { ASSERT_TRUE(Run("commit")["success"].asBool()); }
+
+Json::Value DaemonTest::Search(const std::string& qsl, const std::string& extra) {
+  Json::Value data = Data(extra);
+  data["query"]["qsl"] = Data(qsl);
+  return Run("search", data);
 }
 
 }  // namespace elasticd_test
