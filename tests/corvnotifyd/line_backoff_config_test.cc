@@ -21,13 +21,20 @@ using testing_support::SandboxRoot;
 
 // ---- queue lines ----
 
-TEST(QueueLineTest, PlainLineHasNoOldPath) {
+TEST(QueueLineTest, LinesAreExactJsonThatTheIndexerParses) {
   std::string out;
   FormatQueueLine(out, kEventCreate, false, "/v/s/a.txt");
   EXPECT_EQ(out, "{\"event\":64,\"is_dir\":false,\"path\":\"/v/s/a.txt\"}\n");
   out.clear();
   FormatQueueLine(out, kEventRename, true, "/v/s/new", "/v/s/old");
   EXPECT_EQ(out, "{\"event\":256,\"is_dir\":true,\"path\":\"/v/s/new\",\"path_old\":\"/v/s/old\"}\n");
+  out.pop_back();
+  const fileindex::Event event(out);
+  EXPECT_EQ(event.event, static_cast<uint32_t>(kEventRename));
+  EXPECT_TRUE(event.is_dir);
+  EXPECT_EQ(event.path, "/v/s/new");
+  EXPECT_EQ(event.path_old, "/v/s/old");
+  EXPECT_TRUE(event.data.isNull());
 }
 
 TEST(QueueLineTest, AwkwardNamesSurviveTheJsonReaderByteForByte) {
@@ -45,18 +52,6 @@ TEST(QueueLineTest, AwkwardNamesSurviveTheJsonReaderByteForByte) {
   EXPECT_EQ(event.path_old, "/v/s/\x80old");
   EXPECT_EQ(event.event, 128u);
   EXPECT_FALSE(event.is_dir);
-}
-
-TEST(QueueLineTest, EveryLineTheNotifierWritesParsesAsAnEvent) {
-  std::string out;
-  FormatQueueLine(out, kEventRename, true, "/v/s/new", "/v/s/old");
-  out.pop_back();
-  const fileindex::Event event(out);
-  EXPECT_EQ(event.event, static_cast<uint32_t>(kEventRename));
-  EXPECT_TRUE(event.is_dir);
-  EXPECT_EQ(event.path, "/v/s/new");
-  EXPECT_EQ(event.path_old, "/v/s/old");
-  EXPECT_TRUE(event.data.isNull());
 }
 
 // ---- back-off of crash markers ----
@@ -132,11 +127,7 @@ TEST(MonitorConfigTest, ReadsQueueFoldersMaskAndIgnoreNames) {
   EXPECT_EQ(config.roots[0].mask, 65478u);
   EXPECT_EQ(config.roots[0].ignore, std::vector<std::string>{"@eaDir"});
   EXPECT_TRUE(config.roots[1].ignore.empty());
-}
-
-TEST(MonitorConfigTest, NullConfigMeansNoFolders) {
-  MonitorQueueConfig config;
-  std::string error;
+  // Null means no folders.
   ASSERT_TRUE(ParseMonitorQueue(Parse(R"({"queue": "/v/s/q", "config": null})"), &config, &error));
   EXPECT_TRUE(config.roots.empty());
 }

@@ -1,17 +1,11 @@
 #include "tests/corvnotifyd/notifyd_harness.h"
 
-#include <fcntl.h>
-#include <signal.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
-#include <cstdlib>
 #include <filesystem>
-#include <fstream>
 #include <sstream>
-#include <thread>
 
 #include <gtest/gtest.h>
 
@@ -22,14 +16,7 @@
 namespace corvlumex {
 namespace testing_support {
 
-std::string ReadWholeFile(const std::string& path) {
-  std::ifstream in(path, std::ios::binary);
-  std::stringstream text;
-  text << in.rdbuf();
-  return text.str();
-}
-
-std::vector<QueueLine> ReadQueue(const std::string& path) { return ParseQueueText(ReadWholeFile(path)); }
+std::vector<QueueLine> ReadQueue(const std::string& path) { return ParseQueueText(ReadFileText(path)); }
 
 std::vector<QueueLine> ParseQueueText(const std::string& text) {
   std::vector<QueueLine> lines;
@@ -52,58 +39,6 @@ void PrintTo(const QueueLine& line, std::ostream* out) {
   *out << "{" << line.event << (line.is_dir ? " dir " : " ") << line.path;
   if (!line.path_old.empty()) *out << " <- " << line.path_old;
   *out << "}";
-}
-
-bool WaitUntil(const std::function<bool()>& condition, std::chrono::milliseconds timeout) {
-  const auto deadline = std::chrono::steady_clock::now() + timeout;
-  while (!condition()) {
-    if (std::chrono::steady_clock::now() > deadline) return false;
-    // A real process is being waited for: a short real pause.
-    std::this_thread::sleep_for(std::chrono::milliseconds(2));
-  }
-  return true;
-}
-
-NotifydProcess::NotifydProcess(const std::string& log_path, const std::vector<std::string>& args,
-                               const std::map<std::string, std::string>& env)
-    : log_path_(log_path) {
-  const char* build = getenv("FILEINDEX_BUILD_DIR");
-  const std::string program = std::string(build ? build : ".") + "/programs/corvnotifyd/corvnotifyd";
-  std::vector<std::string> words{program};
-  words.insert(words.end(), args.begin(), args.end());
-  pid_ = fork();
-  if (pid_ == 0) {
-    for (const auto& [key, value] : env) setenv(key.c_str(), value.c_str(), 1);
-    const int log = open(log_path.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0644);
-    dup2(log, 2);
-    std::vector<char*> argv;
-    for (std::string& word : words) argv.push_back(&word[0]);
-    argv.push_back(nullptr);
-    execv(program.c_str(), argv.data());
-    _exit(127);
-  }
-}
-
-NotifydProcess::~NotifydProcess() {
-  if (pid_ > 0) Stop(SIGKILL);
-}
-
-int NotifydProcess::Stop(int signal) {
-  if (pid_ <= 0) return -1;
-  kill(pid_, signal);
-  return Wait();
-}
-
-int NotifydProcess::Wait() {
-  if (pid_ <= 0) return -1;
-  int status = 0;
-  waitpid(pid_, &status, 0);
-  pid_ = -1;
-  return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
-}
-
-bool NotifydProcess::WaitForLog(const std::string& needle) const {
-  return WaitUntil([&] { return Log().find(needle) != std::string::npos; });
 }
 
 NotifydSandbox::NotifydSandbox() {
@@ -146,16 +81,25 @@ void NotifydSandbox::RemoveConfig(const std::string& name) { unlink((config_dir(
 
 std::vector<std::string> NotifydSandbox::Notices() const {
   std::vector<std::string> notices;
-  std::stringstream text(ReadWholeFile(root_.path() + "/notices.log"));
+  std::stringstream text(ReadFileText(root_.path() + "/notices.log"));
   std::string line;
   while (std::getline(text, line)) notices.push_back(line);
   return notices;
 }
 
-std::unique_ptr<NotifydProcess> NotifydSandbox::Start(const std::map<std::string, std::string>& env) {
-  auto process = std::make_unique<NotifydProcess>(log_path(), std::vector<std::string>{"--foreground"}, env);
-  EXPECT_TRUE(process->WaitForLog("watching as configured")) << process->Log();
+std::unique_ptr<ChildProcess> NotifydSandbox::Run(const std::vector<std::string>& args,
+                                                 const std::map<std::string, std::string>& env) const {
+  return std::make_unique<ChildProcess>(ProgramPath("corvnotifyd"), args, log_path(), env);
+}
+
+std::unique_ptr<ChildProcess> NotifydSandbox::Start(const std::map<std::string, std::string>& env) const {
+  auto process = Run({"--foreground"}, env);
+  EXPECT_TRUE(WaitForLog("watching as configured")) << process->Log();
   return process;
+}
+
+bool NotifydSandbox::WaitForLog(const std::string& needle) const {
+  return WaitUntil([&] { return ReadFileText(log_path()).find(needle) != std::string::npos; });
 }
 
 bool NotifydSandbox::Sync(const std::string& path, const std::string& queue) {

@@ -3,8 +3,6 @@
 // notification tool, and helpers that read back the share's queue.
 #pragma once
 
-#include <sys/types.h>
-
 #include <chrono>
 #include <cstdint>
 #include <functional>
@@ -14,6 +12,7 @@
 #include <string>
 #include <vector>
 
+#include "tests/support/child_process.h"
 #include "tests/support/log_capture.h"
 
 namespace corvlumex {
@@ -34,32 +33,14 @@ inline QueueLine Line(uint32_t event, const std::string& path, bool is_dir = fal
   return QueueLine{event, is_dir, path, path_old};
 }
 
-std::string ReadWholeFile(const std::string& path);
 // Every line of a queue file, parsed; a line that does not parse fails the test.
 std::vector<QueueLine> ReadQueue(const std::string& path);
 std::vector<QueueLine> ParseQueueText(const std::string& text);
 // Polls `condition` (every 2 ms) until it holds or `timeout` passes.
-bool WaitUntil(const std::function<bool()>& condition,
-               std::chrono::milliseconds timeout = std::chrono::milliseconds(15000));
-
-class NotifydProcess {
- public:
-  // Starts corvnotifyd --foreground with `args`, standard error into
-  // `log_path`, and `env` added to the environment.
-  NotifydProcess(const std::string& log_path, const std::vector<std::string>& args,
-                 const std::map<std::string, std::string>& env);
-  ~NotifydProcess();
-  // Sends `signal` and waits: the exit status, or 128 + signal when killed.
-  int Stop(int signal);
-  // Waits for the program to end on its own.
-  int Wait();
-  std::string Log() const { return ReadWholeFile(log_path_); }
-  bool WaitForLog(const std::string& needle) const;
-
- private:
-  std::string log_path_;
-  pid_t pid_ = -1;
-};
+inline bool WaitUntil(const std::function<bool()>& condition,
+                      std::chrono::milliseconds timeout = std::chrono::milliseconds(15000)) {
+  return PollUntil(condition, timeout, std::chrono::milliseconds(2));
+}
 
 // A sandbox with one share "share" holding the indexed folder "docs". The
 // share lives on /dev/shm when it exists (file creation on a disk with
@@ -79,8 +60,13 @@ class NotifydSandbox {
   void RemoveConfig(const std::string& name);
   // Lines the stand-in notification tool received, one per run.
   std::vector<std::string> Notices() const;
+  // Starts corvnotifyd --foreground (or with `args`), standard error into
+  // log_path(), `env` added to the environment.
+  std::unique_ptr<ChildProcess> Run(const std::vector<std::string>& args = {"--foreground"},
+                                    const std::map<std::string, std::string>& env = {}) const;
   // Starts the daemon and waits until its watches are in place.
-  std::unique_ptr<NotifydProcess> Start(const std::map<std::string, std::string>& env = {});
+  std::unique_ptr<ChildProcess> Start(const std::map<std::string, std::string>& env = {}) const;
+  bool WaitForLog(const std::string& needle) const;
   std::vector<QueueLine> Queue() const { return ReadQueue(queue_); }
   // Makes the folder `path` and waits until its create line is in `queue`:
   // every event before it has then been written too.

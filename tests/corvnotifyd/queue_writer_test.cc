@@ -19,7 +19,7 @@ namespace notifyd {
 namespace {
 
 using testing_support::LogCapture;
-using testing_support::ReadWholeFile;
+using testing_support::ReadFileText;
 using testing_support::SandboxRoot;
 using testing_support::SleepRecorder;
 
@@ -34,7 +34,7 @@ TEST_F(QueueWriterTest, MakesTheQueueFolderOfAnExistingShareAndAppends) {
   std::string error;
   ASSERT_TRUE(AppendQueueLines(queue_, "one\n", &error)) << error;
   ASSERT_TRUE(AppendQueueLines(queue_, "two\nthree\n", &error)) << error;
-  EXPECT_EQ(ReadWholeFile(queue_), "one\ntwo\nthree\n");
+  EXPECT_EQ(ReadFileText(queue_), "one\ntwo\nthree\n");
 }
 
 TEST_F(QueueWriterTest, AVanishedShareIsNotMadeAgain) {
@@ -62,7 +62,7 @@ TEST_F(QueueWriterTest, AFailedWriteLeavesNoHalfLine) {
   signal(SIGXFSZ, old_handler);
   EXPECT_FALSE(ok);
   EXPECT_NE(error.find("write failed"), std::string::npos) << error;
-  EXPECT_EQ(ReadWholeFile(queue_), std::string(100, 'a') + "\n");
+  EXPECT_EQ(ReadFileText(queue_), std::string(100, 'a') + "\n");
 }
 
 TEST_F(QueueWriterTest, LinesWaitWhileTheQueueIsLockedAndKeepTheirOrder) {
@@ -86,7 +86,7 @@ TEST_F(QueueWriterTest, LinesWaitWhileTheQueueIsLockedAndKeepTheirOrder) {
   EXPECT_EQ(log.Matching("cannot append to queue " + queue_).size(), 1u) << "said once";
   writer.Flush(t0 + std::chrono::seconds(1), false);
   EXPECT_FALSE(writer.HasPending());
-  EXPECT_EQ(ReadWholeFile(queue_), "first\nsecond\n");
+  EXPECT_EQ(ReadFileText(queue_), "first\nsecond\n");
   EXPECT_EQ(log.Matching("is writable again").size(), 1u);
   EXPECT_TRUE(lost.empty());
 }
