@@ -1,30 +1,25 @@
 #include "tests/system/cli_runner.h"
 
 #include <fcntl.h>
-#include <stdlib.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <fstream>
-#include <sstream>
+#include "tests/support/child_process.h"
 
 namespace corvlumex {
 namespace testing_support {
 namespace {
 
 std::string ReadAndRemove(const std::string& path) {
-  std::ifstream in(path);
-  std::stringstream text;
-  text << in.rdbuf();
+  const std::string text = ReadFileText(path);
   unlink(path.c_str());
-  return text.str();
+  return text;
 }
 
 }  // namespace
 
 CliResult RunCli(const std::vector<std::string>& args) {
-  const char* build = getenv("FILEINDEX_BUILD_DIR");
-  const std::string program = std::string(build != nullptr ? build : ".") + "/programs/fileindex/fileindex";
+  const std::string program = ProgramPath("fileindex");
   char out_name[] = "/tmp/fileindex-cli-out-XXXXXX";
   char err_name[] = "/tmp/fileindex-cli-err-XXXXXX";
   const int out_fd = mkstemp(out_name);

@@ -83,7 +83,7 @@ TEST_F(SystemChangesTest, CreateModifyAttributeAndDeleteOfFiles) {
   ASSERT_EQ(box_.Converge(Docs()), "");
 }
 
-TEST_F(SystemChangesTest, RenamesOfFilesAndFoldersWithNestedContent) {
+TEST_F(SystemChangesTest, RenamesAndMovesOfFilesAndFoldersWithNestedContent) {
   ASSERT_EQ(rename(box_.Path("docs/readme.md").c_str(), box_.Path("docs/guide.md").c_str()), 0);
   ASSERT_EQ(box_.Converge(Docs()), "");
   EXPECT_TRUE(Finds("ferry", {box_.Path("docs/guide.md")}));
@@ -97,17 +97,32 @@ TEST_F(SystemChangesTest, RenamesOfFilesAndFoldersWithNestedContent) {
   ASSERT_EQ(rename(box_.Path("docs/archive").c_str(), box_.Path("docs/deep/archive").c_str()), 0);
   WriteText(box_.Path("docs/deep/archive/2026/late.txt"), "late addition");
   ASSERT_EQ(box_.Converge(Docs()), "");
-}
 
-TEST_F(SystemChangesTest, MovesInAndOutOfTheWatchedTree) {
+  // Into the watched tree and out of it.
   ASSERT_EQ(rename(box_.Path("outside/nested").c_str(), box_.Path("docs/nested").c_str()), 0);
   ASSERT_EQ(box_.Converge(Docs()), "");
   EXPECT_TRUE(Finds("telescope", {box_.Path("docs/nested/visitor.txt")}));
-
-  ASSERT_EQ(rename(box_.Path("docs/reports").c_str(), box_.Path("outside/reports").c_str()), 0);
-  ASSERT_EQ(rename(box_.Path("docs/readme.md").c_str(), box_.Path("outside/readme.md").c_str()), 0);
+  ASSERT_EQ(rename(box_.Path("docs/deep").c_str(), box_.Path("outside/deep").c_str()), 0);
+  ASSERT_EQ(rename(box_.Path("docs/guide.md").c_str(), box_.Path("outside/guide.md").c_str()), 0);
   ASSERT_EQ(box_.Converge(Docs()), "");
   EXPECT_TRUE(box_.Search("lighthouse").empty());
+  EXPECT_TRUE(box_.Search("ferry").empty());
+
+  // Two folders swapped through a third name.
+  fs::create_directories(box_.Path("docs/left"));
+  fs::create_directories(box_.Path("docs/right"));
+  WriteText(box_.Path("docs/left/a.txt"), "apricot");
+  WriteText(box_.Path("docs/left/common.txt"), "left side");
+  WriteText(box_.Path("docs/right/b.txt"), "blueberry");
+  WriteText(box_.Path("docs/right/common.txt"), "right side");
+  ASSERT_EQ(box_.Converge(Docs()), "");
+  ASSERT_EQ(rename(box_.Path("docs/left").c_str(), box_.Path("docs/swap").c_str()), 0);
+  ASSERT_EQ(rename(box_.Path("docs/right").c_str(), box_.Path("docs/left").c_str()), 0);
+  ASSERT_EQ(rename(box_.Path("docs/swap").c_str(), box_.Path("docs/right").c_str()), 0);
+  ASSERT_EQ(box_.Converge(Docs()), "");
+  EXPECT_TRUE(Finds("apricot", {box_.Path("docs/right/a.txt")}));
+  EXPECT_TRUE(Finds("blueberry", {box_.Path("docs/left/b.txt")}));
+  EXPECT_TRUE(Finds("left side", {box_.Path("docs/right/common.txt")}));
 }
 
 TEST_F(SystemChangesTest, SaveByRenamingATemporaryFileOverTheOriginal) {
@@ -120,24 +135,6 @@ TEST_F(SystemChangesTest, SaveByRenamingATemporaryFileOverTheOriginal) {
   ASSERT_EQ(box_.Converge(Docs()), "");
   EXPECT_TRUE(box_.Search("harbour").empty());
   EXPECT_TRUE(box_.Search("draft").empty());
-}
-
-TEST_F(SystemChangesTest, TwoFoldersSwappedByRenames) {
-  fs::create_directories(box_.Path("docs/left"));
-  fs::create_directories(box_.Path("docs/right"));
-  WriteText(box_.Path("docs/left/a.txt"), "apricot");
-  WriteText(box_.Path("docs/left/common.txt"), "left side");
-  WriteText(box_.Path("docs/right/b.txt"), "blueberry");
-  WriteText(box_.Path("docs/right/common.txt"), "right side");
-  ASSERT_EQ(box_.Converge(Docs()), "");
-
-  ASSERT_EQ(rename(box_.Path("docs/left").c_str(), box_.Path("docs/swap").c_str()), 0);
-  ASSERT_EQ(rename(box_.Path("docs/right").c_str(), box_.Path("docs/left").c_str()), 0);
-  ASSERT_EQ(rename(box_.Path("docs/swap").c_str(), box_.Path("docs/right").c_str()), 0);
-  ASSERT_EQ(box_.Converge(Docs()), "");
-  EXPECT_TRUE(Finds("apricot", {box_.Path("docs/right/a.txt")}));
-  EXPECT_TRUE(Finds("blueberry", {box_.Path("docs/left/b.txt")}));
-  EXPECT_TRUE(Finds("left side", {box_.Path("docs/right/common.txt")}));
 }
 
 TEST_F(SystemChangesTest, SettingsChangeAddsAndRemovesTheCategories) {

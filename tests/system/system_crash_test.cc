@@ -8,8 +8,7 @@
 #include <unistd.h>
 
 #include <filesystem>
-#include <fstream>
-#include <sstream>
+#include <cstdlib>
 
 #include "common/json_util.h"
 #include "fileindex/communication.h"
@@ -21,20 +20,13 @@ namespace testing_support {
 namespace {
 namespace fs = std::filesystem;
 
-// Waits until fileindexd reports a batch under way with some files done.
-std::string ReadText(const std::string& path) {
-  std::ifstream in(path);
-  std::stringstream text;
-  text << in.rdbuf();
-  return text.str();
-}
-
 Json::Value ShareData() {
   Json::Value data(Json::objectValue);
   data["share_name"] = "share";
   return data;
 }
 
+// Waits until fileindexd reports a batch under way with some files done.
 bool MidBatch(SystemSandbox& box) {
   return PollUntil(
       [&] {
@@ -69,15 +61,8 @@ TEST(SystemCrashTest, KillDuringALargeBatchThenRestartConverges) {
   ASSERT_EQ(box.Converge(box.DiskPaths("bulk"), std::chrono::seconds(120)), "");
 }
 
-long KernelQueueLimit() {
-  std::ifstream in("/proc/sys/fs/inotify/max_queued_events");
-  long value = 0;
-  in >> value;
-  return value;
-}
-
 TEST(SystemCrashTest, LostNotificationsLeadToAFullReindexThatConverges) {
-  const long limit = KernelQueueLimit();
+  const long limit = std::atol(ReadFileText("/proc/sys/fs/inotify/max_queued_events").c_str());
   if (limit <= 0 || limit > 1000000) GTEST_SKIP() << "kernel queue limit unusable: " << limit;
   SystemSandbox box;
   fs::create_directories(box.Path("docs/sub"));
@@ -137,25 +122,24 @@ TEST(SystemCrashTest, AFullVolumeStopsTheShareUntilThereIsRoomAgain) {
   // up, and indexing them fails for want of room.
   fileindex::StatusMgr().Pause(0);
   for (int i = 0; i < 50; ++i) WriteText(box.Path("docs/late" + std::to_string(i) + ".txt"), std::string(4096, 'y'));
-  ASSERT_TRUE(PollUntil([&] { return ReadText(box.Path("@eaDir/fileindex.queue")).find("late49") != std::string::npos; },
+  ASSERT_TRUE(PollUntil([&] { return ReadFileText(box.Path("@eaDir/fileindex.queue")).find("late49") != std::string::npos; },
                         std::chrono::seconds(10)));
   FillVolume(box.Path("filler"));
   fileindex::StatusMgr().Resume();
   ASSERT_TRUE(PollUntil([&] { return box.IndexerStatus().find("\"no_space\"") != std::string::npos; },
                         std::chrono::seconds(60)))
       << box.IndexerStatus() << box.Logs();
-  EXPECT_TRUE(PollUntil([&] { return ReadText(notices).find("error:index_no_space") != std::string::npos; },
+  EXPECT_TRUE(PollUntil([&] { return ReadFileText(notices).find("error:index_no_space") != std::string::npos; },
                         std::chrono::seconds(10)));
-  EXPECT_NE(ReadText(box.root() + "/var/packages/CorvLumex/etc/fileindex.status").find("\"share\":1"), std::string::npos);
+  const std::string status_file = box.root() + "/var/packages/CorvLumex/etc/fileindex.status";
+  EXPECT_NE(ReadFileText(status_file).find("\"share\":1"), std::string::npos);
 
   // Room again, and the share's worker asked for: the share is rebuilt whole.
   ASSERT_EQ(unlink(box.Path("filler").c_str()), 0);
   fileindex::SendCommandToDaemon("worker_create", ShareData());
   ASSERT_EQ(box.Converge(box.DiskPaths("docs"), std::chrono::seconds(60)), "");
-  EXPECT_TRUE(PollUntil(
-      [&] { return ReadText(box.root() + "/var/packages/CorvLumex/etc/fileindex.status").find("\"share\":1") == std::string::npos; },
-      std::chrono::seconds(10)))
-      << ReadText(box.root() + "/var/packages/CorvLumex/etc/fileindex.status") << box.IndexerStatus() << box.Logs();
+  EXPECT_TRUE(PollUntil([&] { return ReadFileText(status_file).find("\"share\":1") == std::string::npos; }, std::chrono::seconds(10)))
+      << ReadFileText(status_file) << box.IndexerStatus() << box.Logs();
 }
 
 }  // namespace

@@ -1,16 +1,10 @@
 #include "tests/system/system_harness.h"
 
-#include <fcntl.h>
-#include <signal.h>
-#include <stdlib.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <filesystem>
 #include <fstream>
-#include <sstream>
-#include <thread>
 
 #include "common/error.h"
 #include "common/json_util.h"
@@ -23,11 +17,6 @@ namespace testing_support {
 namespace fs = std::filesystem;
 
 namespace {
-
-std::string ProgramPath(const std::string& name) {
-  const char* build = getenv("FILEINDEX_BUILD_DIR");
-  return std::string(build != nullptr ? build : ".") + "/programs/" + name + "/" + name;
-}
 
 bool WaitForSocket(const std::string& path) {
   return PollUntil([&] { return access(path.c_str(), F_OK) == 0; }, std::chrono::seconds(20));
@@ -48,58 +37,9 @@ Json::Value FolderObject(const std::string& relative, bool document, bool audio,
 
 }  // namespace
 
-bool PollUntil(const std::function<bool()>& condition, std::chrono::milliseconds timeout) {
-  const auto deadline = std::chrono::steady_clock::now() + timeout;
-  for (;;) {
-    if (condition()) return true;
-    if (std::chrono::steady_clock::now() >= deadline) return false;
-    std::this_thread::sleep_for(std::chrono::milliseconds(10));
-  }
-}
-
 void WriteText(const std::string& path, const std::string& content) {
   std::ofstream out(path, std::ios::binary | std::ios::trunc);
   out << content;
-}
-
-DaemonProcess::DaemonProcess(const std::string& program, const std::vector<std::string>& args,
-                             const std::string& log_path, const std::map<std::string, std::string>& env)
-    : log_path_(log_path) {
-  const std::string path = ProgramPath(program);
-  std::vector<std::string> words{path};
-  words.insert(words.end(), args.begin(), args.end());
-  pid_ = fork();
-  if (pid_ == 0) {
-    for (const auto& [key, value] : env) setenv(key.c_str(), value.c_str(), 1);
-    const int log = open(log_path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
-    dup2(log, STDOUT_FILENO);
-    dup2(log, STDERR_FILENO);
-    std::vector<char*> argv;
-    for (std::string& word : words) argv.push_back(&word[0]);
-    argv.push_back(nullptr);
-    execv(path.c_str(), argv.data());
-    _exit(127);
-  }
-}
-
-DaemonProcess::~DaemonProcess() {
-  if (pid_ > 0) Stop(SIGKILL);
-}
-
-int DaemonProcess::Stop(int signal) {
-  if (pid_ <= 0) return -1;
-  kill(pid_, signal);
-  int status = 0;
-  waitpid(pid_, &status, 0);
-  pid_ = -1;
-  return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
-}
-
-std::string DaemonProcess::Log() const {
-  std::ifstream in(log_path_);
-  std::stringstream text;
-  text << in.rdbuf();
-  return text.str();
 }
 
 SystemSandbox::SystemSandbox() {
@@ -129,11 +69,9 @@ void SystemSandbox::InstallNoticeTool(const std::string& log_path) {
 
 void SystemSandbox::StartAll(const std::vector<std::string>& indexer_args,
                              const std::map<std::string, std::string>& notifier_env) {
-  search_daemon_ = std::make_unique<DaemonProcess>("corvelasticd", std::vector<std::string>{"--log-stderr"},
-                                                   root() + "/corvelasticd.log");
+  search_daemon_ = Launch("corvelasticd", {"--log-stderr"});
   if (!WaitForSocket(root() + "/var/run/corvelasticd.sock")) throw Error(kErrorSystem, "corvelasticd did not start");
-  notifier_ = std::make_unique<DaemonProcess>("corvnotifyd", std::vector<std::string>{"--foreground"},
-                                              root() + "/corvnotifyd.log", notifier_env);
+  notifier_ = Launch("corvnotifyd", {"--foreground"}, notifier_env);
   StartIndexer(indexer_args);
 }
 
@@ -141,7 +79,7 @@ void SystemSandbox::StartIndexer(const std::vector<std::string>& args) {
   if (!args.empty() || indexer_args_.empty()) indexer_args_ = args;
   std::vector<std::string> words{"--foreground"};
   words.insert(words.end(), indexer_args_.begin(), indexer_args_.end());
-  indexer_ = std::make_unique<DaemonProcess>("fileindexd", words, root() + "/fileindexd.log");
+  indexer_ = Launch("fileindexd", words);
   if (!WaitForSocket(root() + "/var/run/fileindexd.sock")) throw Error(kErrorSystem, "fileindexd did not start");
 }
 
@@ -150,13 +88,15 @@ void SystemSandbox::StopIndexer(int signal) {
   indexer_.reset();
 }
 
+std::unique_ptr<ChildProcess> SystemSandbox::Launch(const std::string& program, const std::vector<std::string>& args,
+                                                   const std::map<std::string, std::string>& env) const {
+  return std::make_unique<ChildProcess>(ProgramPath(program), args, root() + "/" + program + ".log", env);
+}
+
 std::string SystemSandbox::Logs() const {
   std::string text;
   for (const char* name : {"corvelasticd", "corvnotifyd", "fileindexd"}) {
-    std::ifstream in(root() + "/" + name + ".log");
-    std::stringstream content;
-    content << in.rdbuf();
-    text += std::string("---- ") + name + "\n" + content.str();
+    text += std::string("---- ") + name + "\n" + ReadFileText(root() + "/" + name + ".log");
   }
   return text;
 }
@@ -243,10 +183,7 @@ std::string SystemSandbox::Converge(const std::set<std::string>& expected, std::
   return report + "status: " + IndexerStatus() + "\n" + Logs();
 }
 
-std::string SystemSandbox::IndexerStatus() const {
-  CliResult result = RunCli({"--json", "status"});
-  return result.out;
-}
+std::string SystemSandbox::IndexerStatus() const { return RunCli({"--json", "status"}).out; }
 
 }  // namespace testing_support
 }  // namespace corvlumex

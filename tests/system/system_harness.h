@@ -6,7 +6,6 @@
 #pragma once
 
 #include <json/json.h>
-#include <sys/types.h>
 
 #include <chrono>
 #include <functional>
@@ -16,30 +15,11 @@
 #include <string>
 #include <vector>
 
+#include "tests/support/child_process.h"
 #include "tests/support/log_capture.h"
 
 namespace corvlumex {
 namespace testing_support {
-
-// Polls `condition` every 10 ms until it holds or `timeout` passes.
-bool PollUntil(const std::function<bool()>& condition, std::chrono::milliseconds timeout);
-
-// One of the system's programs, started from the build folder with standard
-// error into a log file.
-class DaemonProcess {
- public:
-  DaemonProcess(const std::string& program, const std::vector<std::string>& args, const std::string& log_path,
-                const std::map<std::string, std::string>& env = {});
-  ~DaemonProcess();  // SIGKILL when still running
-  // Sends `signal` and waits; the exit status, or 128 + the signal.
-  int Stop(int signal);
-  pid_t pid() const { return pid_; }
-  std::string Log() const;
-
- private:
-  pid_t pid_ = -1;
-  std::string log_path_;
-};
 
 class SystemSandbox {
  public:
@@ -60,7 +40,7 @@ class SystemSandbox {
   void StartIndexer(const std::vector<std::string>& args = {});
   // kill -9 (or another signal) of fileindexd.
   void StopIndexer(int signal);
-  DaemonProcess& indexer() { return *indexer_; }
+  ChildProcess& indexer() { return *indexer_; }
   std::string Logs() const;
 
   // FolderAdd of /share/<relative> (relative may be empty: the whole share)
@@ -94,9 +74,13 @@ class SystemSandbox {
   SandboxRoot root_;
   std::string volume_;
   std::string share_dir_;
-  std::unique_ptr<DaemonProcess> search_daemon_;
-  std::unique_ptr<DaemonProcess> notifier_;
-  std::unique_ptr<DaemonProcess> indexer_;
+  // Started from the system's programs of the build folder.
+  std::unique_ptr<ChildProcess> Launch(const std::string& program, const std::vector<std::string>& args,
+                                       const std::map<std::string, std::string>& env = {}) const;
+
+  std::unique_ptr<ChildProcess> search_daemon_;
+  std::unique_ptr<ChildProcess> notifier_;
+  std::unique_ptr<ChildProcess> indexer_;
   std::vector<std::string> indexer_args_;
 };
 

@@ -41,7 +41,7 @@ TEST(SystemRecoveryTest, PreservedNamesAndTheRecycleBinAreNeverIndexed) {
   EXPECT_EQ(box.Search("holiday").size(), 1u);
 }
 
-TEST(SystemRecoveryTest, CommandLineStatusFoldersAndSearch) {
+TEST(SystemRecoveryTest, CommandLineFoldersSearchAndPausesOfTheIndexerAndOfAShare) {
   SystemSandbox box;
   fs::create_directories(box.Path("docs"));
   WriteText(box.Path("docs/menu.txt"), "saffron paella");
@@ -85,14 +85,8 @@ TEST(SystemRecoveryTest, CommandLineStatusFoldersAndSearch) {
   EXPECT_FALSE(PollUntil([&] { return !box.Search("paused").empty(); }, std::chrono::milliseconds(1500)));
   ASSERT_EQ(RunCli({"resume"}).status, 0);
   ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
-}
 
-TEST(SystemRecoveryTest, APausedShareHasNoWorkerUntilResumed) {
-  SystemSandbox box;
-  fs::create_directories(box.Path("docs"));
-  box.StartAll();
-  box.AddFolder("docs");
-  ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
+  // A paused share has no worker until it is resumed.
   CliResult paused = RunCli({"share", "pause", "share"});
   ASSERT_EQ(paused.status, 0) << paused.err;
   Json::Value status;
@@ -103,15 +97,9 @@ TEST(SystemRecoveryTest, APausedShareHasNoWorkerUntilResumed) {
   CliResult resumed = RunCli({"share", "resume", "share"});
   ASSERT_EQ(resumed.status, 0) << resumed.err;
   ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
-}
 
-TEST(SystemRecoveryTest, APauseWithAResumeTimeEndsByItself) {
-  SystemSandbox box;
-  fs::create_directories(box.Path("docs"));
-  box.StartAll();
-  box.AddFolder("docs");
-  ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
-  // What the status manager sends for a pause of some hours, two seconds long.
+  // A pause with a resume time, as the status manager sends it for some
+  // hours, two seconds long here: it ends by itself.
   Json::Value pause(Json::objectValue);
   const auto resume_time = std::chrono::system_clock::now() + std::chrono::seconds(2);
   pause["resume_time"] = static_cast<Json::Int64>(std::chrono::system_clock::to_time_t(resume_time));
