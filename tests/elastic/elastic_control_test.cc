@@ -121,7 +121,9 @@ TEST_F(ElasticControlTest, ShareIndexCommandsCarryTheirEnvelopes) {
   }
 }
 
-TEST_F(ElasticControlTest, IndexCreateSendsTheDatabasePathAndTheSchema) {
+TEST_F(ElasticControlTest, IndexCreateSendsTheDatabasePathAndTheSchemaOfAKnownShareOnly) {
+  EXPECT_THROW(ShareIndexCreate("nosuch"), Error);
+  EXPECT_TRUE(daemon_.Requests().empty());
   ShareIndexCreate("music");
   const Json::Value req = OnlyRequest();
   EXPECT_EQ(req["command"].asString(), "index_create");
@@ -133,11 +135,6 @@ TEST_F(ElasticControlTest, IndexCreateSendsTheDatabasePathAndTheSchema) {
   EXPECT_EQ(data["settings"], GetFileIndexSettings());
   EXPECT_EQ(data["mappings"], GetFileIndexMappings());
   EXPECT_EQ(data["event_handler"], GetFileIndexEventHandler());
-}
-
-TEST_F(ElasticControlTest, IndexCreateOfAnUnknownShareSendsNothing) {
-  EXPECT_THROW(ShareIndexCreate("nosuch"), Error);
-  EXPECT_TRUE(daemon_.Requests().empty());
 }
 
 TEST_F(ElasticControlTest, UpsertSendsTheExtractedDocumentWithItsSearchName) {
@@ -191,14 +188,12 @@ TEST_F(ElasticControlTest, RenameRewritesTheFolderAndEveryDescendantByPosition) 
       {"command": "document_set_by_id", "data": {"id": "fileindex_s", "doc_id": "/v/s/a/x/y.txt",
        "data": {"CORVMDParent": "/v/s/b.Dir/x", "CORVMDPath": "/v/s/b.Dir/x/y.txt",
                 "CORVMDSearchFileName": "y.txt"}}}]})"));
-}
-
-TEST_F(ElasticControlTest, RenameWithoutDescendantsSendsAnEmptyCompound) {
+  // Without descendants, the compound is empty.
   daemon_.Enqueue(FakeAnswer::Success());
   daemon_.Enqueue(FakeAnswer::Success(Json::Value(Json::arrayValue)));
   IndexRename("s", "/v/s/a.txt", "/v/s/b.txt");
-  ASSERT_EQ(daemon_.Requests().size(), 3u);
-  EXPECT_EQ(daemon_.Requests()[2], JsonOf(R"({"compound": []})"));
+  ASSERT_EQ(daemon_.Requests().size(), 6u);
+  EXPECT_EQ(daemon_.Requests()[5], JsonOf(R"({"compound": []})"));
 }
 
 TEST_F(ElasticControlTest, QueryAnswerWithoutADocumentListIs916) {
@@ -282,21 +277,15 @@ TEST_F(ElasticControlTest, OtherFailuresAreNotRetried) {
   EXPECT_TRUE(sleeps_.Sleeps().empty());
 }
 
-TEST_F(ElasticControlTest, CommitFailureOnAFullVolumeMarksTheShare) {
-  platform_->volume_full = true;
-  daemon_.Enqueue(FakeAnswer::Failure(1300, "write failed"));
-  const Error error = ErrorOf([] { IndexCommit("music"); });
-  EXPECT_EQ(error.code, kErrorNoSpace);
-  EXPECT_EQ(error.reason, "Share (music) space not enough");
-  EXPECT_EQ(StatusMgr().GetShareStatus("music"), 1u);
-}
-
-TEST_F(ElasticControlTest, CommitFailureWithRoomLeftPropagates) {
-  daemon_.Enqueue(FakeAnswer::Failure(1300, "write failed"));
-  const Error error = ErrorOf([] { IndexCommit("music"); });
-  EXPECT_EQ(error.code, 1300);
-  EXPECT_EQ(error.reason, "Request failed, msg=write failed");
-  EXPECT_EQ(StatusMgr().GetShareStatus("music"), 0u);
+TEST_F(ElasticControlTest, CommitFailureMarksTheShareOnlyOnAFullVolume) {
+  for (const bool full : {false, true}) {
+    platform_->volume_full = full;
+    daemon_.Enqueue(FakeAnswer::Failure(1300, "write failed"));
+    const Error error = ErrorOf([] { IndexCommit("music"); });
+    EXPECT_EQ(error.code, full ? kErrorNoSpace : 1300);
+    EXPECT_EQ(error.reason, full ? "Share (music) space not enough" : "Request failed, msg=write failed");
+    EXPECT_EQ(StatusMgr().GetShareStatus("music"), full ? 1u : 0u);
+  }
 }
 
 }  // namespace
