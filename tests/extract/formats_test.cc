@@ -132,7 +132,7 @@ TEST_F(FormatsTest, OfficeDocumentsTextAndProperties) {
   }
 }
 
-TEST_F(FormatsTest, AudioTagsAndPropertiesOnlyWithMeta) {
+TEST_F(FormatsTest, AudioTagsAndPropertiesOnlyWithMetaInMp3AndFlac) {
   RunTool("ffmpeg -nostdin -loglevel error -y -f lavfi -i sine=frequency=440:duration=2 -ac 2 -ar 44100 -b:a 128k "
           "-metadata title='Blue Song' -metadata artist='The Players' -metadata album='First Album' "
           "-metadata composer='Ann Writer' -metadata genre=Jazz -metadata track=7 -metadata date=2019 "
@@ -154,20 +154,18 @@ TEST_F(FormatsTest, AudioTagsAndPropertiesOnlyWithMeta) {
   const Json::Value without = Extract("song.mp3", false);
   EXPECT_FALSE(without.isMember(kFieldTitle));
   EXPECT_FALSE(without.isMember(kFieldDuration));
-}
-
-TEST_F(FormatsTest, FlacTagsToo) {
+  // FLAC keeps its tags in another form.
   RunTool("ffmpeg -nostdin -loglevel error -y -f lavfi -i sine=duration=1 -ar 48000 -metadata title=Calm "
           "-metadata artist=Quartet -metadata track=3 " + PathOf("calm.flac"));
-  const Json::Value fields = Extract("calm.flac");
-  EXPECT_EQ("Calm", fields[kFieldTitle].asString());
-  EXPECT_EQ("Quartet", fields[kFieldAuthors].asString());
-  EXPECT_EQ(3, fields[kFieldTrackNumber].asInt());
-  EXPECT_EQ(48000, fields[kFieldSampleRate].asInt());
-  EXPECT_EQ(1, fields[kFieldChannelCount].asInt());
+  const Json::Value flac = Extract("calm.flac");
+  EXPECT_EQ("Calm", flac[kFieldTitle].asString());
+  EXPECT_EQ("Quartet", flac[kFieldAuthors].asString());
+  EXPECT_EQ(3, flac[kFieldTrackNumber].asInt());
+  EXPECT_EQ(48000, flac[kFieldSampleRate].asInt());
+  EXPECT_EQ(1, flac[kFieldChannelCount].asInt());
 }
 
-TEST_F(FormatsTest, PhotoExifFields) {
+TEST_F(FormatsTest, PhotoExifFieldsAndResolutionInCentimetres) {
   RunTool("ffmpeg -nostdin -loglevel error -y -f lavfi -i testsrc=size=64x48 -frames:v 1 " + PathOf("photo.jpg"));
   RunTool("exiftool -q -overwrite_original -Make=Canon '-Model=EOS 5D' -ISO=400 -ExposureTime=1/125 -FNumber=2.8 "
           "-XResolution=300 -YResolution=240 -ResolutionUnit=inches '-DateTimeOriginal=2020:01:02 03:04:05' " +
@@ -183,15 +181,13 @@ TEST_F(FormatsTest, PhotoExifFields) {
   EXPECT_EQ(1577934245, fields[kFieldContentCreationDate].asInt64());
   EXPECT_EQ("image/jpeg", fields[kFieldMediaTypes].asString());
   EXPECT_FALSE(Extract("photo.jpg", false).isMember(kFieldMake));
-}
-
-TEST_F(FormatsTest, PhotoResolutionInCentimetresIsConvertedToDpi) {
+  // A resolution in centimetres is converted to dots per inch.
   RunTool("ffmpeg -nostdin -loglevel error -y -f lavfi -i testsrc=size=32x32 -frames:v 1 " + PathOf("scan.jpg"));
   RunTool("exiftool -q -overwrite_original -XResolution=100 -YResolution=100 -ResolutionUnit=cm -ExposureTime=2.5 " +
           PathOf("scan.jpg"));
-  const Json::Value fields = Extract("scan.jpg");
-  EXPECT_EQ(254, fields[kFieldResolutionWidthDPI].asInt());
-  EXPECT_EQ("2.5", fields[kFieldExposureTime].asString());
+  const Json::Value scan = Extract("scan.jpg");
+  EXPECT_EQ(254, scan[kFieldResolutionWidthDPI].asInt());
+  EXPECT_EQ("2.5", scan[kFieldExposureTime].asString());
 }
 
 TEST_F(FormatsTest, VideoDurationBitRatesAndCodecs) {
