@@ -107,36 +107,6 @@ TEST_F(CommandsTest, RenameOverAnExistingFileLeavesOneDocumentUnderTheNewKey) {
   EXPECT_TRUE(Paths("/volume1/share/").empty());
 }
 
-// The library's folder rename: the folder first, then its descendants found
-// by an uncommitted prefix query, then one compound of path rewrites. A
-// prefix stops at the folder's boundary, for queries and deletes alike.
-TEST_F(CommandsTest, FolderRenameAsTheLibrarySendsItAndPrefixesStopAtTheFolderBoundary) {
-  for (const char* path : {"/volume1/share/a", "/volume1/share/a/x", "/volume1/share/a/x/f.txt", "/volume1/share/a2/g.txt"}) Upsert(path);
-  ASSERT_TRUE(Run("document_set_by_id", R"({"doc_id": "/volume1/share/a",
-      "data": {"CORVMDPath": "/volume1/share/b", "CORVMDParent": "/volume1/share"}})")["success"].asBool());
-  const Json::Value descendants = Run("document_get_by_query",
-      R"({"query": {"qsl": {"prefix": {"CORVMDPath": "/volume1/share/a/"}}, "load_field": ["CORVMDPath", "CORVMDFSName", "CORVMDParent"]}})");
-  ASSERT_EQ(descendants["data"].size(), 2u) << JsonToString(descendants);
-  Json::Value compound;
-  for (const Json::Value& doc : descendants["data"]) {
-    const std::string parent = "/volume1/share/b" + doc["CORVMDParent"].asString().substr(std::string("/volume1/share/a").size());
-    Json::Value element = Data(R"({"command": "document_set_by_id", "data": {"id": "fileindex_share"}})");
-    element["data"]["doc_id"] = doc["CORVMDPath"];
-    element["data"]["data"]["CORVMDParent"] = parent;
-    element["data"]["data"]["CORVMDPath"] = parent + "/" + doc["CORVMDFSName"].asString();
-    compound["compound"].append(element);
-  }
-  const Json::Value answer = Send(daemon_->socket_path(), compound);
-  EXPECT_FALSE(answer["has_fail"].asBool()) << JsonToString(answer);
-  EXPECT_EQ(Paths("/volume1/share/b/"), Ids({"/volume1/share/b/x", "/volume1/share/b/x/f.txt"}));
-  EXPECT_TRUE(Paths("/volume1/share/a/").empty());
-  EXPECT_EQ(Paths("/volume1/share/a2/"), Ids({"/volume1/share/a2/g.txt"}));
-
-  Upsert("/volume1/share/b2/3");
-  EXPECT_EQ(Run("document_del_by_query", R"({"query": {"qsl": {"prefix": {"CORVMDPath": "/volume1/share/b/"}}}})")["data"]["deleted"].asInt(), 2);
-  EXPECT_EQ(Paths("/volume1/share/"), Ids({"/volume1/share/a2/g.txt", "/volume1/share/b", "/volume1/share/b2/3"}));
-}
-
 TEST_F(CommandsTest, CompoundAnswersOneResultPerElementAndFlagsFailures) {
   Upsert("/volume1/share/t.txt", "tokyo tower");
   Commit();

@@ -1,5 +1,6 @@
 // The index commands against the real corvelasticd, started on a private
-// socket in a sandbox root: what a share's index holds after each command.
+// socket in a sandbox root: what a share's index holds after each command,
+// the folder rename among them exactly as the library sends it.
 #include <gtest/gtest.h>
 #include <unistd.h>
 
@@ -74,6 +75,10 @@ TEST_F(ElasticDaemonTest, DocumentsFollowUpsertsRenamesAndDeletes) {
   EXPECT_EQ(Below(share_ + "/b"),
             (std::vector<std::string>{share_ + "/b/sub", share_ + "/b/sub/y.mp3", share_ + "/b/x.mp3"}));
 
+  // A folder's delete leaves the sibling whose name it begins.
+  IndexDelDir("music", share_ + "/a");
+  IndexCommit("music");
+  EXPECT_EQ(Below(share_ + "/a2"), std::vector<std::string>{share_ + "/a2/z.mp3"});
   IndexDelDir("music", share_ + "/b");
   IndexDel("music", share_ + "/a2/z.mp3");
   IndexCommit("music");
