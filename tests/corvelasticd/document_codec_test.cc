@@ -21,12 +21,6 @@ class DocumentCodecTest : public ::testing::Test {
  protected:
   DocumentCodecTest() : schema_(IndexSchema::FromMappings(elasticd_test::LibraryMappings())) {}
 
-  Json::Value Document(const std::string& text) {
-    Json::Value document;
-    EXPECT_TRUE(JsonFromString(document, text));
-    return document;
-  }
-
   Json::Value RoundTrip(const Json::Value& document, const std::string& key = kKey) {
     return DecodeDocument(schema_, key, EncodeDocument(schema_, key, document));
   }
@@ -53,7 +47,7 @@ class DocumentCodecTest : public ::testing::Test {
 };
 
 TEST_F(DocumentCodecTest, EveryJsonTypeComesBackExactly) {
-  const Json::Value document = Document(R"({
+  const Json::Value document = elasticd_test::Data(R"({
       "CORVMDPath": "/v/share/Reports/Quarterly Report.pdf",
       "CORVMDFSSize": 9007199254740993, "CORVMDFSContentChangeDate": -1700000000,
       "CORVMDDurationSecond": 12.25, "CORVMDIsDir": false, "CORVMDTitle": null,
@@ -77,12 +71,9 @@ TEST_F(DocumentCodecTest, TextWithNulBytesAndInvalidUtf8IsKept) {
 }
 
 TEST_F(DocumentCodecTest, RepeatedNamesAndTheParentFolderAreStoredOnce) {
-  Json::Value document;
-  document["CORVMDPath"] = kKey;
-  document["CORVMDParent"] = "/v/share/Reports";
-  document["CORVMDFSName"] = "Quarterly Report.pdf";
-  document["CORVMDSearchFileName"] = "Quarterly Report.pdf";
-  document["CORVMDDisplayName"] = "Quarterly Report.pdf";
+  const Json::Value document = elasticd_test::Data(R"({"CORVMDPath": "/v/share/Reports/Quarterly Report.pdf",
+      "CORVMDParent": "/v/share/Reports", "CORVMDFSName": "Quarterly Report.pdf",
+      "CORVMDSearchFileName": "Quarterly Report.pdf", "CORVMDDisplayName": "Quarterly Report.pdf"})");
   const std::string record = EncodeDocument(schema_, kKey, document);
   // Each text at most once, and never the key itself.
   EXPECT_EQ(record.find("/v/share"), std::string::npos);
@@ -93,18 +84,15 @@ TEST_F(DocumentCodecTest, RepeatedNamesAndTheParentFolderAreStoredOnce) {
 }
 
 TEST_F(DocumentCodecTest, ParentOfAKeyWithoutFolderOrOfAnotherKey) {
-  Json::Value document;
-  document["CORVMDPath"] = "plain-key";
-  document["CORVMDParent"] = "";
-  EXPECT_EQ(RoundTrip(document, "plain-key"), document);
+  const Json::Value plain = elasticd_test::Data(R"({"CORVMDPath": "plain-key", "CORVMDParent": ""})");
+  EXPECT_EQ(RoundTrip(plain, "plain-key"), plain);
   // A parent that is not the key's own stays a plain text.
-  document["CORVMDPath"] = kKey;
-  document["CORVMDParent"] = "/v/share";
-  EXPECT_EQ(RoundTrip(document), document);
+  const Json::Value other = elasticd_test::Data(R"({"CORVMDPath": "/v/share/Reports/Quarterly Report.pdf", "CORVMDParent": "/v/share"})");
+  EXPECT_EQ(RoundTrip(other), other);
 }
 
 TEST_F(DocumentCodecTest, SqlSeesNumbersBoolsArraysAndAbsentFields) {
-  const std::string record = EncodeDocument(schema_, kKey, Document(R"({
+  const std::string record = EncodeDocument(schema_, kKey, elasticd_test::Data(R"({
       "CORVMDFSSize": 5000, "CORVMDDurationSecond": 2.5, "CORVMDIsDir": true, "CORVMDAuthors": ["Ann", "Bob"]})"));
   EXPECT_EQ(SqlField(record, "CORVMDFSSize"), "integer:5000");
   EXPECT_EQ(SqlField(record, "CORVMDDurationSecond"), "real:2.5");
@@ -125,10 +113,7 @@ TEST_F(DocumentCodecTest, RecordsOfEarlierVersionsStillRead) {
 }
 
 TEST_F(DocumentCodecTest, DamagedRecordsGiveWhatCanBeReadWithoutCrashing) {
-  Json::Value document;
-  document["CORVMDFSName"] = "Quarterly Report.pdf";
-  document["CORVMDAuthors"] = Json::Value(Json::arrayValue);
-  document["CORVMDAuthors"].append("Ann");
+  const Json::Value document = elasticd_test::Data(R"({"CORVMDFSName": "Quarterly Report.pdf", "CORVMDAuthors": ["Ann"]})");
   const std::string record = EncodeDocument(schema_, kKey, document);
   for (size_t length = 0; length < record.size(); ++length) {
     const Json::Value back = DecodeDocument(schema_, kKey, record.substr(0, length));

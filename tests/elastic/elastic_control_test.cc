@@ -233,13 +233,17 @@ TEST_F(ElasticControlTest, TermSuggestionIsOneCompoundRequest) {
   EXPECT_EQ(OnlyRequest(), expected) << "an empty field list sends nothing";
 }
 
-TEST_F(ElasticControlTest, BusyDaemonIsRetriedWithLongSleepsAndOneMemoryNotice) {
+TEST_F(ElasticControlTest, BusyDaemonIsRetriedWithLongSleepsAndOneMemoryNoticeAfterTen) {
+  daemon_.Enqueue(FakeAnswer::Failure(1400, "busy"), 10);
+  ShareIndexPause("music");
+  EXPECT_EQ(sleeps_.Sleeps().size(), 10u);
+  EXPECT_EQ(platform_->Notices("error:lack_of_memory"), 0) << "ten busy answers send no notice";
   daemon_.Enqueue(FakeAnswer::Failure(1400, "busy"), 7);
   daemon_.Enqueue(FakeAnswer::Failure(1401, "not ready"), 6);
   ShareIndexDelete("music");
-  EXPECT_EQ(daemon_.Requests().size(), 14u);
+  EXPECT_EQ(daemon_.Requests().size(), 11u + 14u);
   const auto sleeps = sleeps_.Sleeps();
-  ASSERT_EQ(sleeps.size(), 13u);
+  ASSERT_EQ(sleeps.size(), 10u + 13u);
   for (const auto& sleep : sleeps) {
     const auto seconds = std::chrono::duration_cast<std::chrono::seconds>(sleep).count();
     EXPECT_TRUE(seconds >= 900 && seconds <= 1140 && seconds % 60 == 0) << seconds;
@@ -249,13 +253,6 @@ TEST_F(ElasticControlTest, BusyDaemonIsRetriedWithLongSleepsAndOneMemoryNotice) 
   EXPECT_NE(retries.front().find("Retry[0]"), std::string::npos);
   EXPECT_NE(retries.back().find("Retry[12]"), std::string::npos);
   EXPECT_EQ(platform_->Notices("error:lack_of_memory"), 1);
-}
-
-TEST_F(ElasticControlTest, TenBusyAnswersSendNoNotice) {
-  daemon_.Enqueue(FakeAnswer::Failure(1400, "busy"), 10);
-  ShareIndexPause("music");
-  EXPECT_EQ(sleeps_.Sleeps().size(), 10u);
-  EXPECT_EQ(platform_->Notices("error:lack_of_memory"), 0);
 }
 
 TEST_F(ElasticControlTest, BusySubRequestSendsTheWholeCompoundAgain) {
