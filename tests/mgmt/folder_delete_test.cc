@@ -21,14 +21,6 @@ using testing_support::MgmtSandbox;
 using testing_support::ScopedTestPlatform;
 using ::testing::ElementsAre;
 
-std::vector<std::string> SavedPaths(const MgmtSandbox& sandbox) {
-  Json::Value saved;
-  EXPECT_TRUE(JsonFromFile(saved, sandbox.FoldersFile()));
-  std::vector<std::string> paths;
-  for (const Json::Value& folder : saved) paths.push_back(folder["path"].asString());
-  return paths;
-}
-
 class FolderDeleteTest : public testing_support::MgmtTest {
  protected:
   void SetUp() override {
@@ -52,7 +44,7 @@ TEST_F(FolderDeleteTest, LastFolderOfAShareTakesItsIndexAndDataAlong) {
   StatusMgr().SetShareStatus("photo", 1);
 
   FolderDelete(JsonList({"/photo/a"}));
-  EXPECT_THAT(SavedPaths(sandbox_), ElementsAre("/music"));
+  EXPECT_THAT(sandbox_.SavedPaths(), ElementsAre("/music"));
   EXPECT_THAT(NewSearchCommands(), ElementsAre("index_delete fileindex_photo"));
   EXPECT_TRUE(sandbox_.MonitorCfg("photo").isNull());
   EXPECT_FALSE(sandbox_.MonitorCfg("music").isNull());
@@ -65,7 +57,7 @@ TEST_F(FolderDeleteTest, LastFolderOfAShareTakesItsIndexAndDataAlong) {
   EXPECT_TRUE(NewServiceRequests().empty());  // music is still indexed
 
   FolderDelete(JsonList({"/music"}));
-  EXPECT_THAT(SavedPaths(sandbox_), ElementsAre());
+  EXPECT_THAT(sandbox_.SavedPaths(), ElementsAre());
   EXPECT_THAT(NewServiceRequests(), ElementsAre("restart smbd.service", "--no-block stop corvcontentextractd.service",
                                                 "stop pkg-CorvLumex-fileindexd.service"));
 }
@@ -73,7 +65,7 @@ TEST_F(FolderDeleteTest, LastFolderOfAShareTakesItsIndexAndDataAlong) {
 TEST_F(FolderDeleteTest, OrphanedDocumentsLeaveAndInnerFoldersAreRebuilt) {
   Add({FolderJson("/photo/a"), FolderJson("/photo/a/x"), FolderJson("/photo/b")});
   FolderDelete(JsonList({"/photo/a"}));
-  EXPECT_THAT(SavedPaths(sandbox_), ElementsAre("/photo/a/x", "/photo/b"));
+  EXPECT_THAT(sandbox_.SavedPaths(), ElementsAre("/photo/a/x", "/photo/b"));
   EXPECT_THAT(NewSearchCommands(),
               ElementsAre("document_del_by_query fileindex_photo prefix=" + photo_ + "/a/",
                           "document_del_by_id fileindex_photo " + photo_ + "/a"));
@@ -103,7 +95,7 @@ TEST_F(FolderDeleteTest, DocumentsOfAnOuterFolderFollowItsSettings) {
   Add({FolderJson("/photo/b")});
   FolderDelete(JsonList({"/photo/b"}));
   EXPECT_TRUE(sandbox_.QueueEvents("photo").empty());
-  EXPECT_THAT(SavedPaths(sandbox_), ElementsAre("/photo"));
+  EXPECT_THAT(sandbox_.SavedPaths(), ElementsAre("/photo"));
 }
 
 TEST_F(FolderDeleteTest, FoldersOfAVanishedShareCanStillBeRemoved) {
@@ -111,7 +103,7 @@ TEST_F(FolderDeleteTest, FoldersOfAVanishedShareCanStillBeRemoved) {
   StatusMgr().SetShareStatus("photo", 1);
   sandbox_.RemoveShare("photo");
   FolderDelete(JsonList({"/photo/a"}));
-  EXPECT_THAT(SavedPaths(sandbox_), ElementsAre("/music"));
+  EXPECT_THAT(sandbox_.SavedPaths(), ElementsAre("/music"));
   EXPECT_EQ(StatusMgr().GetShareStatus("photo"), 0u);
   EXPECT_THAT(NewSearchCommands(), ElementsAre("index_delete fileindex_photo"));
   EXPECT_TRUE(NewDaemonCommands().empty());
@@ -121,7 +113,7 @@ TEST_F(FolderDeleteTest, FoldersOfAVanishedShareCanStillBeRemoved) {
   sandbox_.search().Enqueue(testing_support::FakeAnswer::Failure(2010, "No index fileindex_music"));
   sandbox_.RemoveShare("music");
   FolderDelete(JsonList({"/music", "/music/x"}));
-  EXPECT_THAT(SavedPaths(sandbox_), ElementsAre());
+  EXPECT_THAT(sandbox_.SavedPaths(), ElementsAre());
 }
 
 TEST_F(FolderDeleteTest, RefusalsChangeNothing) {
@@ -153,7 +145,7 @@ TEST_F(FolderDeleteTest, IndexFailureMarksTheShareForRebuild) {
   EXPECT_EQ(ErrorOf([] { FolderDelete(JsonList({"/photo/a"})); }).code, 2003);
   // The folder is gone from the file and the notifier; the index, which may
   // still hold its documents, is marked for a rebuild.
-  EXPECT_THAT(SavedPaths(sandbox_), ElementsAre("/photo/b"));
+  EXPECT_THAT(sandbox_.SavedPaths(), ElementsAre("/photo/b"));
   EXPECT_EQ(sandbox_.MonitorCfg("photo")["config"].size(), 1u);
   EXPECT_EQ(StatusMgr().GetShareStatus("photo"), 1u);
 }

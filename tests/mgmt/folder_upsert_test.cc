@@ -14,6 +14,7 @@ using testing_support::FolderJson;
 using testing_support::JsonList;
 using testing_support::LogCapture;
 using testing_support::MgmtSandbox;
+using testing_support::ReadFile;
 using testing_support::ScopedTestPlatform;
 using testing_support::ShareFlags;
 using ::testing::ElementsAre;
@@ -54,10 +55,7 @@ TEST_F(FolderUpsertTest, AddPreparesIndexMonitorDaemonAndReindex) {
   EXPECT_EQ(cfg["config"][0]["path"].asString(), photo_ + "/a");
   EXPECT_EQ(sandbox_.MonitorCfg("music")["config"][0]["path"].asString(), music_);
 
-  Json::Value saved;
-  ASSERT_TRUE(JsonFromFile(saved, sandbox_.FoldersFile()));
-  ASSERT_EQ(saved.size(), 3u);
-  EXPECT_EQ(saved[1]["path"].asString(), "/music");
+  EXPECT_THAT(sandbox_.SavedPaths(), ElementsAre("/photo/a", "/music", "/photo/b"));
 
   const std::vector<Json::Value> commands = sandbox_.DaemonCommands();
   ASSERT_EQ(commands.size(), 2u);
@@ -132,7 +130,7 @@ TEST_F(FolderUpsertTest, FullVolumeRefusesTheRequest) {
 // Once every folder is accepted the steps run in order and a failure stops
 // them where it happens: what was done stays, what follows never runs.
 TEST_F(FolderUpsertTest, LateFailurePropagatesAndLeavesEarlierStepsInPlace) {
-  const std::string folders_before = MgmtSandbox::Read(sandbox_.FoldersFile());
+  const std::string folders_before = ReadFile(sandbox_.FoldersFile());
   {
     ScopedTestPlatform platform;
     platform->fail_monitor = true;
@@ -142,7 +140,7 @@ TEST_F(FolderUpsertTest, LateFailurePropagatesAndLeavesEarlierStepsInPlace) {
   }
   EXPECT_THAT(sandbox_.SearchCommands(), ElementsAre("index_create fileindex_photo"));
   EXPECT_EQ(sandbox_.ServiceRequests().back(), "start pkg-CorvLumex-fileindexd.service");
-  EXPECT_EQ(MgmtSandbox::Read(sandbox_.FoldersFile()), folders_before) << "not saved";
+  EXPECT_EQ(ReadFile(sandbox_.FoldersFile()), folders_before) << "not saved";
   EXPECT_TRUE(sandbox_.DaemonCommands().empty());
   EXPECT_TRUE(sandbox_.QueueEvents("photo").empty());
 
@@ -154,10 +152,7 @@ TEST_F(FolderUpsertTest, LateFailurePropagatesAndLeavesEarlierStepsInPlace) {
 
 TEST_F(FolderUpsertTest, UpdaterModeStoresRefusedPathsWithoutReindex) {
   FolderAdd(JsonList({FolderJson("/ro")}), true);
-  Json::Value saved;
-  ASSERT_TRUE(JsonFromFile(saved, sandbox_.FoldersFile()));
-  ASSERT_EQ(saved.size(), 1u);
-  EXPECT_EQ(saved[0]["path"].asString(), "/ro");
+  EXPECT_THAT(sandbox_.SavedPaths(), ElementsAre("/ro"));
   EXPECT_THAT(sandbox_.SearchCommands(), ElementsAre("index_create fileindex_ro"));
   EXPECT_EQ(sandbox_.DaemonCommands().size(), 1u);
   EXPECT_TRUE(sandbox_.QueueEvents("ro").empty());
@@ -165,7 +160,7 @@ TEST_F(FolderUpsertTest, UpdaterModeStoresRefusedPathsWithoutReindex) {
 
 TEST_F(FolderUpsertTest, EmptyListStartsServicesAndSavesTheSameList) {
   FolderAdd(Json::Value(Json::arrayValue), false);
-  EXPECT_EQ(MgmtSandbox::Read(sandbox_.FoldersFile()), "[]\n");
+  EXPECT_EQ(ReadFile(sandbox_.FoldersFile()), "[]\n");
   EXPECT_EQ(sandbox_.ServiceRequests().back(), "start pkg-CorvLumex-fileindexd.service");
   EXPECT_TRUE(sandbox_.SearchRequests().empty());
   EXPECT_TRUE(sandbox_.DaemonCommands().empty());

@@ -26,105 +26,23 @@ std::ostream& operator<<(std::ostream& out, const SystemSnapshot& snapshot) {
   return out;
 }
 
-MgmtSandbox::MgmtSandbox() {
+MgmtSandbox::MgmtSandbox() : search_(std::make_unique<FakeSearchDaemon>()) {
   unsetenv("CORVLUMEX_SERVICE_COMMAND");
-  root_.MakeDir("tmp");
-  root_.MakeDir("var/packages/CorvLumex/etc");
-  root_.MakeDir("volume1");
-  root_.MakeDir("volume2");
-  SaveRegistry();
-  daemon_ = std::make_unique<FakeDaemon>(SysPath("/var/run/fileindexd.sock"));
-  search_ = std::make_unique<FakeSearchDaemon>();
 }
 
 MgmtSandbox::~MgmtSandbox() = default;
 
-std::string MgmtSandbox::AddShare(const std::string& name, const std::string& volume, ShareFlags flags) {
-  const std::string path = root_.MakeDir(volume + "/" + name);
-  root_.MakeDir(volume + "/" + name + "/@eaDir");
-  Json::Value share(Json::objectValue);
-  share["name"] = name;
-  share["path"] = path;
-  share["readonly"] = flags.readonly;
-  share["encrypted"] = flags.encrypted;
-  share["recycle_bin"] = flags.recycle_bin;
-  shares_.append(share);
-  SaveRegistry();
-  return path;
-}
-
-Json::Value* MgmtSandbox::FindShare(const std::string& name) {
-  for (Json::Value& share : shares_) {
-    if (share["name"].asString() == name) return &share;
-  }
-  throw std::runtime_error("no share " + name);
-}
-
-std::string MgmtSandbox::RenameShare(const std::string& from, const std::string& to) {
-  Json::Value* share = FindShare(from);
-  const std::string old_path = (*share)["path"].asString();
-  const std::string new_path = fs::path(old_path).parent_path().string() + "/" + to;
-  fs::rename(old_path, new_path);
-  (*share)["name"] = to;
-  (*share)["path"] = new_path;
-  SaveRegistry();
-  return new_path;
-}
-
-std::string MgmtSandbox::MoveShare(const std::string& name, const std::string& volume) {
-  Json::Value* share = FindShare(name);
-  const std::string new_path = Volume(volume) + "/" + name;
-  fs::rename((*share)["path"].asString(), new_path);
-  (*share)["path"] = new_path;
-  SaveRegistry();
-  return new_path;
-}
-
-void MgmtSandbox::RemoveShare(const std::string& name) {
-  Json::Value kept(Json::arrayValue);
-  for (const Json::Value& share : shares_) {
-    if (share["name"].asString() != name) kept.append(share);
-  }
-  shares_ = kept;
-  SaveRegistry();
-}
-
-void MgmtSandbox::SetRecycleBin(const std::string& name, bool enabled) {
-  (*FindShare(name))["recycle_bin"] = enabled;
-  SaveRegistry();
-}
-
-void MgmtSandbox::SaveRegistry() const { root_.WriteFile("etc/corvlumex/shares.json", JsonToString(shares_)); }
-
-std::string MgmtSandbox::FoldersFile() const { return root_.path() + "/var/packages/CorvLumex/etc/fileindex.folders"; }
-
-std::string MgmtSandbox::StatusFile() const { return root_.path() + "/var/packages/CorvLumex/etc/fileindex.status"; }
-
-bool MgmtSandbox::HasShare(const std::string& name) const {
-  for (const Json::Value& entry : shares_) {
-    if (entry["name"].asString() == name) return true;
-  }
-  return false;
-}
-
-std::string MgmtSandbox::QueueFile(const std::string& share) const {
-  for (const Json::Value& entry : shares_) {
-    if (entry["name"].asString() == share) return entry["path"].asString() + "/@eaDir/fileindex.queue";
-  }
-  throw std::runtime_error("no share " + share);
-}
-
-std::string MgmtSandbox::Read(const std::string& path) {
-  std::ifstream input(path, std::ios::binary);
-  if (!input) return "<absent>";
-  std::ostringstream content;
-  content << input.rdbuf();
-  return content.str();
+std::vector<std::string> MgmtSandbox::SavedPaths() const {
+  Json::Value saved;
+  EXPECT_TRUE(JsonFromFile(saved, FoldersFile()));
+  std::vector<std::string> paths;
+  for (const Json::Value& folder : saved) paths.push_back(folder["path"].asString());
+  return paths;
 }
 
 Json::Value MgmtSandbox::MonitorCfg(const std::string& share) const {
   const std::string queue = QueueFile(share);
-  const fs::path dir = root_.path() + "/etc/corvlumex/monitor.d";
+  const fs::path dir = root() + "/etc/corvlumex/monitor.d";
   if (!fs::exists(dir)) return Json::Value();
   for (const auto& entry : fs::directory_iterator(dir)) {
     Json::Value value;
@@ -135,28 +53,12 @@ Json::Value MgmtSandbox::MonitorCfg(const std::string& share) const {
 
 std::vector<std::string> MgmtSandbox::ServiceRequests() const {
   std::vector<std::string> lines;
-  std::istringstream input(Read(root_.path() + "/var/log/corvlumex/service_requests.log"));
+  std::istringstream input(ReadFile(root() + "/var/log/corvlumex/service_requests.log"));
   std::string line;
   while (std::getline(input, line)) {
     if (line != "<absent>") lines.push_back(line);
   }
   return lines;
-}
-
-std::vector<Json::Value> MgmtSandbox::DaemonCommands() const {
-  std::vector<Json::Value> commands;
-  for (const ReceivedFrame& frame : daemon_->Frames()) {
-    commands.push_back(JsonOf(std::string(frame.body.c_str())));
-  }
-  return commands;
-}
-
-std::vector<Json::Value> MgmtSandbox::QueueEvents(const std::string& share) const {
-  std::vector<Json::Value> events;
-  std::ifstream input(QueueFile(share));
-  std::string line;
-  while (std::getline(input, line)) events.push_back(JsonOf(line));
-  return events;
 }
 
 std::vector<std::string> MgmtSandbox::SearchCommands() const {
@@ -173,21 +75,21 @@ std::vector<std::string> MgmtSandbox::SearchCommands() const {
 
 SystemSnapshot MgmtSandbox::Snapshot() const {
   SystemSnapshot snapshot;
-  snapshot.folders = Read(FoldersFile());
-  snapshot.status = Read(StatusFile());
-  const fs::path dir = root_.path() + "/etc/corvlumex/monitor.d";
+  snapshot.folders = ReadFile(FoldersFile());
+  snapshot.status = ReadFile(EtcFile("fileindex.status"));
+  const fs::path dir = root() + "/etc/corvlumex/monitor.d";
   if (fs::exists(dir)) {
     for (const auto& entry : fs::directory_iterator(dir)) {
-      snapshot.monitor[entry.path().filename().string()] = Read(entry.path().string());
+      snapshot.monitor[entry.path().filename().string()] = ReadFile(entry.path().string());
     }
   }
-  snapshot.service_requests = Read(root_.path() + "/var/log/corvlumex/service_requests.log");
-  snapshot.spotlight = Read(root_.path() + "/etc/samba/corvlumex-spotlight.conf");
-  for (const Json::Value& share : shares_) {
-    const std::string queue = share["path"].asString() + "/@eaDir/fileindex.queue";
-    snapshot.queues[queue] = Read(queue);
+  snapshot.service_requests = ReadFile(root() + "/var/log/corvlumex/service_requests.log");
+  snapshot.spotlight = ReadFile(root() + "/etc/samba/corvlumex-spotlight.conf");
+  for (const Json::Value& share : shares()) {
+    const std::string queue = QueueFile(share["name"].asString());
+    snapshot.queues[queue] = ReadFile(queue);
   }
-  snapshot.daemon_frames = daemon_->Frames().size();
+  snapshot.daemon_frames = daemon()->Frames().size();
   snapshot.search_requests = search_->Requests().size();
   return snapshot;
 }

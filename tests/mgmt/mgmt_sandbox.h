@@ -1,7 +1,6 @@
-// A sandbox root laid out like an installed system for the management
-// operations: two volumes, a share registry the tests can change (rename,
-// move), fake fileindexd and corvelasticd recording what they receive, and
-// a snapshot of everything a management operation may touch.
+// The state sandbox with what a management operation also reaches: a fake
+// corvelasticd recording what it receives, and a snapshot of everything a
+// management operation may touch.
 #pragma once
 
 #include <json/json.h>
@@ -12,8 +11,7 @@
 #include <vector>
 
 #include "tests/elastic/fake_search_daemon.h"
-#include "tests/state/fake_daemon.h"
-#include "tests/support/log_capture.h"
+#include "tests/state/state_sandbox.h"
 
 namespace corvlumex {
 namespace testing_support {
@@ -33,58 +31,26 @@ struct SystemSnapshot {
 };
 std::ostream& operator<<(std::ostream& out, const SystemSnapshot& snapshot);
 
-struct ShareFlags {
-  bool readonly = false;
-  bool encrypted = false;
-  bool recycle_bin = false;
-};
-
-class MgmtSandbox {
+class MgmtSandbox : public StateSandbox {
  public:
   MgmtSandbox();
   ~MgmtSandbox();
 
-  const std::string& root() const { return root_.path(); }
-  // <root>/<volume>; "volume1" and "volume2" exist.
-  std::string Volume(const std::string& volume = "volume1") const { return root_.path() + "/" + volume; }
-  // Creates <root>/<volume>/<name> with its @eaDir and registers it.
-  std::string AddShare(const std::string& name, const std::string& volume = "volume1", ShareFlags flags = {});
-  // Renames the share's directory and its registry entry.
-  std::string RenameShare(const std::string& from, const std::string& to);
-  // Moves the share's directory to another volume and updates the registry.
-  std::string MoveShare(const std::string& name, const std::string& volume);
-  // Drops the share from the registry (its directory stays).
-  void RemoveShare(const std::string& name);
-  void SetRecycleBin(const std::string& name, bool enabled);
-  std::string MakeDir(const std::string& relative) const { return root_.MakeDir(relative); }
-
-  std::string FoldersFile() const;
-  std::string StatusFile() const;
-  bool HasShare(const std::string& name) const;
-  std::string QueueFile(const std::string& share) const;  // of a registered share
+  std::string FoldersFile() const { return EtcFile("fileindex.folders"); }
+  // The share paths of the folder file, in its order.
+  std::vector<std::string> SavedPaths() const;
   // The monitor configuration of a share, parsed; null when there is none.
   Json::Value MonitorCfg(const std::string& share) const;
   std::vector<std::string> ServiceRequests() const;
-  // Frames received by the fake fileindexd, parsed.
-  std::vector<Json::Value> DaemonCommands() const;
-  // Queue lines of a share, parsed.
-  std::vector<Json::Value> QueueEvents(const std::string& share) const;
   FakeSearchDaemon& search() { return *search_; }
   std::vector<Json::Value> SearchRequests() const { return search_->Requests(); }
   // The "command" of each search request, with the index "id".
   std::vector<std::string> SearchCommands() const;
 
   SystemSnapshot Snapshot() const;
-  static std::string Read(const std::string& path);
 
  private:
-  void SaveRegistry() const;
-  Json::Value* FindShare(const std::string& name);
-
-  SandboxRoot root_;
   SleepRecorder sleeps_;
-  Json::Value shares_{Json::arrayValue};
-  std::unique_ptr<FakeDaemon> daemon_;
   std::unique_ptr<FakeSearchDaemon> search_;
 };
 

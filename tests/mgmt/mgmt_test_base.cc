@@ -22,15 +22,16 @@ void MgmtTest::Mark(const std::vector<std::string>& shares) {
   }
 }
 
-std::vector<std::string> MgmtTest::NewSearchCommands() const {
-  const std::vector<std::string> all = sandbox_.SearchCommands();
-  return std::vector<std::string>(all.begin() + search_mark_, all.end());
+namespace {
+template <typename T>
+std::vector<T> Since(const std::vector<T>& all, size_t mark) {
+  return std::vector<T>(all.begin() + mark, all.end());
 }
+}  // namespace
 
-std::vector<Json::Value> MgmtTest::NewDaemonCommands() const {
-  const std::vector<Json::Value> all = sandbox_.DaemonCommands();
-  return std::vector<Json::Value>(all.begin() + daemon_mark_, all.end());
-}
+std::vector<std::string> MgmtTest::NewSearchCommands() const { return Since(sandbox_.SearchCommands(), search_mark_); }
+
+std::vector<Json::Value> MgmtTest::NewDaemonCommands() const { return Since(sandbox_.DaemonCommands(), daemon_mark_); }
 
 std::vector<std::string> MgmtTest::NewDaemonSummaries() const {
   std::vector<std::string> out;
@@ -41,8 +42,7 @@ std::vector<std::string> MgmtTest::NewDaemonSummaries() const {
 }
 
 std::vector<std::string> MgmtTest::NewServiceRequests() const {
-  const std::vector<std::string> all = sandbox_.ServiceRequests();
-  return std::vector<std::string>(all.begin() + services_mark_, all.end());
+  return Since(sandbox_.ServiceRequests(), services_mark_);
 }
 
 void MgmtTest::ExpectRefused(const std::function<void()>& action, ErrorCode code, const std::string& condition,

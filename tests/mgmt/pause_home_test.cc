@@ -17,6 +17,7 @@ using testing_support::FolderJson;
 using testing_support::JsonList;
 using testing_support::LogCapture;
 using testing_support::MgmtSandbox;
+using testing_support::ReadFile;
 using testing_support::SystemSnapshot;
 using ::testing::ElementsAre;
 
@@ -98,7 +99,7 @@ TEST_F(PauseHomeTest, HomeServiceSwitchSuspendsAndRestoresTheHomes) {
   EXPECT_TRUE(sandbox_.MonitorCfg("homes").isNull());
   EXPECT_EQ(StatusMgr().GetShareStatus("homes"), kShareStatusHomeDisabled);
   EXPECT_THAT(NewDaemonSummaries(), ElementsAre("worker_delete homes"));
-  EXPECT_NE(MgmtSandbox::Read(sandbox_.FoldersFile()).find("/homes/alice/docs"), std::string::npos);
+  EXPECT_NE(ReadFile(sandbox_.FoldersFile()).find("/homes/alice/docs"), std::string::npos);
 
   HomeEnable();
   EXPECT_EQ(JsonToString(sandbox_.MonitorCfg("homes")), JsonToString(cfg));
@@ -123,10 +124,7 @@ TEST_F(PauseHomeTest, UserRenameMovesTheUsersFolders) {
   LogCapture log;
   UserRename("alice", "carol");
   EXPECT_EQ(log.Matching("Update homes rule: [/homes/alice/docs] -> [/homes/carol/docs]").size(), 1u);
-  Json::Value saved;
-  ASSERT_TRUE(JsonFromFile(saved, sandbox_.FoldersFile()));
-  ASSERT_EQ(saved.size(), 3u);
-  EXPECT_EQ(saved[2]["path"].asString(), "/homes/carol/docs");
+  EXPECT_THAT(sandbox_.SavedPaths(), ElementsAre("/photo", "/music", "/homes/carol/docs"));
   EXPECT_EQ(sandbox_.MonitorCfg("homes")["config"][0]["path"].asString(), homes_ + "/carol/docs");
   EXPECT_THAT(NewSearchCommands(),
               ElementsAre("document_del_by_query fileindex_homes prefix=" + homes_ + "/alice/docs/",

@@ -10,7 +10,7 @@
 #include "fileindex/folder_mgr.h"
 #include "fileindex/related_services.h"
 #include "fileindex/status_mgr.h"
-#include "tests/mgmt/mgmt_sandbox.h"
+#include "tests/mgmt/mgmt_test_base.h"
 #include "tests/mgmt/test_platform.h"
 
 namespace corvlumex {
@@ -25,9 +25,7 @@ using testing_support::ScopedTestPlatform;
 using ::testing::ElementsAre;
 
 void WriteFolders(const MgmtSandbox& sandbox, const std::vector<Json::Value>& folders) {
-  Json::Value list(Json::arrayValue);
-  for (const Json::Value& folder : folders) list.append(folder);
-  ASSERT_TRUE(JsonToFile(list, sandbox.FoldersFile()));
+  ASSERT_TRUE(JsonToFile(testing_support::JsonList(folders), sandbox.FoldersFile()));
 }
 
 TEST(RelatedServicesTest, EnableStartsEverythingAndSwitchesSpotlightOnlyOnce) {
@@ -181,14 +179,6 @@ TEST(RelatedServicesTest, CleanShareIndexDataStopsAtTheFirstCompositionFailure) 
 
   const Error queue = ErrorOf([] { CleanShareIndexData("photo", ""); });
   EXPECT_EQ(queue.reason, "FILEIDXQueuePathCompose failed, share_path=");
-}
-
-TEST(RelatedServicesTest, SettingChangedNoticeCarriesShareAndKind) {
-  MgmtSandbox sandbox;
-  SendSettingChanged("photo", false);
-  ASSERT_EQ(sandbox.DaemonCommands().size(), 1u);
-  EXPECT_EQ(JsonToString(sandbox.DaemonCommands()[0]),
-            "{\"data\":{\"is_upsert\":false,\"share_name\":\"photo\"},\"type\":\"notify_setting_changed\"}");
 }
 
 }  // namespace

@@ -15,6 +15,7 @@ namespace {
 using testing_support::FolderJson;
 using testing_support::JsonList;
 using testing_support::MgmtSandbox;
+using testing_support::ReadFile;
 using testing_support::ScopedTestPlatform;
 using testing_support::SystemSnapshot;
 using ::testing::ElementsAre;
@@ -44,11 +45,9 @@ TEST_F(ShareOpsTest, RenameMovesFoldersIndexMonitorAndStatus) {
                                                "document_del_by_id fileindex_pics " + photo_));
   EXPECT_EQ(JsonToString(requests[requests.size() - 3]["data"]["data"]),
             "{\"id\":\"fileindex_pics\",\"path\":\"" + pics + "/@eaDir/fileindex.db\"}");
-  Json::Value saved;
-  ASSERT_TRUE(JsonFromFile(saved, sandbox_.FoldersFile()));
-  EXPECT_EQ(saved[0]["path"].asString(), "/pics");
-  EXPECT_EQ(saved[1]["path"].asString(), "/pics/a");
-  EXPECT_EQ(saved[1]["document"].asBool(), true);
+  EXPECT_THAT(sandbox_.SavedPaths(), ElementsAre("/pics", "/pics/a"));
+  EXPECT_NE(ReadFile(sandbox_.FoldersFile()).find(R"("path":"/pics/a","name":"a","document":true,"audio":false)"),
+            std::string::npos);
   EXPECT_EQ(sandbox_.Snapshot().monitor.count(old_queue_cfg), 0u);
   const Json::Value cfg = sandbox_.MonitorCfg("pics");
   ASSERT_EQ(cfg["config"].size(), 2u);
@@ -85,7 +84,7 @@ TEST_F(ShareOpsTest, RenameOfAShareWithoutFoldersCarriesItsStatusOnly) {
 }
 
 TEST_F(ShareOpsTest, MigrateFollowsTheShareToItsNewVolume) {
-  const std::string folders = MgmtSandbox::Read(sandbox_.FoldersFile());
+  const std::string folders = ReadFile(sandbox_.FoldersFile());
   const std::string moved = sandbox_.MoveShare("photo", "volume2");
   ShareMigrate("photo", photo_, moved);
   EXPECT_THAT(NewSearchCommands(), ElementsAre("index_config_set fileindex_photo",
@@ -93,7 +92,7 @@ TEST_F(ShareOpsTest, MigrateFollowsTheShareToItsNewVolume) {
                                                "document_del_by_id fileindex_photo " + photo_));
   EXPECT_EQ(JsonToString(sandbox_.SearchRequests()[sandbox_.SearchRequests().size() - 3]["data"]["data"]),
             "{\"path\":\"" + moved + "/@eaDir/fileindex.db\"}");
-  EXPECT_EQ(MgmtSandbox::Read(sandbox_.FoldersFile()), folders);
+  EXPECT_EQ(ReadFile(sandbox_.FoldersFile()), folders);
   const SystemSnapshot snapshot = sandbox_.Snapshot();
   EXPECT_EQ(snapshot.monitor.size(), 1u);  // the old place's configuration is gone
   EXPECT_EQ(sandbox_.MonitorCfg("photo")["config"][0]["path"].asString(), moved);

@@ -1,4 +1,3 @@
-#include <dirent.h>
 #include <signal.h>
 #include <sys/socket.h>
 #include <sys/un.h>
@@ -9,6 +8,7 @@
 #include <cerrno>
 #include <cstring>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "common/error.h"
@@ -17,14 +17,16 @@
 #include "fileindex/communication.h"
 #include "tests/state/fake_daemon.h"
 #include "tests/state/syscall_script.h"
-#include "tests/support/log_capture.h"
+#include "tests/support/expect_error.h"
 
 namespace corvlumex {
 namespace fileindex {
 namespace {
 
+using testing_support::ErrorOf;
 using testing_support::FakeDaemon;
 using testing_support::LogCapture;
+using testing_support::OpenDescriptors;
 using testing_support::SandboxRoot;
 using testing_support::ScopedSyscallScript;
 using testing_support::SleepRecorder;
@@ -33,26 +35,34 @@ using testing_support::SyscallScript;
 constexpr int P = SyscallScript::kPass;
 constexpr int E = -EINTR;
 
-int OpenDescriptors() {
-  int count = 0;
-  DIR* dir = opendir("/proc/self/fd");
-  while (readdir(dir) != nullptr) ++count;
-  closedir(dir);
-  return count;
-}
-
 std::string DaemonSocket() { return SysPath("/var/run/fileindexd.sock"); }
 
-// Error reason of `fn`, or "no throw".
+// "<call> failed, reason=<text of errno_value>"
+std::string Failed(const char* call, int errno_value) {
+  return std::string(call) + " failed, reason=" + strerror(errno_value);
+}
+
+// Reason of the Error 502 that `fn` throws.
 template <typename Fn>
-std::string ReasonOf(Fn fn, int expected_code = kErrorSystem) {
-  try {
-    fn();
-  } catch (const Error& error) {
-    EXPECT_EQ(error.code, expected_code) << error.what();
-    return error.reason;
+std::string ReasonOf(Fn fn) {
+  const Error error = ErrorOf(fn);
+  EXPECT_EQ(error.code, kErrorSystem) << error.what();
+  return error.reason;
+}
+
+// A socket bound on the daemon's path of `root`, listening or not.
+int BindDaemonSocket(const SandboxRoot& root, bool listening) {
+  const std::string path = root.MakeDir("var/run") + "/fileindexd.sock";
+  const int fd = socket(AF_UNIX, SOCK_STREAM, 0);
+  struct sockaddr_un address;
+  memset(&address, 0, sizeof(address));
+  address.sun_family = AF_UNIX;
+  memcpy(address.sun_path, path.c_str(), path.size());
+  EXPECT_EQ(bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)), 0);
+  if (listening) {
+    EXPECT_EQ(listen(fd, 4), 0);
   }
-  return "no throw";
+  return fd;
 }
 
 class Pipe {
@@ -72,12 +82,16 @@ class Pipe {
 
 // --- BufferRead / BufferWrite ---
 
-TEST(BufferTransfer, ChunksOfAtMost1024Bytes) {
+TEST(BufferTransfer, ChunksOfAtMost1024BytesAndNoCallForNothing) {
   Pipe pipe;
   const std::vector<unsigned char> data(3000, 'x');
   SyscallScript script;
   {
     ScopedSyscallScript scope(&script);
+    BufferRead(-1, 0, nullptr);
+    BufferWrite(-1, 0, nullptr);
+    EXPECT_TRUE(script.read_sizes.empty());
+    EXPECT_TRUE(script.write_sizes.empty());
     BufferWrite(pipe.write_end, data.size(), data.data());
   }
   EXPECT_EQ(script.write_sizes, (std::vector<unsigned long>{1024, 1024, 952}));
@@ -89,15 +103,6 @@ TEST(BufferTransfer, ChunksOfAtMost1024Bytes) {
   EXPECT_EQ(back, data);
   ASSERT_GE(script.read_sizes.size(), 3u);
   for (unsigned long size : script.read_sizes) EXPECT_LE(size, 1024u);
-}
-
-TEST(BufferTransfer, SizeZeroMakesNoCall) {
-  SyscallScript script;
-  ScopedSyscallScript scope(&script);
-  BufferRead(-1, 0, nullptr);
-  BufferWrite(-1, 0, nullptr);
-  EXPECT_TRUE(script.read_sizes.empty());
-  EXPECT_TRUE(script.write_sizes.empty());
 }
 
 TEST(BufferTransfer, TenInterruptionsAreRetriedTheEleventhFails) {
@@ -119,10 +124,8 @@ TEST(BufferTransfer, TenInterruptionsAreRetriedTheEleventhFails) {
   script.reads.assign(11, E);
   script.writes.assign(11, E);
   ScopedSyscallScript scope(&script);
-  EXPECT_EQ(ReasonOf([&] { BufferRead(pipe.read_end, 1, &got); }),
-            std::string("read failed, reason=") + strerror(EINTR));
-  EXPECT_EQ(ReasonOf([&] { BufferWrite(pipe.write_end, 1, &byte); }),
-            std::string("write failed, reason=") + strerror(EINTR));
+  EXPECT_EQ(ReasonOf([&] { BufferRead(pipe.read_end, 1, &got); }), Failed("read", EINTR));
+  EXPECT_EQ(ReasonOf([&] { BufferWrite(pipe.write_end, 1, &byte); }), Failed("write", EINTR));
   EXPECT_TRUE(log.Lines().empty()) << "the transfer functions never log";
 }
 
@@ -141,8 +144,7 @@ TEST(BufferTransfer, InterruptionBudgetIsNotResetByProgress) {
   // Eleven, spread the same way, fail although each chunk saw fewer.
   script.writes = {E, E, E, E, P, E, E, E, E, P, E, E, E};
   ScopedSyscallScript scope(&script);
-  EXPECT_EQ(ReasonOf([&] { BufferWrite(pipe.write_end, data.size(), data.data()); }),
-            std::string("write failed, reason=") + strerror(EINTR));
+  EXPECT_EQ(ReasonOf([&] { BufferWrite(pipe.write_end, data.size(), data.data()); }), Failed("write", EINTR));
 }
 
 TEST(BufferTransfer, ZeroResultIsRetriedAndOtherErrorsFailAtOnce) {
@@ -159,16 +161,11 @@ TEST(BufferTransfer, ZeroResultIsRetriedAndOtherErrorsFailAtOnce) {
   BufferRead(pipe.read_end, 3, back);
   EXPECT_EQ(0, memcmp(back, text, 3));
 
+  EXPECT_EQ(ReasonOf([&] { BufferRead(-1, 1, back); }), Failed("read", EBADF));
+  EXPECT_EQ(ReasonOf([&] { BufferWrite(-1, 1, text); }), Failed("write", EBADF));
   script.reads = {-ECONNRESET};
   ScopedSyscallScript scope(&script);
-  EXPECT_EQ(ReasonOf([&] { BufferRead(pipe.read_end, 3, back); }),
-            std::string("read failed, reason=") + strerror(ECONNRESET));
-}
-
-TEST(BufferTransfer, BadDescriptorFails) {
-  unsigned char byte = 0;
-  EXPECT_EQ(ReasonOf([&] { BufferRead(-1, 1, &byte); }), std::string("read failed, reason=") + strerror(EBADF));
-  EXPECT_EQ(ReasonOf([&] { BufferWrite(-1, 1, &byte); }), std::string("write failed, reason=") + strerror(EBADF));
+  EXPECT_EQ(ReasonOf([&] { BufferRead(pipe.read_end, 3, back); }), Failed("read", ECONNRESET));
 }
 
 TEST(Frames, LengthCountsTheNulAndReaderDropsIt) {
@@ -198,32 +195,23 @@ class DaemonChannel : public ::testing::Test {
   SleepRecorder sleeps_;
 };
 
-TEST_F(DaemonChannel, SendsOneFrameAndWaitsForTheReply) {
+TEST_F(DaemonChannel, SendsOneFrameAndWaitsForTheReplyNullDataIncluded) {
   FakeDaemon daemon(DaemonSocket());
   Json::Value data;
   data["resume_time"] = 0;
   SendCommandToDaemon("pause", data);
-  const auto frames = daemon.Frames();
-  ASSERT_EQ(frames.size(), 1u);
-  const std::string text = "{\"data\":{\"resume_time\":0},\"type\":\"pause\"}";
-  EXPECT_EQ(frames[0].length, text.size() + 1);
-  EXPECT_EQ(frames[0].body, text + std::string(1, '\0'));
-  EXPECT_TRUE(sleeps_.Sleeps().empty());
-}
-
-TEST_F(DaemonChannel, NullDataIsStillPresent) {
-  FakeDaemon daemon(DaemonSocket());
   SendCommandToDaemon("resume", Json::Value());
   SendCommandToDaemon("worker_create", Json::Value(Json::objectValue));
   const auto frames = daemon.Frames();
-  ASSERT_EQ(frames.size(), 2u);
-  Json::Value request;
-  ASSERT_TRUE(JsonFromString(request, frames[0].body.substr(0, frames[0].length - 1)));
-  EXPECT_TRUE(request.isMember("data"));
-  EXPECT_TRUE(request["data"].isNull());
-  EXPECT_EQ(request["type"], "resume");
-  ASSERT_TRUE(JsonFromString(request, frames[1].body.substr(0, frames[1].length - 1)));
-  EXPECT_TRUE(request["data"].isObject());
+  ASSERT_EQ(frames.size(), 3u);
+  const std::vector<std::string> texts = {"{\"data\":{\"resume_time\":0},\"type\":\"pause\"}",
+                                          "{\"data\":null,\"type\":\"resume\"}",
+                                          "{\"data\":{},\"type\":\"worker_create\"}"};
+  for (size_t i = 0; i < texts.size(); ++i) {
+    EXPECT_EQ(frames[i].length, texts[i].size() + 1);
+    EXPECT_EQ(frames[i].body, texts[i] + std::string(1, '\0'));
+  }
+  EXPECT_TRUE(sleeps_.Sleeps().empty());
 }
 
 TEST_F(DaemonChannel, LongRequestGoesOutInChunksAndSendTimeoutIsTheOnlyOption) {
@@ -277,13 +265,7 @@ TEST_F(DaemonChannel, MissingSocketIsRetriedFiveTimesThenWriteFails) {
 
 TEST_F(DaemonChannel, SocketThatNobodyListensOnFailsWithoutRetry) {
   // Bound but never listening: connect is refused, which is not retried.
-  const std::string path = root_.MakeDir("var/run") + "/fileindexd.sock";
-  const int fd = socket(AF_UNIX, SOCK_STREAM, 0);
-  struct sockaddr_un address;
-  memset(&address, 0, sizeof(address));
-  address.sun_family = AF_UNIX;
-  memcpy(address.sun_path, path.c_str(), path.size());
-  ASSERT_EQ(bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)), 0);
+  const int fd = BindDaemonSocket(root_, false);
   const std::string reason = ReasonOf([] { SendCommandToDaemon("resume", Json::Value()); });
   close(fd);
   EXPECT_EQ(reason.rfind("write failed, reason=", 0), 0u) << reason;
@@ -308,8 +290,7 @@ TEST_F(DaemonChannel, SocketFailureIsLoggedAndThrown) {
   SyscallScript script;
   script.fail_socket = true;
   ScopedSyscallScript scope(&script);
-  EXPECT_EQ(ReasonOf([] { SendCommandToDaemon("pause", Json::Value()); }),
-            std::string("socket failed, reason=") + strerror(EMFILE));
+  EXPECT_EQ(ReasonOf([] { SendCommandToDaemon("pause", Json::Value()); }), Failed("socket", EMFILE));
   ASSERT_EQ(log.Lines().size(), 1u);
   EXPECT_NE(log.Lines()[0].find("(SendCommandToDaemon) Failed [0 > (fd_socket = socket(PF_UNIX, SOCK_STREAM, 0))], "
                                 "reason: socket failed, reason="),
@@ -320,52 +301,40 @@ TEST_F(DaemonChannel, SocketFailureIsLoggedAndThrown) {
 TEST_F(DaemonChannel, EveryFailureAfterTheSocketClosesIt) {
   FakeDaemon daemon(DaemonSocket());
   const int before = OpenDescriptors();
-  {
+  struct Case {
+    bool fail_setsockopt;
+    std::deque<int> writes, reads;
+    std::string reason;
+  };
+  const std::vector<Case> cases = {{true, {}, {}, Failed("setsockopt", ENOPROTOOPT)},
+                                   {false, {-EIO}, {}, Failed("write", EIO)},
+                                   {false, {}, {-ECONNRESET}, Failed("read", ECONNRESET)}};
+  for (size_t i = 0; i < cases.size(); ++i) {
+    SCOPED_TRACE(cases[i].reason);
     LogCapture log;
     SyscallScript script;
-    script.fail_setsockopt = true;
-    ScopedSyscallScript scope(&script);
-    EXPECT_EQ(ReasonOf([] { SendCommandToDaemon("pause", Json::Value()); }),
-              std::string("setsockopt failed, reason=") + strerror(ENOPROTOOPT));
-    ASSERT_EQ(log.Lines().size(), 1u);
-    EXPECT_NE(log.Lines()[0].find("(SendCommandToDaemon) Failed [0 > setsockopt(fd_socket, SOL_SOCKET, SO_SNDTIMEO, "
-                                  "(char *)&timeout, sizeof(timeout))]"),
-              std::string::npos)
-        << log.Lines()[0];
+    script.fail_setsockopt = cases[i].fail_setsockopt;
+    script.writes = cases[i].writes;
+    script.reads = cases[i].reads;
+    {
+      ScopedSyscallScript scope(&script);
+      EXPECT_EQ(ReasonOf([] { SendCommandToDaemon("pause", Json::Value()); }), cases[i].reason);
+    }
+    if (cases[i].fail_setsockopt) {
+      EXPECT_EQ(log.Matching("(SendCommandToDaemon) Failed [0 > setsockopt(fd_socket, SOL_SOCKET, SO_SNDTIMEO, "
+                             "(char *)&timeout, sizeof(timeout))]")
+                    .size(),
+                1u);
+    }
+    ASSERT_TRUE(daemon.WaitForClosedConnections(i + 1));
+    EXPECT_EQ(OpenDescriptors(), before);
   }
-  ASSERT_TRUE(daemon.WaitForClosedConnections(1));
-  EXPECT_EQ(OpenDescriptors(), before);
-  {
-    SyscallScript script;
-    script.writes = {-EIO};
-    ScopedSyscallScript scope(&script);
-    EXPECT_EQ(ReasonOf([] { SendCommandToDaemon("pause", Json::Value()); }),
-              std::string("write failed, reason=") + strerror(EIO));
-  }
-  ASSERT_TRUE(daemon.WaitForClosedConnections(2));
-  EXPECT_EQ(OpenDescriptors(), before);
-  {
-    SyscallScript script;
-    script.reads = {-ECONNRESET};
-    ScopedSyscallScript scope(&script);
-    EXPECT_EQ(ReasonOf([] { SendCommandToDaemon("pause", Json::Value()); }),
-              std::string("read failed, reason=") + strerror(ECONNRESET));
-  }
-  ASSERT_TRUE(daemon.WaitForClosedConnections(3));
-  EXPECT_EQ(OpenDescriptors(), before);
 }
 
 TEST_F(DaemonChannel, PeerThatHangsUpGivesAnErrorNotASignal) {
   // Accepts and closes at once, without reading: the write meets a closed
   // peer. The caller did not ignore SIGPIPE and must survive.
-  const std::string path = root_.MakeDir("var/run") + "/fileindexd.sock";
-  const int listener = socket(AF_UNIX, SOCK_STREAM, 0);
-  struct sockaddr_un address;
-  memset(&address, 0, sizeof(address));
-  address.sun_family = AF_UNIX;
-  memcpy(address.sun_path, path.c_str(), path.size());
-  ASSERT_EQ(bind(listener, reinterpret_cast<sockaddr*>(&address), sizeof(address)), 0);
-  ASSERT_EQ(listen(listener, 4), 0);
+  const int listener = BindDaemonSocket(root_, true);
   std::thread closer([listener] { close(accept(listener, nullptr, nullptr)); });
   ASSERT_EQ(signal(SIGPIPE, SIG_DFL), SIG_DFL);
   const std::string reason = ReasonOf([] { SendCommandToDaemon("x", std::string(200000, 'z')); });

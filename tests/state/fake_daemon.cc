@@ -89,14 +89,6 @@ std::vector<ReceivedFrame> FakeDaemon::Frames() const {
   return frames_;
 }
 
-bool FakeDaemon::WaitForFrames(size_t count) const {
-  for (int i = 0; i < 500; ++i) {
-    if (Frames().size() >= count) return true;
-    std::this_thread::sleep_for(std::chrono::milliseconds(10));
-  }
-  return false;
-}
-
 bool FakeDaemon::WaitForClosedConnections(size_t count) const {
   for (int i = 0; i < 500; ++i) {
     {

@@ -26,9 +26,7 @@ class FakeDaemon {
   FakeDaemon& operator=(const FakeDaemon&) = delete;
 
   std::vector<ReceivedFrame> Frames() const;
-  // Waits (really, briefly) until `count` frames arrived; false on timeout.
-  bool WaitForFrames(size_t count) const;
-  // Waits until `count` connections were served and closed on this side.
+  // Waits (really, briefly) until `count` connections were served and closed on this side.
   bool WaitForClosedConnections(size_t count) const;
 
  private:

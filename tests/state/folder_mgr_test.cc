@@ -12,7 +12,9 @@ namespace fileindex {
 namespace {
 
 using testing_support::ErrorOf;
+using testing_support::ExpectError;
 using testing_support::LogCapture;
+using testing_support::ReadFile;
 using testing_support::SleepRecorder;
 using testing_support::StateSandbox;
 
@@ -57,26 +59,19 @@ TEST_F(FolderMgrTest, NoFileIsAnEmptyListAndSavesAnArray) {
   EXPECT_FALSE(mgr.GetMostSuitableCfg(s_ + "/a"));
   EXPECT_FALSE(mgr.IsFullPathIndexed(s_));
   mgr.Save();
-  EXPECT_EQ(sandbox_.Read(FoldersPath()), "[]\n");
+  EXPECT_EQ(ReadFile(FoldersPath()), "[]\n");
   struct stat info;
   ASSERT_EQ(stat(FoldersPath().c_str(), &info), 0);
   EXPECT_EQ(info.st_mode & 07777, 0644u);
 }
 
 TEST_F(FolderMgrTest, BadFilesAreRefused) {
-  {
-    WriteFolders("[{\"path\":");
-    LogCapture log;
-    const Error error = ErrorOf([] { FolderMgr(); });
-    EXPECT_EQ(error.code, kErrorLoadJson);
-    EXPECT_EQ(error.reason, "Cannot load json: " + FoldersPath());
-    EXPECT_EQ(log.Matching("(FolderMgr) Failed [IsFileExist(kFileIndexFoldersCfgPath) && "
-                           "!folders.fromFile(kFileIndexFoldersCfgPath)]")
-                  .size(),
-              1u);
+  for (const auto& [text, condition] : std::vector<std::pair<std::string, std::string>>{
+           {"[{\"path\":", "IsFileExist(kFileIndexFoldersCfgPath) && !folders.fromFile(kFileIndexFoldersCfgPath)"},
+           {"{\"path\":\"/s/a\"}", "!folders.isNull() && !folders.isArray()"}}) {
+    WriteFolders(text);
+    ExpectError([] { FolderMgr(); }, kErrorLoadJson, "Cannot load json: " + FoldersPath(), condition);
   }
-  WriteFolders("{\"path\":\"/s/a\"}");
-  EXPECT_EQ(ErrorOf([] { FolderMgr(); }).code, kErrorLoadJson);
   WriteFolders("[{\"path\":\"/s/a\",\"name\":\"n\"}]");
   LogCapture log;
   const Error malformed = ErrorOf([] { FolderMgr(); });
@@ -134,7 +129,9 @@ TEST_F(FolderMgrTest, NeedMetaFollowsTheGoverningFoldersCategories) {
   EXPECT_FALSE(mgr.IsFullPathNeedMeta(s_ + "/b/report.pdf"));
 }
 
-TEST_F(FolderMgrTest, UpsertOfANewFolderReindexesEverything) {
+// What to reindex: every kind for a new folder, what differs from the
+// governing folder for one below it.
+TEST_F(FolderMgrTest, UpsertOfANewFolderReindexesAgainstWhatGovernedIt) {
   FolderMgr mgr;
   std::shared_ptr<Folder> old;
   mgr.Upsert(old, MakeFolder("/s/a", true, false, false, false, "A"));
@@ -143,6 +140,9 @@ TEST_F(FolderMgrTest, UpsertOfANewFolderReindexesEverything) {
   EXPECT_EQ(old->GetName(), "A");
   EXPECT_EQ(old->GetIndexCfg(), MakeFolder("/x")->GetIndexCfg());
   EXPECT_FALSE(old->IsPrivileged());
+  mgr.Upsert(old, MakeFolder("/s/a/b", false, true, false, true));
+  EXPECT_EQ(old->GetPath(), "/s/a/b");
+  EXPECT_EQ(old->GetIndexCfg(), MakeFolder("/x", true, true, false, true)->GetIndexCfg());
 }
 
 TEST_F(FolderMgrTest, UpsertOfAChangedFolderReindexesTheSwitchedKindsAndMovesItLast) {
@@ -151,32 +151,13 @@ TEST_F(FolderMgrTest, UpsertOfAChangedFolderReindexesTheSwitchedKindsAndMovesItL
   auto changed = std::make_shared<Folder>("/s/a", "renamed", true, false, true, true, true, true);
   mgr.Upsert(old, changed);
   EXPECT_EQ(Paths(mgr.Folders()), (std::vector<std::string>{"/s/b", "/s/c", "/s/a"}));
-  EXPECT_EQ(old->GetIndexCfg(), Json::Value([] {
-              Json::Value cfg;
-              cfg["document"] = false;
-              cfg["audio"] = true;
-              cfg["video"] = false;
-              cfg["photo"] = false;
-              return cfg;
-            }()));
+  EXPECT_EQ(old->GetIndexCfg(), MakeFolder("/x", false, true, false, false)->GetIndexCfg());
   EXPECT_FALSE(old->IsPaused());
   EXPECT_FALSE(old->IsPrivileged());
   mgr.Save();
-  const std::string text = sandbox_.Read(FoldersPath());
+  const std::string text = ReadFile(FoldersPath());
   EXPECT_LT(text.find("/s/c"), text.find("\"path\":\"/s/a\""));
   EXPECT_EQ(FolderMgr().Folders().back()->GetName(), "renamed");
-}
-
-TEST_F(FolderMgrTest, UpsertBelowAnIndexedFolderDiffsAgainstIt) {
-  FolderMgr mgr;
-  std::shared_ptr<Folder> old;
-  mgr.Upsert(old, MakeFolder("/s/a", true, true, false, false));
-  mgr.Upsert(old, MakeFolder("/s/a/b", true, false, false, true));
-  EXPECT_EQ(old->GetPath(), "/s/a/b");
-  EXPECT_FALSE(old->IsDocument());
-  EXPECT_TRUE(old->IsAudio());
-  EXPECT_FALSE(old->IsVideo());
-  EXPECT_TRUE(old->IsPhoto());
 }
 
 TEST_F(FolderMgrTest, TheThousandAndFirstFolderIsRefused) {
@@ -187,11 +168,8 @@ TEST_F(FolderMgrTest, TheThousandAndFirstFolderIsRefused) {
   mgr.Upsert(old, MakeFolder("/s/f999"));
   EXPECT_EQ(mgr.Folders().size(), 1000u);
   mgr.Upsert(old, MakeFolder("/s/f0"));  // a replacement does not grow the list
-  LogCapture log;
-  const Error error = ErrorOf([&] { mgr.Upsert(old, MakeFolder("/s/f1000")); });
-  EXPECT_EQ(error.code, kErrorTooManyFolders);
-  EXPECT_EQ(error.reason, "");
-  EXPECT_EQ(log.Matching("(Upsert) Failed [folders_.size() > kFileIndexFoldersMax]").size(), 1u);
+  ExpectError([&] { mgr.Upsert(old, MakeFolder("/s/f1000")); }, kErrorTooManyFolders, "",
+              "folders_.size() > kFileIndexFoldersMax");
 }
 
 TEST_F(FolderMgrTest, GetAndDeleteFindExactPaths) {
@@ -199,18 +177,12 @@ TEST_F(FolderMgrTest, GetAndDeleteFindExactPaths) {
   std::shared_ptr<Folder> found;
   mgr.Get(found, "/s/b");
   EXPECT_EQ(found->GetPath(), "/s/b");
-  {
-    LogCapture log;
-    EXPECT_EQ(ErrorOf([&] { mgr.Get(found, "/s/c"); }).code, kErrorFolderNotFound);
-    EXPECT_EQ(log.Matching("(Get) Failed [it == folders_.end()], reason: Folder not found: /s/c").size(), 1u);
-  }
+  ExpectError([&] { mgr.Get(found, "/s/c"); }, kErrorFolderNotFound, "Folder not found: /s/c", "it == folders_.end()");
   std::shared_ptr<Folder> removed;
   mgr.Delete(removed, "/s/a");
   EXPECT_EQ(removed->GetPath(), "/s/a");
   EXPECT_EQ(Paths(mgr.Folders()), std::vector<std::string>{"/s/b"});
-  const Error missing = ErrorOf([&] { mgr.Delete(removed, "/s/a"); });
-  EXPECT_EQ(missing.code, kErrorFolderNotFound);
-  EXPECT_EQ(missing.reason, "Folder not found: /s/a");
+  ExpectError([&] { mgr.Delete(removed, "/s/a"); }, kErrorFolderNotFound, "Folder not found: /s/a");
 }
 
 TEST_F(FolderMgrTest, SharesOfTheList) {
@@ -255,11 +227,7 @@ TEST_F(FolderMgrTest, SaveFailureIs505) {
   const FolderMgr mgr = With({"/s/a"});
   ASSERT_EQ(unlink(FoldersPath().c_str()), 0);
   ASSERT_EQ(rmdir((sandbox_.root() + "/var/packages/CorvLumex/etc").c_str()), 0);
-  LogCapture log;
-  const Error error = ErrorOf([&] { mgr.Save(); });
-  EXPECT_EQ(error.code, kErrorSaveJson);
-  EXPECT_EQ(error.reason, FoldersPath());
-  EXPECT_EQ(log.Matching("Failed [!folders.toFile(kFileIndexFoldersCfgPath)]").size(), 1u);
+  ExpectError([&] { mgr.Save(); }, kErrorSaveJson, FoldersPath(), "!folders.toFile(kFileIndexFoldersCfgPath)");
 }
 
 }  // namespace

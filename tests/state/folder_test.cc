@@ -1,6 +1,7 @@
 #include <gtest/gtest.h>
 
 #include <ctime>
+#include <fstream>
 
 #include "common/error.h"
 #include "common/json_util.h"
@@ -13,7 +14,7 @@ namespace fileindex {
 namespace {
 
 using testing_support::ErrorOf;
-using testing_support::LogCapture;
+using testing_support::ExpectError;
 using testing_support::SleepRecorder;
 using testing_support::StateSandbox;
 
@@ -39,6 +40,7 @@ TEST(FolderRecord, OptionalKeysDefaultAndAreWrittenBack) {
   EXPECT_FALSE(data.isMember("extra"));
 }
 
+// The constructor takes document, audio, video, photo, privileged, paused.
 TEST(FolderRecord, StoredTextKeepsTheStoredMemberOrder) {
   Folder folder("/photo/a\"b", "Name", true, false, true, false, true, false);
   folder.SetVolumeToBeClean("/volume2");
@@ -47,13 +49,7 @@ TEST(FolderRecord, StoredTextKeepsTheStoredMemberOrder) {
             R"("paused":false,"privileged":true,"volume_to_be_clean":"/volume2"})");
   // The text reads back into the same record.
   EXPECT_EQ(Folder(Parse(folder.GetStoredText())).GetData(), folder.GetData());
-}
-
-TEST(FolderRecord, ConstructorArgumentsAreInTheirDocumentedOrder) {
-  const Folder folder("/s/d", "n", true, false, false, false, true, false);
-  EXPECT_TRUE(folder.IsDocument());
-  EXPECT_TRUE(folder.IsPrivileged());
-  EXPECT_FALSE(folder.IsPaused());
+  EXPECT_EQ(folder.GetIndexCfg(), Parse(R"({"document":true,"audio":false,"video":true,"photo":false})"));
   const Folder paused("/s/d", "n", false, false, false, true, false, true);
   EXPECT_TRUE(paused.IsPhoto());
   EXPECT_TRUE(paused.IsPaused());
@@ -78,11 +74,6 @@ TEST(FolderRecord, MalformedRecordsNameTheirFault) {
   EXPECT_EQ(lenient.GetVolumeToBeClean(), "");
 }
 
-TEST(FolderRecord, IndexCfgIsTheContentSelectionOnly) {
-  const Folder folder("/s/d", "n", true, false, true, false, true, true);
-  EXPECT_EQ(folder.GetIndexCfg(), Parse(R"({"document":true,"audio":false,"video":true,"photo":false})"));
-}
-
 TEST(FolderRecord, SetShareReplacesThePathAndSetsTheCacheWithoutThePlatform) {
   Folder folder("/photo/2019/photo", "n", true, true, true, true, false, false);
   folder.SetShare("x");
@@ -97,21 +88,9 @@ TEST(FolderRecord, SetShareReplacesThePathAndSetsTheCacheWithoutThePlatform) {
 
 TEST(FolderRecord, AdditionalMustBeAnArrayOfKnownNames) {
   const Folder folder("/s/d", "n", true, true, true, true, false, false);
-  {
-    LogCapture log;
-    const Error error = ErrorOf([&] { folder.GetDataWithAdditional(Json::Value()); });
-    EXPECT_EQ(error.code, kErrorBadArgument);
-    EXPECT_EQ(error.reason, "null");
-    ASSERT_EQ(log.Lines().size(), 1u);
-    EXPECT_NE(log.Lines()[0].find("(GetDataWithAdditional) Failed [!addiitionals.isArray()], reason: null"),
-              std::string::npos)
-        << log.Lines()[0];
-  }
-  {
-    LogCapture log;
-    EXPECT_EQ(ErrorOf([&] { folder.GetDataWithAdditional(Parse("[1]")); }).code, kErrorBadArgument);
-    EXPECT_EQ(log.Matching("Failed [!it.isString()]").size(), 1u);
-  }
+  ExpectError([&] { folder.GetDataWithAdditional(Json::Value()); }, kErrorBadArgument, "null",
+              "!addiitionals.isArray()");
+  ExpectError([&] { folder.GetDataWithAdditional(Parse("[1]")); }, kErrorBadArgument, "1", "!it.isString()");
   // An empty object is not an empty list.
   EXPECT_EQ(ErrorOf([&] { folder.GetDataWithAdditional(Parse("{}")); }).code, kErrorBadArgument);
   const Error unknown = ErrorOf([&] { folder.GetDataWithAdditional(Parse(R"(["size"])")); });
@@ -127,10 +106,10 @@ class FolderStatus : public ::testing::Test {
  protected:
   FolderStatus() {
     share_dir_ = sandbox_.AddShare("photo");
-    sandbox_.AddShare("locked", /*readonly=*/true);
+    sandbox_.AddShare("locked", "volume1", {/*readonly=*/true});
     queue_ = share_dir_ + "/@eaDir/fileindex.queue";
   }
-  void Queue(const std::string& lines) { sandbox_.Write(queue_.substr(sandbox_.root().size() + 1), lines); }
+  void Queue(const std::string& lines) { std::ofstream(queue_) << lines; }
   std::string Status(const Folder& folder) {
     Json::Value out;
     folder.GetStatus(out);

@@ -17,6 +17,7 @@ namespace corvlumex {
 namespace fileindex {
 namespace {
 
+using testing_support::ErrorOf;
 using testing_support::LogCapture;
 using testing_support::SleepRecorder;
 using testing_support::StateSandbox;
@@ -107,13 +108,9 @@ TEST_F(QueueMgrTest, FailedRenameIs502) {
   ASSERT_EQ(mkdir((tmp_ + "/x").c_str(), 0755), 0);
   QueueMgr mgr(queue_);
   LogCapture log;
-  try {
-    mgr.PrepareTmpQueue();
-    FAIL() << "no throw";
-  } catch (const Error& error) {
-    EXPECT_EQ(error.code, kErrorSystem);
-    EXPECT_EQ(error.reason.rfind("rename failed, reason=", 0), 0u) << error.reason;
-  }
+  const Error error = ErrorOf([&] { mgr.PrepareTmpQueue(); });
+  EXPECT_EQ(error.code, kErrorSystem);
+  EXPECT_EQ(error.reason.rfind("rename failed, reason=", 0), 0u) << error.reason;
   EXPECT_EQ(log.Matching("(PrepareTmpQueue) Failed [0 > rename(queue_path_.c_str(), queue_path_tmp_.c_str())]").size(),
             1u);
   EXPECT_TRUE(IsFileExist(queue_)) << "the queue stays where it was";
@@ -137,12 +134,7 @@ TEST_F(QueueMgrTest, ProcessingMeansAnEventOnThePathOrBelowInEitherFile) {
 TEST_F(QueueMgrTest, ProcessingLoadsTheFolderFile) {
   sandbox_.Write("var/packages/CorvLumex/etc/fileindex.folders", "not json");
   QueueMgr mgr(queue_);
-  try {
-    mgr.IsFullPathProcessing("/v/s/dir");
-    FAIL() << "no throw";
-  } catch (const Error& error) {
-    EXPECT_EQ(error.code, kErrorLoadJson);
-  }
+  EXPECT_EQ(ErrorOf([&] { mgr.IsFullPathProcessing("/v/s/dir"); }).code, kErrorLoadJson);
 }
 
 TEST_F(QueueMgrTest, ReindexCoversThePathAndWhatIsBelowIt) {
@@ -164,13 +156,7 @@ TEST_F(QueueMgrTest, ReindexCoversThePathAndWhatIsBelowIt) {
 TEST_F(QueueMgrTest, AMalformedLineFailsTheScan) {
   QueueMgr mgr(queue_);
   Write(queue_, Line(kEventCreate, "/v/s/a") + "\n" + Line(kEventCreate, "/v/s/dir/f"));
-  LogCapture log;
-  try {
-    mgr.IsFullPathProcessing("/v/s/dir");
-    FAIL() << "no throw";
-  } catch (const Error& error) {
-    EXPECT_EQ(error.code, kErrorMalformedEvent);
-  }
+  EXPECT_EQ(ErrorOf([&] { mgr.IsFullPathProcessing("/v/s/dir"); }).code, kErrorMalformedEvent);
   // A hit before the bad line ends the scan first.
   EXPECT_TRUE(mgr.IsFullPathProcessing("/v/s/a"));
 }

@@ -1,32 +1,26 @@
-// A sandbox root laid out like an installed system for the state tests:
-// the package's etc folder, /tmp for lock files, a share registry and a
-// fake fileindexd on the sandbox's command socket.
+// A sandbox root laid out like an installed system: the package's etc
+// folder, /tmp for lock files, two volumes, a share registry the tests can
+// change, and a fake fileindexd on the sandbox's command socket.
 #pragma once
 
-#include <gtest/gtest.h>
 #include <json/json.h>
 
 #include <memory>
 #include <string>
+#include <vector>
 
-#include "common/error.h"
 #include "tests/state/fake_daemon.h"
+#include "tests/support/expect_error.h"
 #include "tests/support/log_capture.h"
 
 namespace corvlumex {
 namespace testing_support {
 
-// The Error that `fn` throws; a test failure (and a 9999 stand-in) when none.
-template <typename Fn>
-Error ErrorOf(Fn fn) {
-  try {
-    fn();
-  } catch (const Error& error) {
-    return error;
-  }
-  ADD_FAILURE() << "no throw";
-  return Error(kErrorUnexpected, "no throw");
-}
+struct ShareFlags {
+  bool readonly = false;
+  bool encrypted = false;
+  bool recycle_bin = false;
+};
 
 class StateSandbox {
  public:
@@ -35,17 +29,35 @@ class StateSandbox {
 
   const std::string& root() const { return root_.path(); }
   std::string EtcFile(const std::string& name) const;  // sandboxed package etc path
-  // Creates a share directory <root>/volume1/<name> (with its @eaDir) and
-  // registers it; returns the share's directory.
-  std::string AddShare(const std::string& name, bool readonly = false, bool encrypted = false);
-  // Writes a raw file under the sandbox root.
-  std::string Write(const std::string& relative, const std::string& content) const;
-  std::string Read(const std::string& absolute) const;
-  FakeDaemon* daemon() { return daemon_.get(); }
-  // The sandbox's /volume1 directory.
-  std::string Volume() const { return root_.path() + "/volume1"; }
+  // <root>/<volume>; "volume1" and "volume2" exist.
+  std::string Volume(const std::string& volume = "volume1") const { return root_.path() + "/" + volume; }
+  // Creates <root>/<volume>/<name> with its @eaDir and registers it; returns its directory.
+  std::string AddShare(const std::string& name, const std::string& volume = "volume1", ShareFlags flags = {});
+  // Renames the share's directory and its registry entry; returns the new directory.
+  std::string RenameShare(const std::string& from, const std::string& to);
+  // Moves the share's directory to another volume; returns the new directory.
+  std::string MoveShare(const std::string& name, const std::string& volume);
+  // Drops the share from the registry (its directory stays).
+  void RemoveShare(const std::string& name);
+  void SetRecycleBin(const std::string& name, bool enabled);
+  bool HasShare(const std::string& name) const;
+  std::string QueueFile(const std::string& share) const;  // of a registered share
+  // Queue lines of a share, parsed.
+  std::vector<Json::Value> QueueEvents(const std::string& share) const;
+
+  std::string Write(const std::string& relative, const std::string& content) const {
+    return root_.WriteFile(relative, content);
+  }
+  std::string MakeDir(const std::string& relative) const { return root_.MakeDir(relative); }
+  FakeDaemon* daemon() const { return daemon_.get(); }
+  // The commands the fake fileindexd received, parsed.
+  std::vector<Json::Value> DaemonCommands() const;
+
+ protected:
+  const Json::Value& shares() const { return shares_; }
 
  private:
+  Json::ArrayIndex IndexOf(const std::string& name) const;  // throws for an unknown share
   void SaveRegistry() const;
 
   SandboxRoot root_;

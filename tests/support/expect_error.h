@@ -1,0 +1,64 @@
+// Checks shared by the test directories: the Error an action throws and the
+// log line that went with it, the descriptors this process holds, and the
+// bytes of a file.
+#pragma once
+
+#include <dirent.h>
+#include <gtest/gtest.h>
+
+#include <fstream>
+#include <sstream>
+#include <string>
+
+#include "common/error.h"
+#include "tests/support/log_capture.h"
+
+namespace corvlumex {
+namespace testing_support {
+
+// The Error that `fn` throws; a test failure (and a 9999 stand-in) when none.
+template <typename Fn>
+Error ErrorOf(Fn fn) {
+  try {
+    fn();
+  } catch (const Error& error) {
+    return error;
+  }
+  ADD_FAILURE() << "no throw";
+  return Error(kErrorUnexpected, "no throw");
+}
+
+// `fn` throws `code` with exactly `reason`; unless `condition` is empty, one
+// log line shows "Failed [<condition>], reason: <reason>". Captures the log
+// itself: do not call it while another LogCapture is alive.
+template <typename Fn>
+void ExpectError(Fn fn, ErrorCode code, const std::string& reason, const std::string& condition = "") {
+  LogCapture log;
+  const Error error = ErrorOf(fn);
+  EXPECT_EQ(error.code, code) << error.what();
+  EXPECT_EQ(error.reason, reason);
+  if (!condition.empty()) {
+    EXPECT_EQ(log.Matching("Failed [" + condition + "], reason: " + reason).size(), 1u)
+        << ::testing::PrintToString(log.Lines());
+  }
+}
+
+inline int OpenDescriptors() {
+  int count = 0;
+  DIR* dir = opendir("/proc/self/fd");
+  while (readdir(dir) != nullptr) ++count;
+  closedir(dir);
+  return count;
+}
+
+// The file's bytes; "<absent>" when it cannot be opened.
+inline std::string ReadFile(const std::string& path) {
+  std::ifstream input(path, std::ios::binary);
+  if (!input) return "<absent>";
+  std::ostringstream content;
+  content << input.rdbuf();
+  return content.str();
+}
+
+}  // namespace testing_support
+}  // namespace corvlumex
