@@ -4,11 +4,12 @@
 
 #include "common/error.h"
 #include "common/log.h"
-#include "tests/support/log_capture.h"
+#include "tests/support/expect_error.h"
 
 namespace corvlumex {
 namespace {
 
+using testing_support::ErrorOf;
 using testing_support::LogCapture;
 
 TEST(ErrorTest, MessageWithoutReasonHasNoBrackets) {
@@ -35,12 +36,7 @@ TEST(CheckThrowTest, LogsOnceThenThrowsWithoutErrnoPart) {
   errno = 0;
   FailWhen(false);
   EXPECT_TRUE(log.Lines().empty());
-  try {
-    FailWhen(true);
-    FAIL() << "no throw";
-  } catch (const Error& error) {
-    EXPECT_EQ(error.code, kErrorNoSpace);
-  }
+  EXPECT_EQ(ErrorOf([] { FailWhen(true); }).code, kErrorNoSpace);
   ASSERT_EQ(log.Lines().size(), 1u);
   const std::string line = log.Lines()[0];
   EXPECT_NE(line.find("error_log_test.cc:"), std::string::npos) << line;
@@ -65,11 +61,7 @@ void FailWithText() { CORV_CHECK_THROW_TEXT(true, "0 > Something(x)", kErrorSyst
 TEST(CheckThrowTest, ExplicitConditionTextAndCodeOnlyError) {
   LogCapture log;
   errno = 0;
-  try {
-    FailWithText();
-  } catch (const Error& error) {
-    EXPECT_STREQ(error.what(), "CorvLumex error, code=502");
-  }
+  EXPECT_STREQ(ErrorOf(FailWithText).what(), "CorvLumex error, code=502");
   ASSERT_EQ(log.Lines().size(), 1u);
   EXPECT_NE(log.Lines()[0].find("(FailWithText) Failed [0 > Something(x)], reason: "), std::string::npos);
 }

@@ -103,13 +103,6 @@ TEST(JsonArrayTest, ConvertsBothWays) {
   EXPECT_TRUE(JsonArr2Vec<std::string>(Parse(R"({"a":"b"})")).empty());
 }
 
-TEST(JsonFileTest, TooDeepNestingIsInvalidNotAThrow) {
-  Json::Value value = Parse("{\"kept\":1}");
-  const std::string deep = std::string(5000, '[') + std::string(5000, ']');
-  EXPECT_FALSE(JsonFromString(value, deep));
-  EXPECT_EQ(value["kept"].asInt(), 1);
-}
-
 TEST(JsonFileTest, ConveniencesReportSuccess) {
   testing_support::SandboxRoot root(false);
   Json::Value value;
@@ -130,11 +123,12 @@ TEST(JsonFileTest, ConveniencesReportSuccess) {
 
 // Text that merely starts with a value is not JSON: a queue line or a reply
 // with something after the value, a comment or a trailing comma is refused,
-// and the value keeps what it held.
+// and the value keeps what it held. Too deep a nesting is invalid, not a throw.
 TEST(JsonFileTest, OnlyValidJsonIsAccepted) {
   Json::Value value = Parse(R"({"kept":1})");
-  for (const char* text : {R"({"a":1} junk)", R"({"a":1}})", "// c\n{}", R"({"a":1} // c)", "[1,]",
-                           R"({"a":1,})", "", "  "}) {
+  const std::string deep = std::string(5000, '[') + std::string(5000, ']');
+  for (const std::string text : {R"({"a":1} junk)", R"({"a":1}})", "// c\n{}", R"({"a":1} // c)", "[1,]",
+                                 R"({"a":1,})", "", "  ", deep.c_str()}) {
     EXPECT_FALSE(JsonFromString(value, text)) << text;
     EXPECT_EQ(value, Parse(R"({"kept":1})")) << text;
   }

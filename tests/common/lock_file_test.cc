@@ -1,4 +1,3 @@
-#include <dirent.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -10,22 +9,17 @@
 #include "common/error.h"
 #include "common/lock_file.h"
 #include "common/sys.h"
-#include "tests/support/log_capture.h"
+#include "tests/support/expect_error.h"
 
 namespace corvlumex {
 namespace {
 
+using testing_support::ErrorOf;
+using testing_support::ExpectError;
 using testing_support::LogCapture;
+using testing_support::OpenDescriptors;
 using testing_support::SandboxRoot;
 using testing_support::SleepRecorder;
-
-int OpenDescriptors() {
-  int count = 0;
-  DIR* dir = opendir("/proc/self/fd");
-  while (readdir(dir) != nullptr) ++count;
-  closedir(dir);
-  return count;
-}
 
 TEST(LockFileTest, MissingFileIsCreatedAndKept) {
   SandboxRoot root(false);
@@ -60,13 +54,7 @@ TEST(LockFileTest, GivesUpAfter64AttemptsWithoutLeakingDescriptors) {
   SleepRecorder sleeps;
   LockFile held(path, true);
   const int before = OpenDescriptors();
-  try {
-    LockFile again(path, true);
-    FAIL() << "second exclusive lock succeeded";
-  } catch (const Error& error) {
-    EXPECT_EQ(error.code, kErrorLockFile);
-    EXPECT_EQ(error.reason, "Exceed max retry, path=" + path);
-  }
+  ExpectError([&] { LockFile again(path, true); }, kErrorLockFile, "Exceed max retry, path=" + path);
   EXPECT_EQ(OpenDescriptors(), before);
   const auto recorded = sleeps.Sleeps();
   ASSERT_EQ(recorded.size(), 64u);
@@ -80,13 +68,9 @@ TEST(LockFileTest, OpenFailureIsLoggedAndThrown) {
   SandboxRoot root(false);
   LogCapture log;
   const std::string path = root.path() + "/no/such/dir/cfg.lock";
-  try {
-    LockFile lock(path, true);
-    FAIL();
-  } catch (const Error& error) {
-    EXPECT_EQ(error.code, kErrorLockFile);
-    EXPECT_EQ(error.reason, "open failed, path=" + path + ", reason=No such file or directory");
-  }
+  const Error error = ErrorOf([&] { LockFile lock(path, true); });
+  EXPECT_EQ(error.code, kErrorLockFile);
+  EXPECT_EQ(error.reason, "open failed, path=" + path + ", reason=No such file or directory");
   const auto lines = log.Lines();
   ASSERT_EQ(lines.size(), 1u);
   EXPECT_NE(lines[0].find("(LockFile) Failed [0 > (fd_ = open(path_.c_str(), O_RDONLY | O_CREAT, 0644))], "
