@@ -13,12 +13,14 @@
 #include "common/log.h"
 #include "sdk/credentials.h"
 #include "tests/platform/share_sandbox.h"
+#include "tests/support/expect_error.h"
 
 namespace corvlumex {
 namespace sdk {
 namespace {
 
 using platform::LinuxPlatform;
+using testing_support::ErrorOf;
 using testing_support::LogCapture;
 using testing_support::SandboxRoot;
 using testing_support::ScopedPlatform;
@@ -61,12 +63,7 @@ TEST(SDKCredentialsTest, FailuresAre503) {
   SandboxRoot root;
   ScopedPlatform installed(std::make_shared<CountingPlatform>("alice"));
   LogCapture log;
-  try {
-    SDKCredentials as("alice");
-    ADD_FAILURE() << "no Error thrown";
-  } catch (const Error& error) {
-    EXPECT_EQ(error.code, kErrorSwitchUser);
-  }
+  EXPECT_EQ(ErrorOf([] { SDKCredentials as("alice"); }).code, kErrorSwitchUser);
   EXPECT_EQ(log.Matching("Failed [!ResetCredentialsByName(target_username)]").size(), 1u);
 
   struct NoUsers : LinuxPlatform {
@@ -76,13 +73,9 @@ TEST(SDKCredentialsTest, FailuresAre503) {
     }
   };
   ScopedPlatform no_users(std::make_shared<NoUsers>());
-  try {
-    SDKCredentials saved;
-    ADD_FAILURE() << "no Error thrown";
-  } catch (const Error& error) {
-    EXPECT_EQ(error.code, kErrorSwitchUser);
-    EXPECT_EQ(error.reason, "CORVUserGetByUID failed, err=0x0600");
-  }
+  const Error error = ErrorOf([] { SDKCredentials saved; });
+  EXPECT_EQ(error.code, kErrorSwitchUser);
+  EXPECT_EQ(error.reason, "CORVUserGetByUID failed, err=0x0600");
   EXPECT_EQ(log.Matching("Failed [0 > CORVUserGetByUID(euid_, &user_info) || !user_info]").size(), 1u);
 }
 

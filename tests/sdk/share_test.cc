@@ -4,6 +4,7 @@
 #include "common/error.h"
 #include "sdk/share.h"
 #include "tests/platform/share_sandbox.h"
+#include "tests/support/expect_error.h"
 
 namespace corvlumex {
 namespace sdk {
@@ -11,25 +12,9 @@ namespace {
 
 using platform::LinuxPlatform;
 using platform::ShareInfo;
-using testing_support::LogCapture;
+using testing_support::ExpectError;
 using testing_support::ScopedPlatform;
 using testing_support::ShareSandbox;
-
-// Expects `action` to throw Error `code` with `reason`, and one log line
-// showing `condition`.
-template <typename Action>
-void ExpectError(Action action, ErrorCode code, const std::string& reason, const std::string& condition) {
-  LogCapture log;
-  try {
-    action();
-    ADD_FAILURE() << "no Error thrown";
-  } catch (const Error& error) {
-    EXPECT_EQ(error.code, code);
-    EXPECT_EQ(error.reason, reason);
-  }
-  EXPECT_EQ(log.Matching("Failed [" + condition + "], reason: " + reason).size(), 1u)
-      << (log.Lines().empty() ? "no log line" : log.Lines()[0]);
-}
 
 // Every share query fails, as a broken platform library would.
 class FailingSharePlatform : public LinuxPlatform {

@@ -8,13 +8,15 @@
 #include "common/file_util.h"
 #include "fileindex/util.h"
 #include "tests/platform/share_sandbox.h"
+#include "tests/support/expect_error.h"
 
 namespace corvlumex {
 namespace fileindex {
 namespace {
 
 using platform::LinuxPlatform;
-using testing_support::LogCapture;
+using testing_support::ErrorOf;
+using testing_support::ExpectError;
 using testing_support::ScopedPlatform;
 using testing_support::ShareSandbox;
 
@@ -31,15 +33,7 @@ TEST(ShareNameTest, FirstComponentOfASharePath) {
   EXPECT_EQ(ShareNameOf("/"), "");
   EXPECT_EQ(ShareNameOf("//x"), "");
   for (const std::string& bad : {std::string(), std::string("photo"), std::string("photo/a")}) {
-    LogCapture log;
-    try {
-      ShareNameOf(bad);
-      ADD_FAILURE() << bad;
-    } catch (const Error& error) {
-      EXPECT_EQ(error.code, kErrorBadArgument);
-      EXPECT_EQ(error.reason, bad);
-    }
-    EXPECT_EQ(log.Matching("Failed [1 > share_path.size() || '/' != share_path.at(0)]").size(), 1u);
+    ExpectError([&] { ShareNameOf(bad); }, kErrorBadArgument, bad, "1 > share_path.size() || '/' != share_path.at(0)");
   }
 }
 
@@ -49,15 +43,8 @@ TEST(ReplacePathShareTest, FirstWholeComponentOnly) {
   EXPECT_EQ(ReplacePathShare("/volume1/photo/2019/a.jpg", "pics", "photo"), "/volume1/pics/2019/a.jpg");
   EXPECT_EQ(ReplacePathShare("/photo/x", "pics", "photo"), "/pics/x");
   EXPECT_EQ(ReplacePathShare("/volume1/a/x/a", "b", "a"), "/volume1/b/x/a");
-  LogCapture log;
-  try {
-    ReplacePathShare("/volume1/photos/a", "pics", "photo");
-    ADD_FAILURE();
-  } catch (const Error& error) {
-    EXPECT_EQ(error.code, kErrorBadArgument);
-    EXPECT_EQ(error.reason, "Cannot find share: photo");
-  }
-  EXPECT_EQ(log.Matching("Failed [string::npos == pos]").size(), 1u);
+  ExpectError([] { ReplacePathShare("/volume1/photos/a", "pics", "photo"); }, kErrorBadArgument,
+              "Cannot find share: photo", "string::npos == pos");
   EXPECT_THROW(ReplacePathShare("photo", "pics", "photo"), Error);  // no "/" before the name
 }
 
@@ -85,31 +72,18 @@ TEST_F(PathRulesTest, FullPathsAndSharePathsConvert) {
   EXPECT_EQ(full, photo_ + "/2019/a.jpg");
   GetFullPath(full, "/photo");
   EXPECT_EQ(full, photo_);
-  try {
-    GetFullPath(full, "/video/x");
-    ADD_FAILURE();
-  } catch (const Error& error) {
-    EXPECT_EQ(error.code, kErrorShareNotFound);
-  }
+  EXPECT_EQ(ErrorOf([&] { GetFullPath(full, "/video/x"); }).code, kErrorShareNotFound);
   EXPECT_THROW(GetFullPath(full, "photo/x"), Error);
 
   std::string name, path;
   GetShareNamePathByFullPath(name, path, photo_ + "/2019/trip");
   EXPECT_EQ(name, "photo");
   EXPECT_EQ(path, photo_);
-  LogCapture log;
   const std::string outside = sandbox_.volume() + "/video/x";
-  try {
-    GetShareNamePathByFullPath(name, path, outside);
-    ADD_FAILURE();
-  } catch (const Error& error) {
-    EXPECT_EQ(error.code, kErrorSystem);
-    EXPECT_EQ(error.reason, "CORVShareNamePathGet failed, full_path=" + outside);
-  }
-  EXPECT_EQ(log.Matching("Failed [0 > CORVShareNamePathGet(full_path.c_str(), szShareName, sizeof(szShareName), "
-                         "szSharePath, sizeof(szSharePath))]")
-                .size(),
-            1u);
+  ExpectError([&] { GetShareNamePathByFullPath(name, path, outside); }, kErrorSystem,
+              "CORVShareNamePathGet failed, full_path=" + outside,
+              "0 > CORVShareNamePathGet(full_path.c_str(), szShareName, sizeof(szShareName), szSharePath, "
+              "sizeof(szSharePath))");
 }
 
 TEST_F(PathRulesTest, RecycleBins) {
