@@ -40,17 +40,22 @@ class FolderDeleteTest : public testing_support::MgmtTest {
 TEST_F(FolderDeleteTest, LastFolderOfAShareTakesItsIndexAndDataAlong) {
   Add({FolderJson("/photo/a"), FolderJson("/music")});
   sandbox_.MakeDir("volume1/photo/@eaDir/fileindex.db");
+  sandbox_.MakeDir("volume1/photo/@eaDir/fileindex.queue.tmp");
   std::ofstream(photo_ + "/@eaDir/fileindex.queue") << "{\"event\":2,\"path\":\"" << photo_ << "/a/f\"}\n";
-  StatusMgr().SetShareStatus("photo", 1);
+  StatusMgr().SetShareStatus("photo", 3);
+  StatusMgr().SetShareStatus("video", 1);
 
   FolderDelete(JsonList({"/photo/a"}));
   EXPECT_THAT(sandbox_.SavedPaths(), ElementsAre("/music"));
   EXPECT_THAT(NewSearchCommands(), ElementsAre("index_delete fileindex_photo"));
   EXPECT_TRUE(sandbox_.MonitorCfg("photo").isNull());
   EXPECT_FALSE(sandbox_.MonitorCfg("music").isNull());
-  EXPECT_FALSE(std::filesystem::exists(photo_ + "/@eaDir/fileindex.queue"));
-  EXPECT_FALSE(std::filesystem::exists(photo_ + "/@eaDir/fileindex.db"));
+  for (const char* gone : {"fileindex.queue", "fileindex.queue.tmp", "fileindex.db"}) {
+    EXPECT_FALSE(std::filesystem::exists(photo_ + "/@eaDir/" + gone)) << gone;
+  }
+  EXPECT_TRUE(std::filesystem::exists(photo_ + "/@eaDir"));
   EXPECT_EQ(StatusMgr().GetShareStatus("photo"), 0u);
+  EXPECT_EQ(StatusMgr().GetShareStatus("video"), 1u);
   const std::vector<Json::Value> commands = NewDaemonCommands();
   ASSERT_EQ(commands.size(), 1u);
   EXPECT_EQ(JsonToString(commands[0]["data"]), "{\"is_upsert\":false,\"share_name\":\"photo\"}");

@@ -2,7 +2,6 @@
 
 #include <filesystem>
 #include <fstream>
-#include <ostream>
 #include <sstream>
 
 #include "common/json_util.h"
@@ -11,20 +10,6 @@
 namespace corvlumex {
 namespace testing_support {
 namespace fs = std::filesystem;
-
-bool SystemSnapshot::operator==(const SystemSnapshot& other) const {
-  return folders == other.folders && status == other.status && monitor == other.monitor &&
-         service_requests == other.service_requests && spotlight == other.spotlight && queues == other.queues &&
-         daemon_frames == other.daemon_frames && search_requests == other.search_requests;
-}
-
-std::ostream& operator<<(std::ostream& out, const SystemSnapshot& snapshot) {
-  out << "folders=" << snapshot.folders << " status=" << snapshot.status << " monitor files="
-      << snapshot.monitor.size() << " services=[" << snapshot.service_requests << "] spotlight=["
-      << snapshot.spotlight << "] queues=" << snapshot.queues.size() << " daemon frames=" << snapshot.daemon_frames
-      << " search requests=" << snapshot.search_requests;
-  return out;
-}
 
 MgmtSandbox::MgmtSandbox() : search_(std::make_unique<FakeSearchDaemon>()) {
   unsetenv("CORVLUMEX_SERVICE_COMMAND");
@@ -40,13 +25,20 @@ std::vector<std::string> MgmtSandbox::SavedPaths() const {
   return paths;
 }
 
+std::vector<std::string> MgmtSandbox::MonitorFiles() const {
+  std::vector<std::string> files;
+  const fs::path dir = root() + "/etc/corvlumex/monitor.d";
+  if (fs::exists(dir)) {
+    for (const auto& entry : fs::directory_iterator(dir)) files.push_back(entry.path().string());
+  }
+  return files;
+}
+
 Json::Value MgmtSandbox::MonitorCfg(const std::string& share) const {
   const std::string queue = QueueFile(share);
-  const fs::path dir = root() + "/etc/corvlumex/monitor.d";
-  if (!fs::exists(dir)) return Json::Value();
-  for (const auto& entry : fs::directory_iterator(dir)) {
+  for (const std::string& file : MonitorFiles()) {
     Json::Value value;
-    if (JsonFromFile(value, entry.path().string()) && value["queue"].asString() == queue) return value;
+    if (JsonFromFile(value, file) && value["queue"].asString() == queue) return value;
   }
   return Json::Value();
 }
@@ -75,22 +67,17 @@ std::vector<std::string> MgmtSandbox::SearchCommands() const {
 
 SystemSnapshot MgmtSandbox::Snapshot() const {
   SystemSnapshot snapshot;
-  snapshot.folders = ReadFile(FoldersFile());
-  snapshot.status = ReadFile(EtcFile("fileindex.status"));
-  const fs::path dir = root() + "/etc/corvlumex/monitor.d";
-  if (fs::exists(dir)) {
-    for (const auto& entry : fs::directory_iterator(dir)) {
-      snapshot.monitor[entry.path().filename().string()] = ReadFile(entry.path().string());
-    }
-  }
-  snapshot.service_requests = ReadFile(root() + "/var/log/corvlumex/service_requests.log");
-  snapshot.spotlight = ReadFile(root() + "/etc/samba/corvlumex-spotlight.conf");
+  snapshot["folders"] = ReadFile(FoldersFile());
+  snapshot["status"] = ReadFile(EtcFile("fileindex.status"));
+  for (const std::string& file : MonitorFiles()) snapshot[file] = ReadFile(file);
+  snapshot["services"] = ReadFile(root() + "/var/log/corvlumex/service_requests.log");
+  snapshot["spotlight"] = ReadFile(root() + "/etc/samba/corvlumex-spotlight.conf");
   for (const Json::Value& share : shares()) {
     const std::string queue = QueueFile(share["name"].asString());
-    snapshot.queues[queue] = ReadFile(queue);
+    snapshot[queue] = ReadFile(queue);
   }
-  snapshot.daemon_frames = daemon()->Frames().size();
-  snapshot.search_requests = search_->Requests().size();
+  snapshot["daemon frames"] = std::to_string(daemon()->Frames().size());
+  snapshot["search requests"] = std::to_string(search_->Requests().size());
   return snapshot;
 }
 

@@ -16,20 +16,10 @@
 namespace corvlumex {
 namespace testing_support {
 
-// Everything outside the process that a management operation may change.
-struct SystemSnapshot {
-  std::string folders;                           // fileindex.folders bytes ("<absent>" when missing)
-  std::string status;                            // fileindex.status bytes
-  std::map<std::string, std::string> monitor;    // monitor.d file name -> content
-  std::string service_requests;                  // recorded service requests
-  std::string spotlight;                         // the Spotlight switch file
-  std::map<std::string, std::string> queues;     // queue file -> content, every share
-  size_t daemon_frames = 0;
-  size_t search_requests = 0;
-
-  bool operator==(const SystemSnapshot& other) const;
-};
-std::ostream& operator<<(std::ostream& out, const SystemSnapshot& snapshot);
+// Everything outside the process that a management operation may change:
+// file bytes ("<absent>" when missing) and counts of what the fakes received,
+// by name.
+using SystemSnapshot = std::map<std::string, std::string>;
 
 class MgmtSandbox : public StateSandbox {
  public:
@@ -39,6 +29,8 @@ class MgmtSandbox : public StateSandbox {
   std::string FoldersFile() const { return EtcFile("fileindex.folders"); }
   // The share paths of the folder file, in its order.
   std::vector<std::string> SavedPaths() const;
+  // Paths of the files in the notifier's monitor.d folder.
+  std::vector<std::string> MonitorFiles() const;
   // The monitor configuration of a share, parsed; null when there is none.
   Json::Value MonitorCfg(const std::string& share) const;
   std::vector<std::string> ServiceRequests() const;

@@ -50,16 +50,16 @@ TEST(RelatedServicesTest, EnableStartsEverythingAndSwitchesSpotlightOnlyOnce) {
 TEST(RelatedServicesTest, FailuresAreLoggedAndEveryStepStillRuns) {
   MgmtSandbox sandbox;
   ScopedTestPlatform platform;
-  platform->fail_services = true;
+  setenv("CORVLUMEX_SERVICE_COMMAND", "/bin/false", 1);  // every service request fails
   LogCapture log;
   SetupRelatedServices(true);  // does not throw
-  EXPECT_EQ(log.Matching("KLIBServiceRestart failed: err=[0x0800 test_platform.cc:").size(), 1u);
+  unsetenv("CORVLUMEX_SERVICE_COMMAND");
+  EXPECT_EQ(log.Matching("KLIBServiceRestart failed: err=[0x0800 services.cc:").size(), 1u);
   EXPECT_EQ(log.Matching("(SetupRelatedServices) Failed [0 > KLIBServiceStart(\"corvcontentextractd\", TRUE)]").size(), 1u);
   EXPECT_EQ(log.Matching("Failed [0 > KLIBServicectlStart(\"pkg-CorvLumex-fileindexd\", KLIB_SERVICECTL_UPSTART)]")
                 .size(),
             1u);
 
-  platform->fail_services = false;
   platform->fail_spotlight_switch = true;
   log.Clear();
   SetupRelatedServices(false);  // Spotlight is on: the switch fails, samba is left alone
@@ -137,24 +137,6 @@ TEST(RelatedServicesTest, RefusedMonitorConfigurationIsError502) {
                          "MONITOR_QUEUE_TYPE_APPLICATION)]")
                 .size(),
             1u);
-}
-
-TEST(RelatedServicesTest, CleanShareIndexDataRemovesQueuesDatabaseAndStatus) {
-  MgmtSandbox sandbox;
-  const std::string photo = sandbox.AddShare("photo");
-  sandbox.MakeDir("volume1/photo/@eaDir/fileindex.db");
-  sandbox.MakeDir("volume1/photo/@eaDir/fileindex.queue.tmp");
-  std::ofstream(photo + "/@eaDir/fileindex.queue") << "{}\n";
-  StatusMgr().SetShareStatus("photo", 3);
-  StatusMgr().SetShareStatus("music", 1);
-
-  CleanShareIndexData("photo", photo);
-  EXPECT_FALSE(std::filesystem::exists(photo + "/@eaDir/fileindex.queue"));
-  EXPECT_FALSE(std::filesystem::exists(photo + "/@eaDir/fileindex.queue.tmp"));
-  EXPECT_FALSE(std::filesystem::exists(photo + "/@eaDir/fileindex.db"));
-  EXPECT_TRUE(std::filesystem::exists(photo + "/@eaDir"));
-  EXPECT_EQ(StatusMgr().GetShareStatus("photo"), 0u);
-  EXPECT_EQ(StatusMgr().GetShareStatus("music"), 1u);
 }
 
 TEST(RelatedServicesTest, CleanShareIndexDataStopsAtTheFirstCompositionFailure) {

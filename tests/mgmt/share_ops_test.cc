@@ -17,7 +17,6 @@ using testing_support::JsonList;
 using testing_support::MgmtSandbox;
 using testing_support::ReadFile;
 using testing_support::ScopedTestPlatform;
-using testing_support::SystemSnapshot;
 using ::testing::ElementsAre;
 
 class ShareOpsTest : public testing_support::MgmtTest {
@@ -35,7 +34,7 @@ class ShareOpsTest : public testing_support::MgmtTest {
 
 TEST_F(ShareOpsTest, RenameMovesFoldersIndexMonitorAndStatus) {
   StatusMgr().SetShareStatus("photo", kShareStatusPaused);
-  const std::string old_queue_cfg = sandbox_.Snapshot().monitor.begin()->first;
+  const std::vector<std::string> old_monitor_files = sandbox_.MonitorFiles();
   const std::string pics = sandbox_.RenameShare("photo", "pics");
   ShareRename("photo", "pics");
 
@@ -48,7 +47,8 @@ TEST_F(ShareOpsTest, RenameMovesFoldersIndexMonitorAndStatus) {
   EXPECT_THAT(sandbox_.SavedPaths(), ElementsAre("/pics", "/pics/a"));
   EXPECT_NE(ReadFile(sandbox_.FoldersFile()).find(R"("path":"/pics/a","name":"a","document":true,"audio":false)"),
             std::string::npos);
-  EXPECT_EQ(sandbox_.Snapshot().monitor.count(old_queue_cfg), 0u);
+  EXPECT_NE(sandbox_.MonitorFiles(), old_monitor_files);
+  EXPECT_EQ(sandbox_.MonitorFiles().size(), 1u);
   const Json::Value cfg = sandbox_.MonitorCfg("pics");
   ASSERT_EQ(cfg["config"].size(), 2u);
   EXPECT_EQ(cfg["config"][1]["path"].asString(), pics + "/a");
@@ -93,8 +93,7 @@ TEST_F(ShareOpsTest, MigrateFollowsTheShareToItsNewVolume) {
   EXPECT_EQ(JsonToString(sandbox_.SearchRequests()[sandbox_.SearchRequests().size() - 3]["data"]["data"]),
             "{\"path\":\"" + moved + "/@eaDir/fileindex.db\"}");
   EXPECT_EQ(ReadFile(sandbox_.FoldersFile()), folders);
-  const SystemSnapshot snapshot = sandbox_.Snapshot();
-  EXPECT_EQ(snapshot.monitor.size(), 1u);  // the old place's configuration is gone
+  EXPECT_EQ(sandbox_.MonitorFiles().size(), 1u);  // the old place's configuration is gone
   EXPECT_EQ(sandbox_.MonitorCfg("photo")["config"][0]["path"].asString(), moved);
   ASSERT_EQ(NewDaemonCommands().size(), 1u);
   EXPECT_TRUE(NewDaemonCommands()[0]["data"]["is_upsert"].asBool());

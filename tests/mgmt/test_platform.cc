@@ -6,7 +6,6 @@ namespace corvlumex {
 namespace testing_support {
 
 using platform::kPlatformErrNoSpace;
-using platform::kPlatformErrService;
 
 #define FAIL_IF(flag, code)                     \
   do {                                          \
@@ -15,31 +14,6 @@ using platform::kPlatformErrService;
       return -1;                                \
     }                                           \
   } while (0)
-
-int TestPlatform::ServiceStart(const std::string& name, bool wait) {
-  FAIL_IF(fail_services, kPlatformErrService);
-  return LinuxPlatform::ServiceStart(name, wait);
-}
-
-int TestPlatform::ServiceStop(const std::string& name, bool wait) {
-  FAIL_IF(fail_services, kPlatformErrService);
-  return LinuxPlatform::ServiceStop(name, wait);
-}
-
-int TestPlatform::ServiceRestart(const std::string& name) {
-  FAIL_IF(fail_services, kPlatformErrService);
-  return LinuxPlatform::ServiceRestart(name);
-}
-
-int TestPlatform::ServicectlStart(const std::string& job, int type) {
-  FAIL_IF(fail_services, kPlatformErrService);
-  return LinuxPlatform::ServicectlStart(job, type);
-}
-
-int TestPlatform::ServicectlStop(const std::string& job, int type) {
-  FAIL_IF(fail_services, kPlatformErrService);
-  return LinuxPlatform::ServicectlStop(job, type);
-}
 
 int TestPlatform::SMBSetSpotlight(bool enable) {
   FAIL_IF(fail_spotlight_switch, platform::kPlatformErrConfig);

@@ -12,18 +12,12 @@ namespace testing_support {
 
 class TestPlatform : public platform::LinuxPlatform {
  public:
-  bool fail_services = false;        // service and job requests fail
   bool fail_spotlight_switch = false;
   bool fail_monitor = false;         // MonitorQueueUpsert / Delete refuse
   bool fail_db_compose = false;
   bool no_space = false;             // QuotaIsEnough reports a full volume
   bool recycle_follows_switch = false;  // "#recycle" is a bin only while the share's switch is on
 
-  int ServiceStart(const std::string& name, bool wait) override;
-  int ServiceStop(const std::string& name, bool wait) override;
-  int ServiceRestart(const std::string& name) override;
-  int ServicectlStart(const std::string& job, int type) override;
-  int ServicectlStop(const std::string& job, int type) override;
   int SMBSetSpotlight(bool enable) override;
   bool MonitorQueueUpsert(const Json::Value& queue, const std::string& app, int type) override;
   bool MonitorQueueDelete(const std::string& queue_path, const std::string& app, int type) override;

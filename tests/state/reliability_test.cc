@@ -8,6 +8,7 @@
 #include <chrono>
 #include <cstdlib>
 #include <map>
+#include <set>
 #include <thread>
 
 #include "common/json_util.h"
@@ -104,13 +105,11 @@ TEST_F(Reliability, EveryAppendedLineIsProcessedExactlyOnceAcrossTakeOvers) {
   EXPECT_EQ(failures, 0);
   EXPECT_GT(rounds, 1);
 
-  EXPECT_EQ(seen.size(), static_cast<size_t>(kWriters * kLinesEach));
-  for (const auto& [path, count] : seen) EXPECT_EQ(count, 1) << path;
+  std::map<std::string, int> once;
   for (int writer = 0; writer < kWriters; ++writer) {
-    for (int i = 0; i < kLinesEach; ++i) {
-      EXPECT_EQ(seen.count(share + "/w" + std::to_string(writer) + "/f" + std::to_string(i)), 1u);
-    }
+    for (int i = 0; i < kLinesEach; ++i) once[share + "/w" + std::to_string(writer) + "/f" + std::to_string(i)] = 1;
   }
+  EXPECT_EQ(seen, once);
 }
 
 TEST_F(Reliability, LockedFolderSavesLoseNothingAndNeverTearTheFile) {
@@ -141,13 +140,13 @@ TEST_F(Reliability, LockedFolderSavesLoseNothingAndNeverTearTheFile) {
   }
   EXPECT_EQ(failures, 0);
   EXPECT_EQ(torn, 0) << "of " << reads << " reads";
+  std::multiset<std::string> saved, expected;  // every folder once
   const FolderMgr final_state;
-  EXPECT_EQ(final_state.Folders().size(), static_cast<size_t>(kWriters * kFoldersEach));
+  for (const auto& folder : final_state.Folders()) saved.insert(folder->GetPath());
   for (int writer = 0; writer < kWriters; ++writer) {
-    for (int i = 0; i < kFoldersEach; ++i) {
-      EXPECT_TRUE(final_state.HasFolder("/s/w" + std::to_string(writer) + "_" + std::to_string(i)));
-    }
+    for (int i = 0; i < kFoldersEach; ++i) expected.insert("/s/w" + std::to_string(writer) + "_" + std::to_string(i));
   }
+  EXPECT_EQ(saved, expected);
 }
 
 }  // namespace
