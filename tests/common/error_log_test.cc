@@ -12,15 +12,10 @@ namespace {
 using testing_support::ErrorOf;
 using testing_support::LogCapture;
 
-TEST(ErrorTest, MessageWithoutReasonHasNoBrackets) {
+TEST(ErrorTest, ReasonIsCopiedUnchangedInsideBracketsAndOnlyWhenGiven) {
   EXPECT_STREQ(Error(kErrorSystem).what(), "CorvLumex error, code=502");
   EXPECT_TRUE(Error(kErrorSystem).reason.empty());
   EXPECT_STREQ(Error(kErrorUnexpected).what(), "CorvLumex error, code=9999");
-  EXPECT_STREQ(Error(kErrorNoSpace, "Share (s) space not enough").what(),
-               "CorvLumex error, code=1003, reason=[Share (s) space not enough]");
-}
-
-TEST(ErrorTest, ReasonIsCopiedUnchangedInsideBrackets) {
   const Error error(kErrorMalformedEvent, "Malformed event_raw: a]b");
   EXPECT_STREQ(error.what(), "CorvLumex error, code=906, reason=[Malformed event_raw: a]b]");
   const Error copy(error);

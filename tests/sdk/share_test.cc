@@ -22,8 +22,11 @@ class FailingSharePlatform : public LinuxPlatform {
   int hide_value = 1;
   int hide_result = 0;
   bool fail_alloc = false;
+  bool encrypted_answers = false;  // then the read-only check is the one that fails
 
-  int ShareIsEncryptedGet(const ShareInfo&, int*) override { return -1; }
+  int ShareIsEncryptedGet(const ShareInfo& share, int* value) override {
+    return encrypted_answers ? LinuxPlatform::ShareIsEncryptedGet(share, value) : -1;
+  }
   int ShareIsReadOnlyGet(const ShareInfo&, int*) override { return -1; }
   int ShareIsEncryptionGet(const ShareInfo&, int*) override { return -1; }
   int ShareRecycleStatusGet(const ShareInfo&, int*) override { return -1; }
@@ -124,6 +127,9 @@ TEST_F(SDKShareTest, FailedQueriesAre502WithTheirReasons) {
   const SDKShare share("photo");
   ExpectError([&] { share.CanBeIndexed(); }, kErrorSystem, "KLIBShareis_encryptedGet failed, share=photo",
               "0 > KLIBShareIsEncryptedGet(share_info_, &is_encrypted)");
+  failing->encrypted_answers = true;
+  ExpectError([&] { share.CanBeIndexed(); }, kErrorSystem, "KLIBShareis_readonlyGet failed, share=photo",
+              "0 > KLIBShareIsReadOnlyGet(share_info_, &is_readonly)");
   ExpectError([&] { share.IsEncryption(); }, kErrorSystem, "KLIBShareIsEncryptionGet failed, share=photo",
               "0 > KLIBShareIsEncryptionGet(share_info_, &is_encryption)");
   ExpectError([&] { share.IsEnableRecycleBin(); }, kErrorSystem, "KLIBShareRecycleStatusGet failed, share=photo",
@@ -146,17 +152,6 @@ TEST_F(SDKShareTest, FailedQueriesAre502WithTheirReasons) {
   failing->hide_value = 1;
   failing->hide_result = -1;
   EXPECT_FALSE(share.IsHideUnReadable());
-}
-
-TEST_F(SDKShareTest, ReadOnlyCheckFailureNamesItsOwnReason) {
-  sandbox_.AddShare("photo");
-  struct ReadOnlyFails : LinuxPlatform {
-    int ShareIsReadOnlyGet(const ShareInfo&, int*) override { return -1; }
-  };
-  ScopedPlatform installed(std::make_shared<ReadOnlyFails>());
-  const SDKShare share("photo");
-  ExpectError([&] { share.CanBeIndexed(); }, kErrorSystem, "KLIBShareis_readonlyGet failed, share=photo",
-              "0 > KLIBShareIsReadOnlyGet(share_info_, &is_readonly)");
 }
 
 TEST_F(SDKShareTest, OnlyADefiniteLackOfSpaceIsNotEnough) {
