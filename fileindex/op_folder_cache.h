@@ -5,9 +5,10 @@
 // stale; a slot is simply overwritten by the next folder hashed to it.
 #pragma once
 
-#include <string>
+#include <cstddef>
+#include <cstdint>
+#include <memory>
 #include <string_view>
-#include <vector>
 
 namespace corvlumex {
 namespace fileindex {
@@ -17,23 +18,29 @@ class OPNode;
 class FolderCache {
  public:
   FolderCache();
+  ~FolderCache();
   FolderCache(const FolderCache&) = delete;
   FolderCache& operator=(const FolderCache&) = delete;
-  // The node of `folder_path` when it is cached, else null.
-  OPNode* Find(std::string_view folder_path) const;
-  void Put(std::string_view folder_path, OPNode* node);
+  static size_t Hash(std::string_view folder_path);
+  // The node of `folder_path` (whose Hash() is `hash`) when cached, else null.
+  OPNode* Find(std::string_view folder_path, size_t hash) const;
+  void Put(std::string_view folder_path, size_t hash, OPNode* node);
   void Clear();
 
  private:
+  // The path is kept in the slot itself: a lookup that hits reads one
+  // place. Longer folder paths are simply not cached.
   struct Entry {
-    std::string path;
-    OPNode* node = nullptr;
+    size_t hash;
+    OPNode* node;
+    uint32_t length;
+    char path[236];
   };
   static constexpr size_t kFirstSlots = 64;
   static constexpr size_t kMaxSlots = 16384;
-  size_t Slot(std::string_view folder_path) const;
 
-  std::vector<Entry> entries_;  // a power of two in size once used
+  std::unique_ptr<Entry[]> entries_;
+  size_t slots_ = 0;  // a power of two once used
   size_t puts_ = 0;
 };
 

@@ -10,6 +10,28 @@ namespace fileindex {
 // The incoming handler, i.e. the column of the merge table.
 enum class OPTree::Column { kCreate, kModify, kAttr, kDelete, kUpdateCfg, kReindex };
 
+// The one OP an event hands to every handler that fires. Most events merge
+// into work already pending and their OP is dropped, so it is made for real
+// (in the tree's arena) only when a handler appends it; from then on every
+// handler works on that same shared OP.
+class OPTree::EventOP {
+ public:
+  // The OP of a queue line, not made yet.
+  EventOP() : scratch_(nullptr, kOPNone, std::string(), Json::Value()) {}
+  // An OP the caller made and hands to a handler.
+  explicit EventOP(std::shared_ptr<OP> made) : scratch_(nullptr, kOPNone, std::string(), Json::Value()), made_(std::move(made)) {}
+
+  OP& Get() { return made_ ? *made_ : scratch_; }
+  const std::shared_ptr<OP>& Made(OPTree& tree, OPNode* node) {
+    if (!made_) made_ = tree.MakeOP(node, scratch_.op_, scratch_.path_, scratch_.data_);
+    return made_;
+  }
+
+ private:
+  OP scratch_;
+  std::shared_ptr<OP> made_;
+};
+
 namespace {
 
 
@@ -84,7 +106,7 @@ void ForEachDescendantPostOrder(OPNode* node, Fn fn) {
 
 void OPTree::InsertEvent(std::shared_ptr<Event> event) {
   OPNode* node = Resolve(event->path);
-  const std::shared_ptr<OP> op = std::make_shared<OP>(node->shared_from_this(), kOPNone, std::string(), Json::Value());
+  EventOP op;
   // Every bit is tested on its own and the same OP goes to every handler
   // that fires. Directory creates and deletes become reindexes.
   const uint32_t mask = event->event;
@@ -93,40 +115,51 @@ void OPTree::InsertEvent(std::shared_ptr<Event> event) {
   if (mask & kEventModify) Fold(node, op, kOPUpsert, Column::kModify);
   if (mask & kEventDelete) event->is_dir ? Reindex(node, op) : Fold(node, op, kOPDelete, Column::kDelete);
   if (mask & kEventRename) {
-    op->path_ = event->path_old;
+    op.Get().path_ = event->path_old;
     Rename(node, op);
   }
   if (mask & kEventReindex) Reindex(node, op);
   if (mask & kEventUpdateCfg) {
-    op->data_ = event->data;
+    op.Get().data_ = event->data;
     Fold(node, op, kOPUpdateCfg, Column::kUpdateCfg);
   }
   if (mask & kEventQueueCrash) crashed_ = true;
 }
 
 void OPTree::HandleCreate(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  Fold(node.get(), op, kOPUpsert, Column::kCreate);
+  EventOP made(std::move(op));
+  Fold(node.get(), made, kOPUpsert, Column::kCreate);
 }
 
 void OPTree::HandleModify(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  Fold(node.get(), op, kOPUpsert, Column::kModify);
+  EventOP made(std::move(op));
+  Fold(node.get(), made, kOPUpsert, Column::kModify);
 }
 
 void OPTree::HandleAttr(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  Fold(node.get(), op, kOPAttr, Column::kAttr);
+  EventOP made(std::move(op));
+  Fold(node.get(), made, kOPAttr, Column::kAttr);
 }
 
 void OPTree::HandleDelete(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  Fold(node.get(), op, kOPDelete, Column::kDelete);
+  EventOP made(std::move(op));
+  Fold(node.get(), made, kOPDelete, Column::kDelete);
 }
 
 void OPTree::HandleUpdateCfg(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  Fold(node.get(), op, kOPUpdateCfg, Column::kUpdateCfg);
+  EventOP made(std::move(op));
+  Fold(node.get(), made, kOPUpdateCfg, Column::kUpdateCfg);
 }
 
-void OPTree::HandleReindex(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) { Reindex(node.get(), op); }
+void OPTree::HandleReindex(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  EventOP made(std::move(op));
+  Reindex(node.get(), made);
+}
 
-void OPTree::HandleRename(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) { Rename(node.get(), op); }
+void OPTree::HandleRename(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+  EventOP made(std::move(op));
+  Rename(node.get(), made);
+}
 
 void OPTree::Append(OPNode* node, const std::shared_ptr<OP>& op) {
   ops_.push_back(op);
@@ -144,13 +177,13 @@ void OPTree::MergeIntoNode(OPNode* node, OP& op, FileIndexOP kind, Column column
   }
 }
 
-void OPTree::Fold(OPNode* node, const std::shared_ptr<OP>& op, FileIndexOP kind, Column column) {
-  MergeIntoNode(node, *op, kind, column);
-  if (op->op_ != kOPNone) Append(node, op);
+void OPTree::Fold(OPNode* node, EventOP& op, FileIndexOP kind, Column column) {
+  MergeIntoNode(node, op.Get(), kind, column);
+  if (op.Get().op_ != kOPNone) Append(node, op.Made(*this, node));
 }
 
-void OPTree::Reindex(OPNode* node, const std::shared_ptr<OP>& op) {
-  MergeIntoNode(node, *op, kOPReindex, Column::kReindex);
+void OPTree::Reindex(OPNode* node, EventOP& op) {
+  MergeIntoNode(node, op.Get(), kOPReindex, Column::kReindex);
   // The reindex covers everything below, except renames: documents moved
   // into this directory from elsewhere still have to leave their old place.
   ForEachDescendantPostOrder(node, [](OPNode* descendant) {
@@ -158,7 +191,7 @@ void OPTree::Reindex(OPNode* node, const std::shared_ptr<OP>& op) {
       if (pending->op_ != kOPRename) pending->op_ = kOPNone;
     }
   });
-  if (op->op_ != kOPNone) Append(node, op);
+  if (op.Get().op_ != kOPNone) Append(node, op.Made(*this, node));
 }
 
 void OPTree::MoveOPs(OPNode* from, OPNode* to, FileIndexOP min_kind, FileIndexOP* extra) {
@@ -232,8 +265,8 @@ void OPTree::MoveDescendantOPs(OPNode* old_node, OPNode* new_node) {
   }
 }
 
-void OPTree::Rename(OPNode* node, const std::shared_ptr<OP>& op) {
-  const std::string old_path = op->path_;
+void OPTree::Rename(OPNode* node, EventOP& op) {
+  const std::string old_path = op.Get().path_;
   OPNode* old_node = Resolve(old_path);
   // No file system moves a folder into itself. Folding such a line would
   // copy the pending subtree into itself (and again for each such line), so
@@ -244,17 +277,15 @@ void OPTree::Rename(OPNode* node, const std::shared_ptr<OP>& op) {
     }
   }
   FileIndexOP extra = kOPNone;
-  op->op_ = kOPRename;
+  op.Get().op_ = kOPRename;
   // The rename overwrites whatever was pending at the destination.
   for (const std::shared_ptr<OP>& pending : node->ops_) {
     if (pending->op_ == kOPDelete || pending->op_ == kOPUpsert || pending->op_ == kOPAttr) pending->op_ = kOPNone;
   }
   MoveOPs(old_node, node, kOPDelete, &extra);
   MoveDescendantOPs(old_node, node);
-  Append(node, op);
-  if (extra != kOPNone) {
-    Append(node, std::make_shared<OP>(node->shared_from_this(), extra, std::string(), Json::Value()));
-  }
+  Append(node, op.Made(*this, node));
+  if (extra != kOPNone) Append(node, MakeOP(node, extra, std::string(), Json::Value()));
 }
 
 }  // namespace fileindex

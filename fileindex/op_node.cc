@@ -1,5 +1,6 @@
 // OP and OPNode: the records of the operation tree, child lookup, paths
 // and the printed forms used for debug output.
+#include <cstring>
 #include <iomanip>
 #include <ostream>
 
@@ -27,13 +28,31 @@ void OP::MergeData(const Json::Value& data) {
   }
 }
 
-OPNode::OPNode(std::shared_ptr<OPNode> parent, const std::string& name)
-    : name_(name), parent_(std::move(parent)) {}
+namespace {
 
-OPNode::OPNode(FromView, std::shared_ptr<OPNode> parent, std::string_view name)
-    : name_(name), parent_(std::move(parent)) {}
+std::string_view OwnedCopy(const std::string& name) {
+  if (name.empty()) return std::string_view();
+  char* copy = new char[name.size()];
+  memcpy(copy, name.data(), name.size());
+  return std::string_view(copy, name.size());
+}
+
+}  // namespace
+
+OPNode::OPNode(std::shared_ptr<OPNode> parent, const std::string& name)
+    : name_(OwnedCopy(name)), parent_(std::move(parent)), owns_name_(true) {}
+
+OPNode::OPNode(ArenaKey, std::shared_ptr<OPNode> parent, std::string_view stored_name)
+    : name_(stored_name), parent_(std::move(parent)), owns_name_(false) {}
+
+std::shared_ptr<OPNode> OPNode::MakeInArena(OPArena* arena, std::shared_ptr<OPNode> parent, std::string_view name) {
+  // The name goes right before the node: comparing it reads memory next to the node.
+  const std::string_view stored = arena->CopyName(name);
+  return fileindex::MakeInArena<OPNode>(arena, ArenaKey(), std::move(parent), stored);
+}
 
 OPNode::~OPNode() {
+  if (owns_name_) delete[] name_.data();
   // Release the ancestors this node was the last owner of one by one, so a
   // path thousands of components deep cannot exhaust the stack.
   std::shared_ptr<OPNode> ancestor = std::move(parent_);
@@ -51,7 +70,7 @@ std::string OPNode::GetPath() const {
   size_t end = length;
   for (const OPNode* node = this; node->parent_; node = node->parent_.get()) {
     end -= node->name_.size();
-    path.replace(end, node->name_.size(), node->name_);
+    path.replace(end, node->name_.size(), node->name_.data(), node->name_.size());
     path[--end] = '/';
   }
   return path;
@@ -65,7 +84,8 @@ OPNode* OPNode::ChildNode(std::string_view name) {
       if (child->name_ == name) return child.get();
     }
   }
-  children_.push_back(std::make_shared<OPNode>(FromView(), shared_from_this(), name));
+  children_.push_back(owns_name_ ? std::make_shared<OPNode>(shared_from_this(), std::string(name))
+                                 : MakeInArena(OPArena::Of(this), shared_from_this(), name));
   index_.Added(children_);
   return children_.back().get();
 }

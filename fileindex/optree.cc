@@ -16,8 +16,8 @@
 namespace corvlumex {
 namespace fileindex {
 
-OPTree::OPTree(const std::string& queue_path)
-    : queue_path_(queue_path), root_(std::make_shared<OPNode>(nullptr, "")) {
+OPTree::OPTree(const std::string& queue_path) : queue_path_(queue_path), arena_(OPArena::Open()) {
+  root_ = OPNode::MakeInArena(arena_.get(), nullptr, "");
   try {
     BuildTree();
   } catch (...) {
@@ -59,14 +59,21 @@ OPNode* OPTree::Resolve(std::string_view path) {
   // trailing "/". Walking the components (below) and comparing the node's
   // path with `path` at each step answers exactly for this form, so the form
   // is checked once instead of rebuilding the node's path at every step.
-  const bool canonical = !path.empty() && path.front() == '/' && path.back() != '/' &&
-                         memmem(path.data(), path.size(), "//", 2) == nullptr;
-  const size_t last_slash =
-      canonical ? static_cast<size_t>(static_cast<const char*>(memrchr(path.data(), '/', path.size())) - path.data())
-                : 0;
+  bool canonical = !path.empty() && path.front() == '/' && path.back() != '/';
+  size_t last_slash = 0;
+  for (const char* slash = path.data(); canonical;) {
+    last_slash = static_cast<size_t>(slash - path.data());
+    if (slash[1] == '/') canonical = false;  // never past the end: the path does not end in "/"
+    slash = static_cast<const char*>(memchr(slash + 1, '/', path.size() - last_slash - 1));
+    if (slash == nullptr) break;
+  }
+  size_t folder_hash = 0;
   if (canonical) {
-    OPNode* folder = last_slash == 0 ? root_.get() : folders_.Find(path.substr(0, last_slash));
-    if (folder != nullptr) return folder->ChildNode(path.substr(last_slash + 1));
+    if (last_slash == 0) return root_->ChildNode(path.substr(1));
+    folder_hash = FolderCache::Hash(path.substr(0, last_slash));
+    if (OPNode* folder = folders_.Find(path.substr(0, last_slash), folder_hash)) {
+      return folder->ChildNode(path.substr(last_slash + 1));
+    }
   }
   // Every non-empty component is walked and created when absent, also for
   // a path that is then rejected: the nodes made on the way remain.
@@ -79,8 +86,13 @@ OPNode* OPTree::Resolve(std::string_view path) {
     start = end + 1;
   }
   if (!canonical) throw Error(kErrorUnexpected, "GetNodeByPath failed, path=" + std::string(path));
-  if (last_slash > 0) folders_.Put(path.substr(0, last_slash), node->parent_.get());
+  folders_.Put(path.substr(0, last_slash), folder_hash, node->parent_.get());
   return node;
+}
+
+std::shared_ptr<OP> OPTree::MakeOP(OPNode* node, FileIndexOP kind, const std::string& path,
+                                   const Json::Value& data) {
+  return MakeInArena<OP>(arena_.get(), node->shared_from_this(), kind, path, data);
 }
 
 unsigned OPTree::ProcessOP(std::function<void(std::shared_ptr<OP>)> fn) {

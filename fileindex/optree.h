@@ -7,6 +7,8 @@
 // ancestors alive and GetPath() keeps working after the tree is gone. The
 // tree breaks the node-to-child and node-to-OP links when it is released,
 // so nothing else outlives it.
+//
+// A tree's nodes, OPs and names live in the tree's OPArena (op_arena.h).
 #pragma once
 
 #include <json/json.h>
@@ -20,6 +22,7 @@
 #include <vector>
 
 #include "fileindex/event.h"
+#include "fileindex/op_arena.h"
 #include "fileindex/op_child_index.h"
 #include "fileindex/op_folder_cache.h"
 
@@ -63,9 +66,14 @@ class OP {
 class OPNode : public std::enable_shared_from_this<OPNode> {
  public:
   OPNode(std::shared_ptr<OPNode> parent, const std::string& name);
-  // Same, for the tree's own use: builds the name in place from a piece of a path.
-  struct FromView {};
-  OPNode(FromView, std::shared_ptr<OPNode> parent, std::string_view name);
+  // A node made in an arena, whose name the arena stores; only the tree and
+  // its nodes can make the key.
+  class ArenaKey {
+    friend class OPNode;
+    friend class OPTree;
+    ArenaKey() = default;
+  };
+  OPNode(ArenaKey, std::shared_ptr<OPNode> parent, std::string_view stored_name);
   ~OPNode();
   OPNode(const OPNode&) = delete;
   OPNode& operator=(const OPNode&) = delete;
@@ -84,17 +92,22 @@ class OPNode : public std::enable_shared_from_this<OPNode> {
   // Children in order of creation. They only ever grow through GetChild.
   const std::vector<std::shared_ptr<OPNode>>& Children() const { return children_; }
 
-  const std::string name_;                // one path component; empty for the root
+  const std::string_view name_;           // one path component; empty for the root
   std::shared_ptr<OPNode> parent_;        // empty for the root
   std::vector<std::shared_ptr<OP>> ops_;  // in order of attachment, cancelled ones included
 
  private:
   friend class OPTree;
+  static std::shared_ptr<OPNode> MakeInArena(OPArena* arena, std::shared_ptr<OPNode> parent, std::string_view name);
   // GetChild without taking shared ownership.
   OPNode* ChildNode(std::string_view name);
 
   std::vector<std::shared_ptr<OPNode>> children_;
   ChildIndex index_;  // name -> child, once there are a few children
+  // Nodes made by a tree are in its arena, and so are their children and
+  // names; a node made on its own owns its name and makes its children on
+  // the heap.
+  const bool owns_name_;
 };
 
 class OPTree {
@@ -140,14 +153,20 @@ class OPTree {
 
  private:
   enum class Column;
+  class EventOP;
+  struct ArenaCloser {
+    void operator()(OPArena* arena) const { arena->Close(); }
+  };
   // GetNodeByPath without taking shared ownership.
   OPNode* Resolve(std::string_view path);
   // The handlers' work on raw nodes; the public handlers forward here.
-  void Fold(OPNode* node, const std::shared_ptr<OP>& op, FileIndexOP kind, Column column);
-  void Reindex(OPNode* node, const std::shared_ptr<OP>& op);
-  void Rename(OPNode* node, const std::shared_ptr<OP>& op);
+  void Fold(OPNode* node, EventOP& op, FileIndexOP kind, Column column);
+  void Reindex(OPNode* node, EventOP& op);
+  void Rename(OPNode* node, EventOP& op);
   static void MergeIntoNode(OPNode* node, OP& op, FileIndexOP kind, Column column);
   void Append(OPNode* node, const std::shared_ptr<OP>& op);
+  // A new OP on `node`, in the tree's arena.
+  std::shared_ptr<OP> MakeOP(OPNode* node, FileIndexOP kind, const std::string& path, const Json::Value& data);
   static void MoveOPs(OPNode* from, OPNode* to, FileIndexOP min_kind, FileIndexOP* extra);
   static void MoveDescendantOPs(OPNode* old_node, OPNode* new_node);
   void ReleaseCycles();
@@ -157,6 +176,7 @@ class OPTree {
   std::shared_ptr<OPNode> root_;
   std::vector<std::shared_ptr<OP>> ops_;
   FolderCache folders_;  // recently resolved folders, to skip walking from the root
+  std::unique_ptr<OPArena, ArenaCloser> arena_;
 };
 
 // "[05] /old -> /new"; the stream's fill character stays '0' afterwards.
