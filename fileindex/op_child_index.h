@@ -25,7 +25,6 @@ class ChildIndex {
   OPNode* Find(std::string_view name, size_t child_count) const;
   // Records children.back(), just appended.
   void Added(const std::vector<std::shared_ptr<OPNode>>& children);
-  void Reset() { slots_.reset(); }
 
  private:
   // A power of two at least twice the number of children: probes stay short.

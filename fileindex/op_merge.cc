@@ -199,7 +199,7 @@ void OPTree::MoveOPs(OPNode* from, OPNode* to, FileIndexOP min_kind, FileIndexOP
   // to->ops_ and erase its first entry in from->ops_. The erasures are
   // counted on the OPs and done in one pass, so moving n OPs costs O(n)
   // even when from and to are the same node.
-  std::vector<std::shared_ptr<OP>>& source = from->ops_;
+  SmallList<std::shared_ptr<OP>>& source = from->ops_;
   const size_t count = source.size();
   std::shared_ptr<OPNode> owner;
   for (size_t i = 0; i < count; ++i) {
@@ -246,12 +246,12 @@ void OPTree::MoveDescendantOPs(OPNode* old_node, OPNode* new_node) {
     OPNode* target;
   };
   std::vector<Frame> stack;
-  stack.push_back({old_node, 0, old_node->children_.size(), new_node});
+  stack.push_back({old_node, 0, old_node->ChildCount(), new_node});
   while (!stack.empty()) {
     Frame& top = stack.back();
     if (top.next < top.end) {
-      OPNode* child = top.node->children_[top.next++].get();
-      stack.push_back({child, 0, child->children_.size(), nullptr});
+      OPNode* child = top.node->ChildAt(top.next++);
+      stack.push_back({child, 0, child->ChildCount(), nullptr});
       continue;
     }
     if (stack.size() == 1) break;  // the old node itself is the caller's

@@ -76,18 +76,26 @@ std::string OPNode::GetPath() const {
   return path;
 }
 
+const std::vector<std::shared_ptr<OPNode>>& OPNode::Children() const {
+  static const std::vector<std::shared_ptr<OPNode>> kNone;
+  return children_ ? children_->list : kNone;
+}
+
 OPNode* OPNode::ChildNode(std::string_view name) {
-  if (children_.size() >= ChildIndex::kMinChildren) {
-    if (OPNode* child = index_.Find(name, children_.size())) return child;
+  const size_t count = ChildCount();
+  if (count >= ChildIndex::kMinChildren) {
+    if (OPNode* child = children_->index.Find(name, count)) return child;
   } else {
-    for (const std::shared_ptr<OPNode>& child : children_) {
-      if (child->name_ == name) return child.get();
+    for (size_t i = 0; i < count; ++i) {
+      if (ChildAt(i)->name_ == name) return ChildAt(i);
     }
   }
-  children_.push_back(owns_name_ ? std::make_shared<OPNode>(shared_from_this(), std::string(name))
-                                 : MakeInArena(OPArena::Of(this), shared_from_this(), name));
-  index_.Added(children_);
-  return children_.back().get();
+  std::shared_ptr<OPNode> child = owns_name_ ? std::make_shared<OPNode>(shared_from_this(), std::string(name))
+                                             : MakeInArena(OPArena::Of(this), shared_from_this(), name);
+  if (!children_) children_.reset(new ChildTable());
+  children_->list.push_back(std::move(child));
+  children_->index.Added(children_->list);
+  return children_->list.back().get();
 }
 
 std::shared_ptr<OPNode> OPNode::GetChild(const std::string& name) {
@@ -97,7 +105,7 @@ std::shared_ptr<OPNode> OPNode::GetChild(const std::string& name) {
 }
 
 void OPNode::TraverseOP(std::function<void(std::shared_ptr<OP>)> fn) {
-  const std::vector<std::shared_ptr<OP>> snapshot = ops_;
+  const std::vector<std::shared_ptr<OP>> snapshot(ops_.begin(), ops_.end());
   for (const std::shared_ptr<OP>& op : snapshot) {
     if (op->op_ != kOPNone) fn(op);
   }

@@ -120,12 +120,12 @@ void OPTree::TraverseNodeDescendant(std::shared_ptr<OPNode> node, std::function<
   };
   std::vector<Frame> stack;
   stack.push_back({std::move(node), 0, 0});
-  stack.back().end = stack.back().node->children_.size();
+  stack.back().end = stack.back().node->ChildCount();
   while (!stack.empty()) {
     Frame& top = stack.back();
     if (top.next < top.end) {
-      std::shared_ptr<OPNode> child = top.node->children_[top.next++];
-      const size_t end = child->children_.size();
+      std::shared_ptr<OPNode> child = top.node->children_->list[top.next++];
+      const size_t end = child->ChildCount();
       stack.push_back({std::move(child), 0, end});
       continue;
     }
@@ -146,9 +146,9 @@ void OPTree::ReleaseCycles() {
     std::shared_ptr<OPNode> node = std::move(pending.back());
     pending.pop_back();
     node->ops_.clear();
-    node->index_.Reset();
-    for (std::shared_ptr<OPNode>& child : node->children_) pending.push_back(std::move(child));
-    node->children_.clear();
+    if (!node->children_) continue;
+    for (std::shared_ptr<OPNode>& child : node->children_->list) pending.push_back(std::move(child));
+    node->children_.reset();
   }
   folders_.Clear();
   ops_.clear();

@@ -25,6 +25,7 @@
 #include "fileindex/op_arena.h"
 #include "fileindex/op_child_index.h"
 #include "fileindex/op_folder_cache.h"
+#include "fileindex/op_small_list.h"
 
 namespace corvlumex {
 namespace fileindex {
@@ -55,12 +56,16 @@ class OP {
 
   std::shared_ptr<OPNode> node_;  // the path the operation applies to
   FileIndexOP op_;                // changed in place by merging
-  std::string path_;              // old full path of a rename, else empty
-  Json::Value data_;              // settings of kOPUpdateCfg, else null
 
  private:
   friend class OPTree;
-  uint32_t pending_removals_ = 0;  // scratch count used while a rename moves OPs
+  // Scratch count used while a rename moves OPs; declared here, where it
+  // fills the space after op_ instead of adding to the OP's size.
+  uint32_t pending_removals_ = 0;
+
+ public:
+  std::string path_;  // old full path of a rename, else empty
+  Json::Value data_;  // settings of kOPUpdateCfg, else null
 };
 
 class OPNode : public std::enable_shared_from_this<OPNode> {
@@ -90,11 +95,11 @@ class OPNode : public std::enable_shared_from_this<OPNode> {
   void TraverseOP(std::function<void(std::shared_ptr<OP>)> fn);
 
   // Children in order of creation. They only ever grow through GetChild.
-  const std::vector<std::shared_ptr<OPNode>>& Children() const { return children_; }
+  const std::vector<std::shared_ptr<OPNode>>& Children() const;
 
   const std::string_view name_;           // one path component; empty for the root
   std::shared_ptr<OPNode> parent_;        // empty for the root
-  std::vector<std::shared_ptr<OP>> ops_;  // in order of attachment, cancelled ones included
+  SmallList<std::shared_ptr<OP>> ops_;  // in order of attachment, cancelled ones included
 
  private:
   friend class OPTree;
@@ -102,8 +107,16 @@ class OPNode : public std::enable_shared_from_this<OPNode> {
   // GetChild without taking shared ownership.
   OPNode* ChildNode(std::string_view name);
 
-  std::vector<std::shared_ptr<OPNode>> children_;
-  ChildIndex index_;  // name -> child, once there are a few children
+  size_t ChildCount() const { return children_ ? children_->list.size() : 0; }
+  OPNode* ChildAt(size_t i) const { return children_->list[i].get(); }
+
+  // Most nodes are files without children: a folder's children and their
+  // index sit apart, made with the first child.
+  struct ChildTable {
+    std::vector<std::shared_ptr<OPNode>> list;
+    ChildIndex index;  // name -> child, once there are a few children
+  };
+  std::unique_ptr<ChildTable> children_;
   // Nodes made by a tree are in its arena, and so are their children and
   // names; a node made on its own owns its name and makes its children on
   // the heap.

@@ -2,6 +2,9 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <thread>
+#include <vector>
+
 #include "common/log.h"
 #include "tests/optree/queue_fixture.h"
 
@@ -64,6 +67,43 @@ TEST_F(LifetimeTest, VeryDeepPathsBuildAndReleaseWithoutRecursion) {
   tree.reset();
   EXPECT_EQ(held->node_->GetPath().size(), deep.size());
   held.reset();  // the last owner of a 100,000-node chain
+}
+
+TEST_F(LifetimeTest, OPsHeldPastTheTreeStayWholeAndMayBeLetGoOnAnyThread) {
+  // Enough lines for the tree's memory to span several blocks.
+  std::vector<std::string> lines;
+  for (int i = 0; i < 40000; ++i) lines.push_back(Line(kEventCreate, "/v/s/d" + std::to_string(i % 97) + "/f" + std::to_string(i)));
+  auto tree = Build(lines);
+  std::vector<std::shared_ptr<OP>> held;
+  tree->ProcessOP([&](std::shared_ptr<OP> op) { held.push_back(op); });
+  tree.reset();
+  ASSERT_EQ(held.size(), lines.size());
+  EXPECT_EQ(Print(held.front()), "[02] /v/s/d0/f0");
+  EXPECT_EQ(Print(held.back()), "[02] /v/s/d" + std::to_string(39999 % 97) + "/f39999");
+  std::vector<std::thread> threads;
+  for (int t = 0; t < 4; ++t) {
+    threads.emplace_back([&held, t] {
+      for (size_t i = t; i < held.size(); i += 4) held[i].reset();
+    });
+  }
+  for (std::thread& thread : threads) thread.join();
+}
+
+TEST_F(LifetimeTest, NamesOfAnyLengthAndNodesMadeOutsideATree) {
+  const std::string long_name(5000, 'n');
+  auto tree = Build({Line(kEventCreate, "/v/" + long_name + "/x")});
+  EXPECT_EQ(tree->Ops().front()->node_->GetPath(), "/v/" + long_name + "/x");
+  // A child asked of a tree's node directly is the one paths resolve to.
+  auto made = tree->GetNodeByPath("/v")->GetChild("fresh");
+  EXPECT_EQ(tree->GetNodeByPath("/v/fresh"), made);
+  tree.reset();
+  EXPECT_EQ(made->GetPath(), "/v/fresh");
+
+  // A node made on its own keeps its own name and children.
+  auto loose = std::make_shared<OPNode>(nullptr, "");
+  auto child = loose->GetChild("a name longer than any short string");
+  EXPECT_EQ(child->GetChild("b"), child->GetChild("b"));
+  EXPECT_EQ(child->GetChild("b")->GetPath(), "/a name longer than any short string/b");
 }
 
 TEST_F(LifetimeTest, FailedConstructionLeavesNothingBehind) {
