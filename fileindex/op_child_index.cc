@@ -18,7 +18,7 @@ uint8_t Tag(size_t hash) { return static_cast<uint8_t>(hash >> 56); }
 
 size_t ChildIndex::Capacity(size_t child_count) {
   size_t capacity = 8;
-  while (capacity < child_count * 2) capacity *= 2;
+  while (capacity < child_count + child_count / 2) capacity *= 2;
   return capacity;
 }
 

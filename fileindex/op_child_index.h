@@ -27,7 +27,8 @@ class ChildIndex {
   void Added(const std::vector<std::shared_ptr<OPNode>>& children);
 
  private:
-  // A power of two at least twice the number of children: probes stay short.
+  // A power of two at least 1.5 times the number of children: probes stay
+  // short (a free slot ends every miss) and the table small.
   static size_t Capacity(size_t child_count);
   void Place(OPNode* child, size_t capacity);
 
