@@ -80,7 +80,8 @@ TEST(LockFileTest, OpenFailureIsLoggedAndThrown) {
   EXPECT_NE(lines[0].find(" [err: No such file or directory]"), std::string::npos);
 }
 
-// Two processes: the second waits (really sleeping) until the first lets go.
+// Two processes: the second waits (really sleeping, the back-off scaled down
+// tenfold) until the first lets go.
 TEST(LockFileTest, SecondProcessGetsTheLockOnceTheFirstReleasesIt) {
   SandboxRoot root(false);
   const std::string path = root.path() + "/cfg.lock";
@@ -92,15 +93,17 @@ TEST(LockFileTest, SecondProcessGetsTheLockOnceTheFirstReleasesIt) {
   if (holder == 0) {
     LockFile lock(path, true);
     if (write(ready[1], "x", 1) != 1) _exit(2);
-    std::this_thread::sleep_for(std::chrono::milliseconds(300));
+    std::this_thread::sleep_for(std::chrono::milliseconds(100));
     FILE* file = fopen(marker.c_str(), "w");
     if (file) fclose(file);
     _exit(0);
   }
   char byte;
   ASSERT_EQ(read(ready[0], &byte, 1), 1);
+  SetSleepHook([](std::chrono::microseconds duration) { std::this_thread::sleep_for(duration / 10); });
   {
     LockFile lock(path, true);
+    SetSleepHook(nullptr);
     // The holder wrote the marker before releasing: we cannot be earlier.
     EXPECT_EQ(access(marker.c_str(), F_OK), 0);
   }

@@ -7,19 +7,10 @@
 #include "fileindex/index_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "tests/mgmt/mgmt_test_base.h"
-#include "tests/mgmt/test_platform.h"
 
 namespace corvlumex {
 namespace fileindex {
 namespace {
-
-using testing_support::ErrorOf;
-using testing_support::FolderJson;
-using testing_support::JsonList;
-using testing_support::LogCapture;
-using testing_support::MgmtSandbox;
-using testing_support::ScopedTestPlatform;
-using ::testing::ElementsAre;
 
 class FolderDeleteTest : public testing_support::MgmtTest {
  protected:

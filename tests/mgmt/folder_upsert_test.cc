@@ -3,21 +3,12 @@
 #include "common/json_util.h"
 #include "fileindex/index_mgr.h"
 #include "tests/mgmt/mgmt_test_base.h"
-#include "tests/mgmt/test_platform.h"
 
 namespace corvlumex {
 namespace fileindex {
 namespace {
 
-using testing_support::ErrorOf;
-using testing_support::FolderJson;
-using testing_support::JsonList;
-using testing_support::LogCapture;
-using testing_support::MgmtSandbox;
-using testing_support::ReadFile;
-using testing_support::ScopedTestPlatform;
 using testing_support::ShareFlags;
-using ::testing::ElementsAre;
 
 std::string Kinds(const Json::Value& data) {
   std::string text;

@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "tests/mgmt/mgmt_sandbox.h"
+#include "tests/mgmt/test_platform.h"
 
 namespace corvlumex {
 namespace testing_support {
@@ -42,4 +43,15 @@ class MgmtTest : public ::testing::Test {
 };
 
 }  // namespace testing_support
+}  // namespace corvlumex
+
+namespace corvlumex {
+namespace fileindex {
+// The management helpers, by their short names (the state ones come with state_sandbox.h).
+using testing_support::FolderJson;
+using testing_support::JsonList;
+using testing_support::MgmtSandbox;
+using testing_support::ScopedTestPlatform;
+using ::testing::ElementsAre;
+}  // namespace fileindex
 }  // namespace corvlumex

@@ -13,13 +13,7 @@ namespace corvlumex {
 namespace fileindex {
 namespace {
 
-using testing_support::FolderJson;
-using testing_support::JsonList;
-using testing_support::LogCapture;
-using testing_support::MgmtSandbox;
-using testing_support::ReadFile;
 using testing_support::SystemSnapshot;
-using ::testing::ElementsAre;
 
 class PauseHomeTest : public testing_support::MgmtTest {
  protected:

@@ -6,18 +6,10 @@
 #include "fileindex/index_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "tests/mgmt/mgmt_test_base.h"
-#include "tests/mgmt/test_platform.h"
 
 namespace corvlumex {
 namespace fileindex {
 namespace {
-
-using testing_support::FolderJson;
-using testing_support::JsonList;
-using testing_support::MgmtSandbox;
-using testing_support::ReadFile;
-using testing_support::ScopedTestPlatform;
-using ::testing::ElementsAre;
 
 class ShareOpsTest : public testing_support::MgmtTest {
  protected:

@@ -21,11 +21,6 @@ namespace corvlumex {
 namespace fileindex {
 namespace {
 
-using testing_support::ErrorOf;
-using testing_support::LogCapture;
-using testing_support::SleepRecorder;
-using testing_support::StateSandbox;
-
 std::vector<std::string> Lines(const std::string& path) {
   std::vector<std::string> lines;
   std::ifstream input(path);

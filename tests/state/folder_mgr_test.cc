@@ -11,13 +11,6 @@ namespace corvlumex {
 namespace fileindex {
 namespace {
 
-using testing_support::ErrorOf;
-using testing_support::ExpectError;
-using testing_support::LogCapture;
-using testing_support::ReadFile;
-using testing_support::SleepRecorder;
-using testing_support::StateSandbox;
-
 std::shared_ptr<Folder> MakeFolder(const std::string& path, bool document = true, bool audio = true,
                                    bool video = true, bool photo = true, const std::string& name = "n") {
   return std::make_shared<Folder>(path, name, document, audio, video, photo, false, false);
@@ -70,7 +63,7 @@ TEST_F(FolderMgrTest, BadFilesAreRefused) {
            {"[{\"path\":", "IsFileExist(kFileIndexFoldersCfgPath) && !folders.fromFile(kFileIndexFoldersCfgPath)"},
            {"{\"path\":\"/s/a\"}", "!folders.isNull() && !folders.isArray()"}}) {
     WriteFolders(text);
-    ExpectError([] { FolderMgr(); }, kErrorLoadJson, "Cannot load json: " + FoldersPath(), condition);
+    ExpectError([] { FolderMgr(); }, kErrorLoadJson, "Cannot load json: " + FoldersPath(), condition, "FolderMgr");
   }
   WriteFolders("[{\"path\":\"/s/a\",\"name\":\"n\"}]");
   LogCapture log;
@@ -169,7 +162,7 @@ TEST_F(FolderMgrTest, TheThousandAndFirstFolderIsRefused) {
   EXPECT_EQ(mgr.Folders().size(), 1000u);
   mgr.Upsert(old, MakeFolder("/s/f0"));  // a replacement does not grow the list
   ExpectError([&] { mgr.Upsert(old, MakeFolder("/s/f1000")); }, kErrorTooManyFolders, "",
-              "folders_.size() > kFileIndexFoldersMax");
+              "folders_.size() > kFileIndexFoldersMax", "Upsert");
 }
 
 TEST_F(FolderMgrTest, GetAndDeleteFindExactPaths) {
@@ -177,7 +170,8 @@ TEST_F(FolderMgrTest, GetAndDeleteFindExactPaths) {
   std::shared_ptr<Folder> found;
   mgr.Get(found, "/s/b");
   EXPECT_EQ(found->GetPath(), "/s/b");
-  ExpectError([&] { mgr.Get(found, "/s/c"); }, kErrorFolderNotFound, "Folder not found: /s/c", "it == folders_.end()");
+  ExpectError([&] { mgr.Get(found, "/s/c"); }, kErrorFolderNotFound, "Folder not found: /s/c", "it == folders_.end()",
+              "Get");
   std::shared_ptr<Folder> removed;
   mgr.Delete(removed, "/s/a");
   EXPECT_EQ(removed->GetPath(), "/s/a");

@@ -13,11 +13,6 @@ namespace corvlumex {
 namespace fileindex {
 namespace {
 
-using testing_support::ErrorOf;
-using testing_support::ExpectError;
-using testing_support::SleepRecorder;
-using testing_support::StateSandbox;
-
 Json::Value Parse(const std::string& text) {
   Json::Value value;
   EXPECT_TRUE(JsonFromString(value, text)) << text;
@@ -89,7 +84,7 @@ TEST(FolderRecord, SetShareReplacesThePathAndSetsTheCacheWithoutThePlatform) {
 TEST(FolderRecord, AdditionalMustBeAnArrayOfKnownNames) {
   const Folder folder("/s/d", "n", true, true, true, true, false, false);
   ExpectError([&] { folder.GetDataWithAdditional(Json::Value()); }, kErrorBadArgument, "null",
-              "!addiitionals.isArray()");
+              "!addiitionals.isArray()", "GetDataWithAdditional");
   ExpectError([&] { folder.GetDataWithAdditional(Parse("[1]")); }, kErrorBadArgument, "1", "!it.isString()");
   // An empty object is not an empty list.
   EXPECT_EQ(ErrorOf([&] { folder.GetDataWithAdditional(Parse("{}")); }).code, kErrorBadArgument);

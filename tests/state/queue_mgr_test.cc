@@ -17,11 +17,6 @@ namespace corvlumex {
 namespace fileindex {
 namespace {
 
-using testing_support::ErrorOf;
-using testing_support::LogCapture;
-using testing_support::SleepRecorder;
-using testing_support::StateSandbox;
-
 std::string Line(unsigned event, const std::string& path, const std::string& path_old = "", bool is_dir = false) {
   Json::Value line(Json::objectValue);
   line["event"] = event;

@@ -26,8 +26,6 @@ namespace corvlumex {
 namespace fileindex {
 namespace {
 
-using testing_support::StateSandbox;
-
 // Lock back-off stays randomised but is scaled down tenfold: real
 // contention, short waits.
 void UseShortSleeps() {

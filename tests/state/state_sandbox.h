@@ -67,3 +67,15 @@ class StateSandbox {
 
 }  // namespace testing_support
 }  // namespace corvlumex
+
+namespace corvlumex {
+namespace fileindex {
+// The helpers the library's tests use, by their short names.
+using testing_support::ErrorOf;
+using testing_support::ExpectError;
+using testing_support::LogCapture;
+using testing_support::ReadFile;
+using testing_support::SleepRecorder;
+using testing_support::StateSandbox;
+}  // namespace fileindex
+}  // namespace corvlumex

@@ -21,12 +21,6 @@ namespace corvlumex {
 namespace fileindex {
 namespace {
 
-using testing_support::ErrorOf;
-using testing_support::ExpectError;
-using testing_support::ReadFile;
-using testing_support::SleepRecorder;
-using testing_support::StateSandbox;
-
 class StatusMgrTest : public ::testing::Test {
  protected:
   std::string StatusPath() const { return sandbox_.EtcFile("fileindex.status"); }
@@ -125,7 +119,7 @@ TEST_F(StatusMgrTest, UnreadableFileIs504WithTheConditionLogged) {
            {"{\"resume_time\": ", unparsed}, {"[1, 2]", not_object}, {"7", not_object}}) {
     SCOPED_TRACE(content);
     WriteStatus(content);
-    ExpectError([] { StatusMgr(); }, kErrorLoadJson, "Cannot load json: " + StatusPath(), condition);
+    ExpectError([] { StatusMgr(); }, kErrorLoadJson, "Cannot load json: " + StatusPath(), condition, "StatusMgr");
   }
 }
 

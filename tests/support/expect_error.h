@@ -29,17 +29,20 @@ Error ErrorOf(Fn fn) {
 }
 
 // `fn` throws `code` with exactly `reason`; unless `condition` is empty, one
-// log line shows "Failed [<condition>], reason: <reason>". Captures the log
-// itself: do not call it while another LogCapture is alive.
+// log line shows "(<function>) Failed [<condition>], reason: <reason>" (the
+// function part only when given). Captures the log itself: do not call it
+// while another LogCapture is alive.
 template <typename Fn>
-void ExpectError(Fn fn, ErrorCode code, const std::string& reason, const std::string& condition = "") {
+void ExpectError(Fn fn, ErrorCode code, const std::string& reason, const std::string& condition = "",
+                 const std::string& function = "") {
   LogCapture log;
   const Error error = ErrorOf(fn);
   EXPECT_EQ(error.code, code) << error.what();
   EXPECT_EQ(error.reason, reason);
   if (!condition.empty()) {
-    EXPECT_EQ(log.Matching("Failed [" + condition + "], reason: " + reason).size(), 1u)
-        << ::testing::PrintToString(log.Lines());
+    const std::string needle =
+        (function.empty() ? "" : "(" + function + ") ") + "Failed [" + condition + "], reason: " + reason;
+    EXPECT_EQ(log.Matching(needle).size(), 1u) << needle << " in " << ::testing::PrintToString(log.Lines());
   }
 }
 
