@@ -121,7 +121,7 @@ TEST_F(FolderUpsertTest, FullVolumeRefusesTheRequest) {
 // Once every folder is accepted the steps run in order and a failure stops
 // them where it happens: what was done stays, what follows never runs.
 TEST_F(FolderUpsertTest, LateFailurePropagatesAndLeavesEarlierStepsInPlace) {
-  const std::string folders_before = ReadFile(sandbox_.FoldersFile());
+  const std::string folders_before = ReadFileText(sandbox_.FoldersFile());
   {
     ScopedTestPlatform platform;
     platform->fail_monitor = true;
@@ -131,7 +131,7 @@ TEST_F(FolderUpsertTest, LateFailurePropagatesAndLeavesEarlierStepsInPlace) {
   }
   EXPECT_THAT(sandbox_.SearchCommands(), ElementsAre("index_create fileindex_photo"));
   EXPECT_EQ(sandbox_.ServiceRequests().back(), "start pkg-CorvLumex-fileindexd.service");
-  EXPECT_EQ(ReadFile(sandbox_.FoldersFile()), folders_before) << "not saved";
+  EXPECT_EQ(ReadFileText(sandbox_.FoldersFile()), folders_before) << "not saved";
   EXPECT_TRUE(sandbox_.DaemonCommands().empty());
   EXPECT_TRUE(sandbox_.QueueEvents("photo").empty());
 
@@ -151,7 +151,7 @@ TEST_F(FolderUpsertTest, UpdaterModeStoresRefusedPathsWithoutReindex) {
 
 TEST_F(FolderUpsertTest, EmptyListStartsServicesAndSavesTheSameList) {
   FolderAdd(Json::Value(Json::arrayValue), false);
-  EXPECT_EQ(ReadFile(sandbox_.FoldersFile()), "[]\n");
+  EXPECT_EQ(ReadFileText(sandbox_.FoldersFile()), "[]\n");
   EXPECT_EQ(sandbox_.ServiceRequests().back(), "start pkg-CorvLumex-fileindexd.service");
   EXPECT_TRUE(sandbox_.SearchRequests().empty());
   EXPECT_TRUE(sandbox_.DaemonCommands().empty());

@@ -4,6 +4,7 @@
 #include <fstream>
 #include <sstream>
 
+#include "common/file_util.h"
 #include "common/json_util.h"
 #include "common/sys.h"
 
@@ -45,11 +46,8 @@ Json::Value MgmtSandbox::MonitorCfg(const std::string& share) const {
 
 std::vector<std::string> MgmtSandbox::ServiceRequests() const {
   std::vector<std::string> lines;
-  std::istringstream input(ReadFile(root() + "/var/log/corvlumex/service_requests.log"));
-  std::string line;
-  while (std::getline(input, line)) {
-    if (line != "<absent>") lines.push_back(line);
-  }
+  std::istringstream input(ReadFileText(root() + "/var/log/corvlumex/service_requests.log"));
+  for (std::string line; std::getline(input, line);) lines.push_back(line);
   return lines;
 }
 
@@ -66,15 +64,17 @@ std::vector<std::string> MgmtSandbox::SearchCommands() const {
 }
 
 SystemSnapshot MgmtSandbox::Snapshot() const {
+  // A file that appears empty is a change too.
+  const auto bytes = [](const std::string& path) { return IsFileExist(path) ? ReadFileText(path) : "<absent>"; };
   SystemSnapshot snapshot;
-  snapshot["folders"] = ReadFile(FoldersFile());
-  snapshot["status"] = ReadFile(EtcFile("fileindex.status"));
-  for (const std::string& file : MonitorFiles()) snapshot[file] = ReadFile(file);
-  snapshot["services"] = ReadFile(root() + "/var/log/corvlumex/service_requests.log");
-  snapshot["spotlight"] = ReadFile(root() + "/etc/samba/corvlumex-spotlight.conf");
+  snapshot["folders"] = bytes(FoldersFile());
+  snapshot["status"] = bytes(EtcFile("fileindex.status"));
+  for (const std::string& file : MonitorFiles()) snapshot[file] = bytes(file);
+  snapshot["services"] = bytes(root() + "/var/log/corvlumex/service_requests.log");
+  snapshot["spotlight"] = bytes(root() + "/etc/samba/corvlumex-spotlight.conf");
   for (const Json::Value& share : shares()) {
     const std::string queue = QueueFile(share["name"].asString());
-    snapshot[queue] = ReadFile(queue);
+    snapshot[queue] = bytes(queue);
   }
   snapshot["daemon frames"] = std::to_string(daemon()->Frames().size());
   snapshot["search requests"] = std::to_string(search_->Requests().size());

@@ -93,7 +93,7 @@ TEST_F(PauseHomeTest, HomeServiceSwitchSuspendsAndRestoresTheHomes) {
   EXPECT_TRUE(sandbox_.MonitorCfg("homes").isNull());
   EXPECT_EQ(StatusMgr().GetShareStatus("homes"), kShareStatusHomeDisabled);
   EXPECT_THAT(NewDaemonSummaries(), ElementsAre("worker_delete homes"));
-  EXPECT_NE(ReadFile(sandbox_.FoldersFile()).find("/homes/alice/docs"), std::string::npos);
+  EXPECT_NE(ReadFileText(sandbox_.FoldersFile()).find("/homes/alice/docs"), std::string::npos);
 
   HomeEnable();
   EXPECT_EQ(JsonToString(sandbox_.MonitorCfg("homes")), JsonToString(cfg));

@@ -37,7 +37,7 @@ TEST_F(ShareOpsTest, RenameMovesFoldersIndexMonitorAndStatus) {
   EXPECT_EQ(JsonToString(requests[requests.size() - 3]["data"]["data"]),
             "{\"id\":\"fileindex_pics\",\"path\":\"" + pics + "/@eaDir/fileindex.db\"}");
   EXPECT_THAT(sandbox_.SavedPaths(), ElementsAre("/pics", "/pics/a"));
-  EXPECT_NE(ReadFile(sandbox_.FoldersFile()).find(R"("path":"/pics/a","name":"a","document":true,"audio":false)"),
+  EXPECT_NE(ReadFileText(sandbox_.FoldersFile()).find(R"("path":"/pics/a","name":"a","document":true,"audio":false)"),
             std::string::npos);
   EXPECT_NE(sandbox_.MonitorFiles(), old_monitor_files);
   EXPECT_EQ(sandbox_.MonitorFiles().size(), 1u);
@@ -76,7 +76,7 @@ TEST_F(ShareOpsTest, RenameOfAShareWithoutFoldersCarriesItsStatusOnly) {
 }
 
 TEST_F(ShareOpsTest, MigrateFollowsTheShareToItsNewVolume) {
-  const std::string folders = ReadFile(sandbox_.FoldersFile());
+  const std::string folders = ReadFileText(sandbox_.FoldersFile());
   const std::string moved = sandbox_.MoveShare("photo", "volume2");
   ShareMigrate("photo", photo_, moved);
   EXPECT_THAT(NewSearchCommands(), ElementsAre("index_config_set fileindex_photo",
@@ -84,7 +84,7 @@ TEST_F(ShareOpsTest, MigrateFollowsTheShareToItsNewVolume) {
                                                "document_del_by_id fileindex_photo " + photo_));
   EXPECT_EQ(JsonToString(sandbox_.SearchRequests()[sandbox_.SearchRequests().size() - 3]["data"]["data"]),
             "{\"path\":\"" + moved + "/@eaDir/fileindex.db\"}");
-  EXPECT_EQ(ReadFile(sandbox_.FoldersFile()), folders);
+  EXPECT_EQ(ReadFileText(sandbox_.FoldersFile()), folders);
   EXPECT_EQ(sandbox_.MonitorFiles().size(), 1u);  // the old place's configuration is gone
   EXPECT_EQ(sandbox_.MonitorCfg("photo")["config"][0]["path"].asString(), moved);
   ASSERT_EQ(NewDaemonCommands().size(), 1u);

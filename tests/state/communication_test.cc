@@ -105,67 +105,51 @@ TEST(BufferTransfer, ChunksOfAtMost1024BytesAndNoCallForNothing) {
   for (unsigned long size : script.read_sizes) EXPECT_LE(size, 1024u);
 }
 
-TEST(BufferTransfer, TenInterruptionsAreRetriedTheEleventhFails) {
-  Pipe pipe;
-  const unsigned char byte = 'a';
-  unsigned char got = 0;
-  SyscallScript script;
-  script.reads.assign(10, E);
-  script.writes.assign(10, E);
-  {
-    ScopedSyscallScript scope(&script);
-    BufferWrite(pipe.write_end, 1, &byte);
-    BufferRead(pipe.read_end, 1, &got);
-  }
-  EXPECT_EQ(got, 'a');
-  EXPECT_EQ(script.write_sizes.size(), 11u);
-
+// Ten interruptions in one transfer are retried, spread over its chunks or
+// not (progress does not reset the budget); the eleventh fails. A zero result
+// is retried; any other error fails at once. The functions never log.
+TEST(BufferTransfer, RetriesAndFailures) {
+  struct Row {
+    bool reading;
+    std::deque<int> script;
+    size_t size;
+    std::string failure;  // empty: the data goes through whole
+  };
+  const std::deque<int> ten(10, E), eleven(11, E);
+  const std::vector<Row> rows = {
+      {false, ten, 1, ""},
+      {false, eleven, 1, Failed("write", EINTR)},
+      {true, ten, 1, ""},
+      {true, eleven, 1, Failed("read", EINTR)},
+      {false, {E, E, E, E, P, E, E, E, E, P, E, E, P}, 3000, ""},
+      {false, {E, E, E, E, P, E, E, E, E, P, E, E, E}, 3000, Failed("write", EINTR)},
+      {false, {0, 0, P}, 3, ""},
+      {true, {-ECONNRESET}, 3, Failed("read", ECONNRESET)},
+  };
   LogCapture log;
-  script.reads.assign(11, E);
-  script.writes.assign(11, E);
-  ScopedSyscallScript scope(&script);
-  EXPECT_EQ(ReasonOf([&] { BufferRead(pipe.read_end, 1, &got); }), Failed("read", EINTR));
-  EXPECT_EQ(ReasonOf([&] { BufferWrite(pipe.write_end, 1, &byte); }), Failed("write", EINTR));
-  EXPECT_TRUE(log.Lines().empty()) << "the transfer functions never log";
-}
-
-TEST(BufferTransfer, InterruptionBudgetIsNotResetByProgress) {
-  Pipe pipe;
-  const std::vector<unsigned char> data(3000, 'y');
-  SyscallScript script;
-  // Ten interruptions spread between the three chunks: still fine.
-  script.writes = {E, E, E, E, P, E, E, E, E, P, E, E, P};
-  {
+  for (const Row& row : rows) {
+    SCOPED_TRACE(::testing::Message() << (row.reading ? "read " : "write ") << row.size << " " << row.failure);
+    Pipe pipe;
+    std::vector<unsigned char> data(row.size, 'x'), back(row.size);
+    SyscallScript script;
+    (row.reading ? script.reads : script.writes) = row.script;
+    if (row.reading) BufferWrite(pipe.write_end, data.size(), data.data());
     ScopedSyscallScript scope(&script);
-    BufferWrite(pipe.write_end, data.size(), data.data());
+    if (!row.failure.empty()) {
+      EXPECT_EQ(ReasonOf([&] {
+                  row.reading ? BufferRead(pipe.read_end, back.size(), back.data())
+                              : BufferWrite(pipe.write_end, data.size(), data.data());
+                }),
+                row.failure);
+      continue;
+    }
+    if (!row.reading) BufferWrite(pipe.write_end, data.size(), data.data());
+    BufferRead(pipe.read_end, back.size(), back.data());
+    EXPECT_EQ(back, data);
   }
-  std::vector<unsigned char> back(3000);
-  BufferRead(pipe.read_end, back.size(), back.data());
-  // Eleven, spread the same way, fail although each chunk saw fewer.
-  script.writes = {E, E, E, E, P, E, E, E, E, P, E, E, E};
-  ScopedSyscallScript scope(&script);
-  EXPECT_EQ(ReasonOf([&] { BufferWrite(pipe.write_end, data.size(), data.data()); }), Failed("write", EINTR));
-}
-
-TEST(BufferTransfer, ZeroResultIsRetriedAndOtherErrorsFailAtOnce) {
-  Pipe pipe;
-  const unsigned char text[] = "abc";
-  SyscallScript script;
-  script.writes = {0, 0, P};
-  {
-    ScopedSyscallScript scope(&script);
-    BufferWrite(pipe.write_end, 3, text);
-  }
-  EXPECT_EQ(script.write_sizes, (std::vector<unsigned long>{3, 3, 3}));
-  unsigned char back[3];
-  BufferRead(pipe.read_end, 3, back);
-  EXPECT_EQ(0, memcmp(back, text, 3));
-
-  EXPECT_EQ(ReasonOf([&] { BufferRead(-1, 1, back); }), Failed("read", EBADF));
-  EXPECT_EQ(ReasonOf([&] { BufferWrite(-1, 1, text); }), Failed("write", EBADF));
-  script.reads = {-ECONNRESET};
-  ScopedSyscallScript scope(&script);
-  EXPECT_EQ(ReasonOf([&] { BufferRead(pipe.read_end, 3, back); }), Failed("read", ECONNRESET));
+  EXPECT_EQ(ReasonOf([&] { BufferWrite(-1, 1, nullptr); }), Failed("write", EBADF));
+  EXPECT_EQ(ReasonOf([&] { BufferRead(-1, 1, nullptr); }), Failed("read", EBADF));
+  EXPECT_TRUE(log.Lines().empty());
 }
 
 TEST(Frames, LengthCountsTheNulAndReaderDropsIt) {

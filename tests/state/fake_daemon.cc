@@ -9,6 +9,8 @@
 #include <filesystem>
 #include <stdexcept>
 
+#include "tests/support/child_process.h"
+
 namespace corvlumex {
 namespace testing_support {
 namespace {
@@ -90,14 +92,12 @@ std::vector<ReceivedFrame> FakeDaemon::Frames() const {
 }
 
 bool FakeDaemon::WaitForClosedConnections(size_t count) const {
-  for (int i = 0; i < 500; ++i) {
-    {
-      std::lock_guard<std::mutex> guard(mutex_);
-      if (closed_connections_ >= count) return true;
-    }
-    std::this_thread::sleep_for(std::chrono::milliseconds(10));
-  }
-  return false;
+  return PollUntil(
+      [&] {
+        std::lock_guard<std::mutex> guard(mutex_);
+        return closed_connections_ >= count;
+      },
+      std::chrono::seconds(5));
 }
 
 }  // namespace testing_support

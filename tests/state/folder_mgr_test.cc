@@ -52,7 +52,7 @@ TEST_F(FolderMgrTest, NoFileIsAnEmptyListAndSavesAnArray) {
   EXPECT_FALSE(mgr.GetMostSuitableCfg(s_ + "/a"));
   EXPECT_FALSE(mgr.IsFullPathIndexed(s_));
   mgr.Save();
-  EXPECT_EQ(ReadFile(FoldersPath()), "[]\n");
+  EXPECT_EQ(ReadFileText(FoldersPath()), "[]\n");
   struct stat info;
   ASSERT_EQ(stat(FoldersPath().c_str(), &info), 0);
   EXPECT_EQ(info.st_mode & 07777, 0644u);
@@ -148,7 +148,7 @@ TEST_F(FolderMgrTest, UpsertOfAChangedFolderReindexesTheSwitchedKindsAndMovesItL
   EXPECT_FALSE(old->IsPaused());
   EXPECT_FALSE(old->IsPrivileged());
   mgr.Save();
-  const std::string text = ReadFile(FoldersPath());
+  const std::string text = ReadFileText(FoldersPath());
   EXPECT_LT(text.find("/s/c"), text.find("\"path\":\"/s/a\""));
   EXPECT_EQ(FolderMgr().Folders().back()->GetName(), "renamed");
 }

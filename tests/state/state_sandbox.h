@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "tests/state/fake_daemon.h"
+#include "tests/support/child_process.h"
 #include "tests/support/expect_error.h"
 #include "tests/support/log_capture.h"
 
@@ -74,7 +75,7 @@ namespace fileindex {
 using testing_support::ErrorOf;
 using testing_support::ExpectError;
 using testing_support::LogCapture;
-using testing_support::ReadFile;
+using testing_support::ReadFileText;
 using testing_support::SleepRecorder;
 using testing_support::StateSandbox;
 }  // namespace fileindex

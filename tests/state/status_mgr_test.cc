@@ -27,7 +27,7 @@ class StatusMgrTest : public ::testing::Test {
   void WriteStatus(const std::string& text) { sandbox_.Write("var/packages/CorvLumex/etc/fileindex.status", text); }
   Json::Value Stored() const {
     Json::Value stored;
-    EXPECT_TRUE(JsonFromFile(stored, StatusPath())) << ReadFile(StatusPath());
+    EXPECT_TRUE(JsonFromFile(stored, StatusPath())) << ReadFileText(StatusPath());
     return stored;
   }
 
@@ -41,7 +41,7 @@ TEST_F(StatusMgrTest, AbsentFileOrMembersReadAsNotPausedWithoutFlags) {
   EXPECT_FALSE(IsFileExist(StatusPath()));
   // Clearing an empty state writes an object, still without a pause.
   StatusMgr().ClearShareStatus("music");
-  EXPECT_EQ(ReadFile(StatusPath()), "{}\n");
+  EXPECT_EQ(ReadFileText(StatusPath()), "{}\n");
   EXPECT_EQ(StatusMgr().GetPauseInfo(), -1);
   WriteStatus("{\"resume_time\": 1234}");
   EXPECT_EQ(StatusMgr().GetPauseInfo(), 1234);
@@ -85,7 +85,7 @@ TEST_F(StatusMgrTest, PauseEndIsNowPlusHoursIn32Bits) {
 TEST_F(StatusMgrTest, NegativePauseIsRefusedBeforeAnyChange) {
   WriteStatus("{\"resume_time\":-1}");
   ExpectError([] { StatusMgr().Pause(-1); }, kErrorBadArgument, "Pause length should NOT be negative", "0 > hours");
-  EXPECT_EQ(ReadFile(StatusPath()), "{\"resume_time\":-1}");
+  EXPECT_EQ(ReadFileText(StatusPath()), "{\"resume_time\":-1}");
   EXPECT_TRUE(sandbox_.daemon()->Frames().empty());
 }
 

@@ -1,13 +1,10 @@
 // Checks shared by the test directories: the Error an action throws and the
-// log line that went with it, the descriptors this process holds, and the
-// bytes of a file.
+// log line that went with it, and the descriptors this process holds.
 #pragma once
 
 #include <dirent.h>
 #include <gtest/gtest.h>
 
-#include <fstream>
-#include <sstream>
 #include <string>
 
 #include "common/error.h"
@@ -52,15 +49,6 @@ inline int OpenDescriptors() {
   while (readdir(dir) != nullptr) ++count;
   closedir(dir);
   return count;
-}
-
-// The file's bytes; "<absent>" when it cannot be opened.
-inline std::string ReadFile(const std::string& path) {
-  std::ifstream input(path, std::ios::binary);
-  if (!input) return "<absent>";
-  std::ostringstream content;
-  content << input.rdbuf();
-  return content.str();
 }
 
 }  // namespace testing_support
