@@ -387,6 +387,7 @@ int main(int argc, char** argv) {
   };
   std::vector<double> name_raw = timed(substrings, "CORVMDSearchFileName");
   std::vector<double> word_raw = timed(terms, "_all");
+  const double search_load = LoadAverage();
   QueryFigures names_found = Split(name_raw), words_found = Split(word_raw);
 
   if (options.keep) {
@@ -394,6 +395,7 @@ int main(int argc, char** argv) {
     std::cout << "documents: " << options.docs << "\n";
     names_found.Print("name substring search");
     words_found.Print("word search");
+    std::cout << "load average after the searches: " << search_load << "\n";
     return 0;
   }
   Json::Value del;
@@ -413,6 +415,7 @@ int main(int argc, char** argv) {
   std::cout << "reopening the index after a restart: " << restart_seconds << " s\n";
   names_found.Print("name substring search");
   words_found.Print("word search");
+  std::cout << "load average after the searches: " << search_load << "\n";
   std::cout << "prefix delete of " << deleted["data"]["deleted"].asInt64() << " documents: " << delete_seconds << " s\n";
   std::cout << "peak memory of the daemon: " << peak_kb / 1024 << " MB\n";
   std::cout << "database after ingest: " << db_bytes / 1048576.0 << " MB; documents as JSON: " << raw_json / 1048576.0

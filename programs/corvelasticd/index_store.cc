@@ -11,6 +11,7 @@
 #include "programs/corvelasticd/daemon_error.h"
 #include "programs/corvelasticd/document_codec.h"
 #include "programs/corvelasticd/index_files.h"
+#include "programs/corvelasticd/search_candidates.h"
 #include "programs/corvelasticd/text_analysis.h"
 
 namespace corvlumex {
@@ -48,15 +49,6 @@ std::string JoinTokens(const std::vector<std::string>& tokens) {
     out += token;
   }
   return out;
-}
-
-SqlValue ColumnValue(const Statement& stmt, int column) {
-  switch (stmt.Type(column)) {
-    case SQLITE_INTEGER: return stmt.Int(column);
-    case SQLITE_FLOAT: return stmt.Real(column);
-    case SQLITE_NULL: return nullptr;
-    default: return stmt.Text(column);
-  }
 }
 
 }  // namespace
@@ -581,8 +573,16 @@ SearchResult IndexStore::Search(const Query& query, const SortSpec& sort, size_t
   // One read transaction: the hits, their documents and the count come from one snapshot.
   reader->Exec("BEGIN");
   try {
-    auto select = reader->Prepare(sql);
-    select->BindAll(values);
+    // A word query alone (the usual search) is ordered from the full-text
+    // index's scores; anything else by SQL.
+    std::unique_ptr<SearchCandidates> candidates;
+    if (ranked && condition == "1") {
+      candidates = std::make_unique<RankedMatchCandidates>(*reader, query.RankedExpression());
+    } else {
+      auto select = reader->Prepare(sql);
+      select->BindAll(values);
+      candidates = std::make_unique<StatementCandidates>(std::move(select), ranked);
+    }
     std::vector<Hit> batch;
     std::vector<int64_t> rowids;
     size_t checked_past_page = 0;
@@ -592,12 +592,11 @@ SearchResult IndexStore::Search(const Query& query, const SortSpec& sort, size_t
       batch.clear();
       rowids.clear();
       std::vector<std::string> keys;
-      while (batch.size() < kFilterBatch && (more = select->Step())) {
+      while (batch.size() < kFilterBatch) {
         Hit hit;
-        rowids.push_back(select->Int(0));
-        hit.key = select->Text(1);
-        hit.score = ranked ? -select->Real(2) : 0.0;
-        hit.sort_value = ColumnValue(*select, 3);
+        int64_t rowid = 0;
+        if (!(more = candidates->Next(&rowid, &hit))) break;
+        rowids.push_back(rowid);
         keys.push_back(hit.key);
         batch.push_back(std::move(hit));
       }
@@ -626,7 +625,9 @@ SearchResult IndexStore::Search(const Query& query, const SortSpec& sort, size_t
           break;
         }
         if (checked_past_page >= check_budget) {
-          result.total_exact = !select->Step();
+          Hit rest;
+          int64_t rowid = 0;
+          result.total_exact = !candidates->Next(&rowid, &rest);
           break;
         }
       }

@@ -1,0 +1,103 @@
+#include "programs/corvelasticd/search_candidates.h"
+
+#include <algorithm>
+#include <unordered_map>
+
+namespace corvlumex {
+namespace elasticd {
+namespace {
+
+SqlValue ColumnValue(const Statement& stmt, int column) {
+  switch (stmt.Type(column)) {
+    case SQLITE_INTEGER: return stmt.Int(column);
+    case SQLITE_FLOAT: return stmt.Real(column);
+    case SQLITE_NULL: return nullptr;
+    default: return stmt.Text(column);
+  }
+}
+
+}  // namespace
+
+bool StatementCandidates::Next(int64_t* rowid, Hit* hit) {
+  if (done_) return false;
+  if (!select_->Step()) {
+    done_ = true;
+    return false;
+  }
+  *rowid = select_->Int(0);
+  hit->key = select_->Text(1);
+  hit->score = ranked_ ? -select_->Real(2) : 0.0;
+  hit->sort_value = ColumnValue(*select_, 3);
+  return true;
+}
+
+constexpr size_t kKeyWindow = 64;  // rows whose keys one statement reads
+
+std::string KeysOfRowsSql() {
+  std::string sql = "SELECT rowid, key FROM docs WHERE rowid IN (?";
+  for (size_t i = 1; i < kKeyWindow; ++i) sql += ", ?";
+  return sql + ")";
+}
+
+RankedMatchCandidates::RankedMatchCandidates(Database& reader, const std::string& match)
+    : keys_of_rows_(reader.Cached(KeysOfRowsSql())) {
+  Statement& matches = reader.Cached("SELECT rowid, rank FROM fts_text WHERE fts_text MATCH ?");
+  matches.BindText(1, match);
+  while (matches.Step()) ranked_.emplace_back(matches.Real(1), matches.Int(0));
+  matches.Reset();
+  // Equal scores keep no order of their own here: runs of them are put in key order below.
+  std::sort(ranked_.begin(), ranked_.end(), [](const auto& a, const auto& b) { return a.first < b.first; });
+}
+
+bool RankedMatchCandidates::LoadNextWindow() {
+  window_.clear();
+  window_next_ = 0;
+  while (window_.empty() && next_ < ranked_.size()) {
+    // A window ends with a run of equal scores, so that each run is ordered whole.
+    size_t end = std::min(next_ + kKeyWindow, ranked_.size());
+    while (end < ranked_.size() && ranked_[end].first == ranked_[end - 1].first) ++end;
+    std::unordered_map<int64_t, size_t> slot;
+    for (size_t i = next_; i < end; ++i) {
+      slot.emplace(ranked_[i].second, window_.size());
+      window_.push_back(Candidate{ranked_[i].first, ranked_[i].second, std::string(), false});
+    }
+    for (size_t start = next_; start < end; start += kKeyWindow) {
+      keys_of_rows_.Reset();
+      int bind = 1;
+      for (size_t i = start; i < end && i < start + kKeyWindow; ++i) keys_of_rows_.Bind(bind++, ranked_[i].second);
+      while (keys_of_rows_.Step()) {
+        Candidate& candidate = window_[slot.at(keys_of_rows_.Int(0))];
+        candidate.key = keys_of_rows_.Text(1);
+        candidate.found = true;
+      }
+    }
+    keys_of_rows_.Reset();
+    next_ = end;
+    // A match without its document (never the case in a consistent index) is left out, as a join would.
+    window_.erase(std::remove_if(window_.begin(), window_.end(), [](const Candidate& c) { return !c.found; }), window_.end());
+  }
+  // Within a run of equal scores, byte order of the keys, as SQLite compares text.
+  for (size_t run = 0; run < window_.size();) {
+    size_t run_end = run + 1;
+    while (run_end < window_.size() && window_[run_end].rank == window_[run].rank) ++run_end;
+    if (run_end - run > 1) {
+      std::sort(window_.begin() + static_cast<std::ptrdiff_t>(run), window_.begin() + static_cast<std::ptrdiff_t>(run_end),
+                [](const Candidate& a, const Candidate& b) { return a.key < b.key; });
+    }
+    run = run_end;
+  }
+  return !window_.empty();
+}
+
+bool RankedMatchCandidates::Next(int64_t* rowid, Hit* hit) {
+  if (window_next_ >= window_.size() && !LoadNextWindow()) return false;
+  Candidate& candidate = window_[window_next_++];
+  *rowid = candidate.rowid;
+  hit->key = std::move(candidate.key);
+  hit->score = -candidate.rank;
+  hit->sort_value = nullptr;
+  return true;
+}
+
+}  // namespace elasticd
+}  // namespace corvlumex

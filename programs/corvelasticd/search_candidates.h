@@ -1,0 +1,69 @@
+// The candidates of one search, one at a time in the order of the answer,
+// each with its document's row and key. The access check and paging read
+// them only as far as the page and the count need.
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "programs/corvelasticd/index_store.h"
+#include "programs/corvelasticd/sqlite_db.h"
+
+namespace corvlumex {
+namespace elasticd {
+
+class SearchCandidates {
+ public:
+  virtual ~SearchCandidates() = default;
+  // Fills the next candidate (key, score, sort value); false when there is none.
+  virtual bool Next(int64_t* rowid, Hit* hit) = 0;
+};
+
+// The rows of a statement that selects (rowid, key, rank or 0, sort value).
+class StatementCandidates : public SearchCandidates {
+ public:
+  StatementCandidates(std::unique_ptr<Statement> select, bool ranked) : select_(std::move(select)), ranked_(ranked) {}
+  bool Next(int64_t* rowid, Hit* hit) override;
+
+ private:
+  std::unique_ptr<Statement> select_;
+  bool ranked_;
+  // SQLite starts a finished statement over when stepped again: a search
+  // that had counted every candidate then called its total inexact.
+  bool done_ = false;
+};
+
+// The matches of one full-text expression, best first, ties in key order.
+// Every match is scored, but a match's key is read from "docs" (a random
+// page of a large table) only when the caller reaches it: a word found in
+// many documents costs one score each, not a document lookup and a sort
+// of every match. Keys are read for a window of matches at a time, in one
+// statement.
+class RankedMatchCandidates : public SearchCandidates {
+ public:
+  RankedMatchCandidates(Database& reader, const std::string& match);
+  bool Next(int64_t* rowid, Hit* hit) override;
+
+ private:
+  struct Candidate {
+    double rank;
+    int64_t rowid;
+    std::string key;
+    bool found;
+  };
+  // Reads the keys of the next window of matches (whole runs of equal
+  // scores) and puts each run in key order.
+  bool LoadNextWindow();
+
+  Statement& keys_of_rows_;
+  std::vector<std::pair<double, int64_t>> ranked_;  // (rank, rowid), best (lowest rank) first
+  size_t next_ = 0;
+  std::vector<Candidate> window_;
+  size_t window_next_ = 0;
+};
+
+}  // namespace elasticd
+}  // namespace corvlumex
