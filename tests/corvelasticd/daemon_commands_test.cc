@@ -4,6 +4,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <filesystem>
 #include <fstream>
 #include <functional>
@@ -69,6 +70,41 @@ TEST_F(CommandsTest, WordQueriesThroughTheWriterSeeUncommittedWritesInOrder) {
   EXPECT_EQ(HitIds(Search(R"({"match": {"_all": "gamma"}})")), Ids({"/volume1/share/a.txt", "/volume1/share/c.txt"}));
   EXPECT_EQ(HitIds(Search(R"({"match": {"_all": "beta"}})")), Ids({"/volume1/share/c.txt"}));
   EXPECT_EQ(Search(R"({"match": {"_all": "alpha"}})")["data"]["total"].asInt(), 0);
+}
+
+TEST_F(CommandsTest, RelevanceOrdersEqualScoresByKeyOnEveryPageWhateverTheQueryShape) {
+  // Equal texts score alike: such runs come in key order, also when a run is
+  // longer than the keys read at a time and when rows were written out of key order.
+  Ids strong, weak;
+  for (int i = 0; i < 130; ++i) {
+    const int n = (i * 37) % 130;  // written out of key order
+    const std::string path = "/volume1/share/w" + std::to_string(1000 + n) + ".txt";
+    Upsert(path, "tie other");
+    weak.push_back(path);
+    if (i % 40 == 0) {
+      strong.push_back("/volume1/share/s" + std::to_string(900 - i) + ".txt");
+      Upsert(strong.back(), "tie tie tie");
+    }
+  }
+  Commit();
+  std::sort(strong.begin(), strong.end());
+  std::sort(weak.begin(), weak.end());
+  Ids expected = strong;
+  expected.insert(expected.end(), weak.begin(), weak.end());
+  const std::string alone = R"({"match": {"_all": "tie"}})";
+  const std::string filtered = R"({"bool": {"must": [{"match": {"_all": "tie"}}], "filter": [{"prefix": {"CORVMDPath": "/volume1/"}}]}})";
+  for (const std::string& qsl : {alone, filtered}) {
+    Ids paged;
+    for (int from = 0; from < 150; from += 50) {
+      const Json::Value answer = Search(qsl, R"({"size": 50, "from": )" + std::to_string(from) + "}");
+      EXPECT_EQ(answer["data"]["total"].asInt(), 134) << qsl;
+      for (const std::string& id : HitIds(answer)) paged.push_back(id);
+    }
+    EXPECT_EQ(paged, expected) << qsl;
+  }
+  const Json::Value first = Search(alone, R"({"size": 5})");
+  EXPECT_GT(first["data"]["hits"][0]["score"].asDouble(), first["data"]["hits"][4]["score"].asDouble());
+  EXPECT_EQ(first["data"]["hits"][0]["score"].asDouble(), first["data"]["hits"][3]["score"].asDouble());
 }
 
 TEST_F(CommandsTest, UpsertReplacesTheWholeDocumentAndSetByIdMergesIntoAnExistingOne) {
