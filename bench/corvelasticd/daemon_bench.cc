@@ -390,9 +390,16 @@ int main(int argc, char** argv) {
   const double search_load = LoadAverage();
   QueryFigures names_found = Split(name_raw), words_found = Split(word_raw);
 
+  const auto print_ingest = [&] {
+    if (options.reuse) return;  // nothing was ingested
+    std::cout << "ingest: " << static_cast<long>(options.docs / ingest_seconds) << " documents/s (" << ingest_seconds
+              << " s; daemon CPU " << ingest_cpu << " s = " << static_cast<long>(options.docs / std::max(ingest_cpu, 1e-3))
+              << " documents per CPU second; the client's CPU " << client_cpu << " s; load average " << ingest_load << ")\n";
+  };
   if (options.keep) {
     StopDaemon(daemon);
     std::cout << "documents: " << options.docs << "\n";
+    print_ingest();
     names_found.Print("name substring search");
     words_found.Print("word search");
     std::cout << "load average after the searches: " << search_load << "\n";
@@ -409,9 +416,7 @@ int main(int argc, char** argv) {
   StopDaemon(daemon);
 
   std::cout << "documents: " << options.docs << "\n";
-  std::cout << "ingest: " << static_cast<long>(options.docs / ingest_seconds) << " documents/s (" << ingest_seconds
-            << " s; daemon CPU " << ingest_cpu << " s = " << static_cast<long>(options.docs / std::max(ingest_cpu, 1e-3))
-            << " documents per CPU second; the client's CPU " << client_cpu << " s; load average " << ingest_load << ")\n";
+  print_ingest();
   std::cout << "reopening the index after a restart: " << restart_seconds << " s\n";
   names_found.Print("name substring search");
   words_found.Print("word search");
