@@ -23,6 +23,7 @@ constexpr int kFormatVersion = 1;
 constexpr size_t kMaxTrackedChanges = 100000;
 constexpr size_t kMaxSuggestionTerms = 100000;
 constexpr size_t kFilterBatch = 64;
+constexpr size_t kMaxKeyChanges = 1000000;  // rows changed in one transaction kept for the key directory
 constexpr size_t kMaxReaders = 4;
 constexpr int kReaderCacheKb = 16384;
 // Full-text rows queued beyond this are handed to the engine before the next request.
@@ -242,6 +243,7 @@ void IndexStore::RemoveRow(int64_t rowid, const std::string& key, const std::str
   stmt.Bind(1, rowid);
   stmt.Step();
   stmt.Reset();
+  NoteKeyChange(rowid, std::nullopt);
   NoteDelete(key);
 }
 
@@ -263,6 +265,18 @@ void IndexStore::NoteDelete(const std::string& key) {
   }
 }
 
+void IndexStore::NoteKeyChange(int64_t rowid, std::optional<std::string> key) {
+  if (!key_changes_complete_) return;
+  if (key_changes_.size() >= kMaxKeyChanges) {
+    // The directory is built again after such a transaction rather than kept in step.
+    key_changes_complete_ = false;
+    key_changes_.clear();
+    key_changes_.shrink_to_fit();
+    return;
+  }
+  key_changes_.emplace_back(rowid, std::move(key));
+}
+
 void IndexStore::Begin() {
   if (in_transaction_) return;
   writer_->Exec("BEGIN IMMEDIATE");
@@ -282,16 +296,20 @@ void IndexStore::Atomically(Body body) {
   if (pending_index_.bytes() > kMaxPendingIndexBytes) FlushIndexWrites();
   Begin();
   const size_t mark = pending_index_.Mark();
+  const size_t key_mark = key_changes_.size();
   Run("SAVEPOINT request");
   try {
     body();
   } catch (...) {
     pending_index_.DropAfter(mark);
+    if (key_changes_.size() > key_mark) key_changes_.resize(key_mark);
     try {
       Run("ROLLBACK TO request");
       Run("RELEASE request");
     } catch (const std::exception&) {
-      // The first failure is the one worth reporting.
+      // The first failure is the one worth reporting. What the rows hold is
+      // no longer known: the key directory is built again after the commit.
+      key_changes_complete_ = false;
     }
     NoteLostTransaction();
     throw;
@@ -305,6 +323,8 @@ void IndexStore::NoteLostTransaction() {
   if (!in_transaction_ || sqlite3_get_autocommit(writer_->raw()) == 0) return;
   in_transaction_ = false;
   pending_index_.Clear();
+  key_changes_.clear();
+  key_changes_complete_ = true;  // the rows are as last committed, as the directory is
   upserted_.clear();
   deleted_.clear();
   truncated_ = false;
@@ -357,7 +377,9 @@ void IndexStore::Upsert(const std::string& doc_id, const Json::Value& input) {
       insert.BindBlob(2, stored);
       insert.Step();
       insert.Reset();
-      IndexEntries(sqlite3_last_insert_rowid(writer_->raw()), document, false);
+      const int64_t rowid = sqlite3_last_insert_rowid(writer_->raw());
+      NoteKeyChange(rowid, key);
+      IndexEntries(rowid, document, false);
     }
     NoteUpsert(key);
   });
@@ -386,6 +408,7 @@ void IndexStore::SetById(const std::string& doc_id, const Json::Value& changes) 
     update.Bind(3, row.rowid);
     update.Step();
     update.Reset();
+    NoteKeyChange(row.rowid, key);
     IndexEntries(row.rowid, document, false);
     NoteUpsert(key);
   });
@@ -449,14 +472,19 @@ Json::Value IndexStore::GetByQuery(const Query& query, const std::vector<std::st
 CommitChanges IndexStore::Commit() {
   CommitChanges changes;
   if (in_transaction_) {
+    keys_.BeginCommit();
     try {
       FlushIndexWrites();
       writer_->Exec("COMMIT");
     } catch (const std::exception&) {
+      keys_.EndCommit(false, false, key_changes_);
       NoteLostTransaction();  // a full volume can make SQLite roll the transaction back
       throw;
     }
     in_transaction_ = false;
+    keys_.EndCommit(true, key_changes_complete_, key_changes_);
+    key_changes_.clear();
+    key_changes_complete_ = true;
   }
   changes.upserted.assign(upserted_.begin(), upserted_.end());
   changes.deleted.assign(deleted_.begin(), deleted_.end());
@@ -472,7 +500,17 @@ void IndexStore::Close(bool keep) {
   if (in_transaction_) {
     if (keep) FlushIndexWrites();
     pending_index_.Clear();
-    writer_->Exec(keep ? "COMMIT" : "ROLLBACK");
+    // The store ends here: the directory is dropped, not updated, and only
+    // after the commit, so that no search builds it again from the rows before.
+    keys_.BeginCommit();
+    try {
+      writer_->Exec(keep ? "COMMIT" : "ROLLBACK");
+    } catch (...) {
+      keys_.EndCommit(false, false, key_changes_);
+      throw;
+    }
+    keys_.EndCommit(false, false, key_changes_);
+    key_changes_.clear();
     in_transaction_ = false;
   }
   {
@@ -545,6 +583,27 @@ void IndexStore::ReturnReader(std::unique_ptr<Database> reader) {
   if (readers_.size() < kMaxReaders) readers_.push_back(std::move(reader));
 }
 
+void IndexStore::BuildKeyDirectory(Database& reader) {
+  if (!keys_.TryStartBuild()) return;
+  const uint64_t at = keys_.generation();
+  bool complete = false;
+  try {
+    reader.Exec("BEGIN");
+    try {
+      auto scan = reader.Prepare("SELECT rowid, key FROM docs");
+      while (scan->Step()) keys_.Add(scan->Int(0), scan->Text(1));
+      complete = true;
+    } catch (...) {
+      reader.Exec("ROLLBACK");
+      throw;
+    }
+    reader.Exec("COMMIT");
+  } catch (const std::exception&) {
+    complete = false;  // searches read the keys from "docs"; a later one builds again
+  }
+  keys_.FinishBuild(at, complete);
+}
+
 SearchResult IndexStore::Search(const Query& query, const SortSpec& sort, size_t want, size_t check_budget,
                                 const ReadableFilter& readable) {
   const bool ranked = sort.by == SortSpec::By::kScore && query.HasRankedClause();
@@ -569,6 +628,9 @@ SearchResult IndexStore::Search(const Query& query, const SortSpec& sort, size_t
                           " FROM " + from + " WHERE " + condition + " ORDER BY " + order;
 
   std::unique_ptr<Database> reader = TakeReader();
+  const bool ranked_alone = ranked && condition == "1";
+  if (ranked_alone && !keys_.ready()) BuildKeyDirectory(*reader);
+  const uint64_t keys_at = keys_.generation();
   SearchResult result;
   // One read transaction: the hits, their documents and the count come from one snapshot.
   reader->Exec("BEGIN");
@@ -576,8 +638,10 @@ SearchResult IndexStore::Search(const Query& query, const SortSpec& sort, size_t
     // A word query alone (the usual search) is ordered from the full-text
     // index's scores; anything else by SQL.
     std::unique_ptr<SearchCandidates> candidates;
-    if (ranked && condition == "1") {
-      candidates = std::make_unique<RankedMatchCandidates>(*reader, query.RankedExpression());
+    if (ranked_alone) {
+      // The snapshot is taken by the first read, in the constructor: the
+      // directory serves it when no commit began before that.
+      candidates = std::make_unique<RankedMatchCandidates>(*reader, query.RankedExpression(), &keys_, keys_at);
     } else {
       auto select = reader->Prepare(sql);
       select->BindAll(values);

@@ -18,6 +18,7 @@
 #include <vector>
 
 #include "programs/corvelasticd/index_schema.h"
+#include "programs/corvelasticd/key_directory.h"
 #include "programs/corvelasticd/pending_index_writes.h"
 #include "programs/corvelasticd/query.h"
 #include "programs/corvelasticd/sqlite_db.h"
@@ -123,6 +124,11 @@ class IndexStore {
   // Runs a statement without parameters that returns no rows, kept prepared.
   void Run(const char* sql);
 
+  // The key of a changed row, for the key directory at commit.
+  void NoteKeyChange(int64_t rowid, std::optional<std::string> key);
+  // Fills the key directory from one snapshot of "docs" (once, by one reader).
+  void BuildKeyDirectory(Database& reader);
+
   // Reader pool.
   std::unique_ptr<Database> TakeReader();
   void ReturnReader(std::unique_ptr<Database> reader);
@@ -138,6 +144,10 @@ class IndexStore {
   PendingIndexWrites pending_index_;
   std::set<std::string> upserted_, deleted_;
   bool truncated_ = false;
+
+  KeyDirectory keys_;
+  std::vector<KeyDirectory::Change> key_changes_;  // of the open transaction
+  bool key_changes_complete_ = true;
 
   std::mutex readers_mutex_;
   std::vector<std::unique_ptr<Database>> readers_;

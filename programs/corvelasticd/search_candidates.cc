@@ -39,12 +39,15 @@ std::string KeysOfRowsSql() {
   return sql + ")";
 }
 
-RankedMatchCandidates::RankedMatchCandidates(Database& reader, const std::string& match)
-    : keys_of_rows_(reader.Cached(KeysOfRowsSql())) {
+RankedMatchCandidates::RankedMatchCandidates(Database& reader, const std::string& match, const KeyDirectory* keys,
+                                             uint64_t keys_at)
+    : keys_of_rows_(reader.Cached(KeysOfRowsSql())), keys_(keys), keys_at_(keys_at) {
   Statement& matches = reader.Cached("SELECT rowid, rank FROM fts_text WHERE fts_text MATCH ?");
   matches.BindText(1, match);
   while (matches.Step()) ranked_.emplace_back(matches.Real(1), matches.Int(0));
   matches.Reset();
+  // A commit begun before the snapshot was taken: the directory may be ahead of it.
+  if (keys_ != nullptr && keys_->generation() != keys_at_) keys_ = nullptr;
   // Equal scores keep no order of their own here: runs of them are put in key order below.
   std::sort(ranked_.begin(), ranked_.end(), [](const auto& a, const auto& b) { return a.first < b.first; });
 }
@@ -61,7 +64,19 @@ bool RankedMatchCandidates::LoadNextWindow() {
       slot.emplace(ranked_[i].second, window_.size());
       window_.push_back(Candidate{ranked_[i].first, ranked_[i].second, std::string(), false});
     }
-    for (size_t start = next_; start < end; start += kKeyWindow) {
+    std::vector<int64_t> rowids;
+    std::vector<std::optional<std::string>> known;
+    for (size_t i = next_; i < end; ++i) rowids.push_back(ranked_[i].second);
+    if (keys_ != nullptr && keys_->Lookup(keys_at_, rowids, &known)) {
+      for (size_t i = 0; i < known.size(); ++i) {
+        if (!known[i]) continue;
+        window_[i].key = std::move(*known[i]);
+        window_[i].found = true;
+      }
+    } else {
+      keys_ = nullptr;  // a commit came: from here on, from the snapshot itself
+    }
+    for (size_t start = next_; keys_ == nullptr && start < end; start += kKeyWindow) {
       keys_of_rows_.Reset();
       int bind = 1;
       for (size_t i = start; i < end && i < start + kKeyWindow; ++i) keys_of_rows_.Bind(bind++, ranked_[i].second);

@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "programs/corvelasticd/index_store.h"
+#include "programs/corvelasticd/key_directory.h"
 #include "programs/corvelasticd/sqlite_db.h"
 
 namespace corvlumex {
@@ -44,7 +45,9 @@ class StatementCandidates : public SearchCandidates {
 // statement.
 class RankedMatchCandidates : public SearchCandidates {
  public:
-  RankedMatchCandidates(Database& reader, const std::string& match);
+  // `keys` (may be null) gives the keys when it is at generation `keys_at`
+  // (the reader's snapshot), else they are read from "docs".
+  RankedMatchCandidates(Database& reader, const std::string& match, const KeyDirectory* keys, uint64_t keys_at);
   bool Next(int64_t* rowid, Hit* hit) override;
 
  private:
@@ -59,6 +62,8 @@ class RankedMatchCandidates : public SearchCandidates {
   bool LoadNextWindow();
 
   Statement& keys_of_rows_;
+  const KeyDirectory* keys_;
+  uint64_t keys_at_;
   std::vector<std::pair<double, int64_t>> ranked_;  // (rank, rowid), best (lowest rank) first
   size_t next_ = 0;
   std::vector<Candidate> window_;

@@ -107,6 +107,35 @@ TEST_F(CommandsTest, RelevanceOrdersEqualScoresByKeyOnEveryPageWhateverTheQueryS
   EXPECT_EQ(first["data"]["hits"][0]["score"].asDouble(), first["data"]["hits"][3]["score"].asDouble());
 }
 
+TEST_F(CommandsTest, WordSearchesFollowRenamesDeletesAndReusedRowsCommittedAfterEarlierSearches) {
+  // Searches keep the keys by row in memory once they have searched: they
+  // must follow each commit, and see nothing of what is not yet committed.
+  const std::string needle = R"({"match": {"_all": "needle"}})";
+  for (const char* name : {"a", "b", "c"}) Upsert(std::string("/volume1/share/") + name + ".txt", "needle");
+  Commit();
+  EXPECT_EQ(HitIds(Search(needle)), Ids({"/volume1/share/a.txt", "/volume1/share/b.txt", "/volume1/share/c.txt"}));
+  Json::Value rename;
+  rename["doc_id"] = "/volume1/share/b.txt";
+  rename["data"]["CORVMDPath"] = "/volume1/share/z.txt";
+  ASSERT_TRUE(Run("document_set_by_id", rename)["success"].asBool());
+  Json::Value remove;
+  remove["doc_id"] = "/volume1/share/c.txt";
+  ASSERT_EQ(Run("document_del_by_id", remove)["data"]["deleted"].asInt(), 1);
+  Upsert("/volume1/share/d.txt", "needle");  // takes the deleted last row's number
+  Json::Value missing;
+  missing["doc_id"] = "/volume1/share/none.txt";
+  missing["data"]["CORVMDPath"] = "/volume1/share/a.txt";
+  EXPECT_EQ(Run("document_set_by_id", missing)["error"]["code"].asInt(), 2020);
+  EXPECT_EQ(HitIds(Search(needle)), Ids({"/volume1/share/a.txt", "/volume1/share/b.txt", "/volume1/share/c.txt"}));
+  Commit();
+  EXPECT_EQ(HitIds(Search(needle)), Ids({"/volume1/share/a.txt", "/volume1/share/d.txt", "/volume1/share/z.txt"}));
+  // After a restart the keys are read again.
+  ASSERT_EQ(daemon_->Terminate(), 0);
+  daemon_->Start();
+  const Json::Value answer = WhileOpening([&] { return Search(needle); });
+  EXPECT_EQ(HitIds(answer), Ids({"/volume1/share/a.txt", "/volume1/share/d.txt", "/volume1/share/z.txt"}));
+}
+
 TEST_F(CommandsTest, UpsertReplacesTheWholeDocumentAndSetByIdMergesIntoAnExistingOne) {
   Upsert("/volume1/share/a.txt", "old words", 5);
   Upsert("/volume1/share/a.txt", "", 7);
