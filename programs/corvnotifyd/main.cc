@@ -4,8 +4,10 @@
 //   corvnotifyd [--foreground] [--config-dir DIR]
 //
 // SIGTERM or SIGINT stops it after every event read so far is written.
+#include <fcntl.h>
 #include <pthread.h>
 #include <signal.h>
+#include <sys/file.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -70,6 +72,16 @@ int main(int argc, char** argv) {
   }
   while (options.config_dir.size() > 1 && options.config_dir.back() == '/') options.config_dir.pop_back();
   ApplyTestHooks(&options);
+
+  // Two notifiers reading one configuration would append every change twice:
+  // the configuration folder stays locked while this one runs (the lock goes
+  // with the process, also into the background child).
+  const int config_lock = open(options.config_dir.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  if (config_lock >= 0 && flock(config_lock, LOCK_EX | LOCK_NB) != 0) {
+    fprintf(stderr, "corvnotifyd: another corvnotifyd already watches as configured in %s\n",
+            options.config_dir.c_str());
+    return 1;
+  }
 
   if (foreground) {
     corvlumex::SetLogSink([](int, const std::string& line) { fprintf(stderr, "corvnotifyd: %s\n", line.c_str()); });

@@ -66,6 +66,10 @@ class NotifydTest : public ::testing::Test {
 
 TEST_F(NotifydTest, FileChangesBecomeOneLineEachAndALargeCopyOneModify) {
   auto daemon = box_.Start();
+  // A second notifier on the same configuration would write every line twice.
+  auto second = box_.Run({"--foreground"});
+  EXPECT_TRUE(box_.WaitForLog("another corvnotifyd already watches as configured in"));
+  EXPECT_EQ(second->Stop(SIGTERM), 1) << "refused, not stopped";
   const std::string a = box_.docs() + "/a.txt";
   const std::string b = box_.docs() + "/b.txt";
   const std::string big = box_.docs() + "/big.bin";
