@@ -1,6 +1,7 @@
 #include "tests/state/fake_daemon.h"
 
 #include <sys/socket.h>
+#include <sys/time.h>
 #include <sys/un.h>
 #include <unistd.h>
 
@@ -67,6 +68,10 @@ void FakeDaemon::Serve() {
   for (;;) {
     const int client = accept4(listen_fd_, nullptr, nullptr, SOCK_CLOEXEC);
     if (client < 0) return;
+    // A client that never sends nor closes (the fault a test looks for) must
+    // not keep this thread, and the test that joins it, waiting forever.
+    const timeval read_limit{10, 0};
+    setsockopt(client, SOL_SOCKET, SO_RCVTIMEO, &read_limit, sizeof(read_limit));
     ReceivedFrame frame;
     if (ReadAll(client, &frame.length, sizeof(frame.length))) {
       frame.body.resize(frame.length);
