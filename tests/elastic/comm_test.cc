@@ -25,7 +25,7 @@ using testing_support::SleepRecorder;
 // Runs one exchange and returns the Error it threw (code 0 when none).
 Error ExchangeError(const Json::Value& req) {
   Json::Value res;
-  return testing_support::ErrorOf([&] { SendRequestImpl(res, req); });
+  return testing_support::ErrorOrNone([&] { SendRequestImpl(res, req); });
 }
 
 class SendRequestTest : public ::testing::Test {

@@ -21,7 +21,7 @@ namespace elastic {
 namespace {
 
 using testing_support::FakeAnswer;
-using testing_support::ErrorOf;
+using testing_support::ErrorOrNone;
 using testing_support::FakeSearchDaemon;
 using testing_support::JsonOf;
 using testing_support::LogCapture;
@@ -159,7 +159,7 @@ TEST_F(ElasticControlTest, DocumentThatCannotBeExtractedIsNotSent) {
   platform_->extract_fails = true;
   for (const auto& run : {std::function<void()>([] { IndexUpsert("music", "/volume1/music/x.pdf", false); }),
                           std::function<void()>([] { IndexAttr("music", "/volume1/music/x.pdf"); })}) {
-    const Error error = ErrorOf(run);
+    const Error error = ErrorOrNone(run);
     EXPECT_EQ(error.code, kErrorParseDocument);
     EXPECT_EQ(error.reason, "Parse failed, path=/volume1/music/x.pdf");
   }
@@ -200,7 +200,7 @@ TEST_F(ElasticControlTest, QueryAnswerWithoutADocumentListIs916) {
   daemon_.Enqueue(FakeAnswer::Success());
   daemon_.Enqueue(FakeAnswer::Success(JsonOf(R"({"CORVMDPath": "/v/s/a/x"})")));
   daemon_.Enqueue(FakeAnswer::Raw(R"({"success": true})"));
-  const Error error = ErrorOf([] { IndexRename("s", "/v/s/a", "/v/s/b"); });
+  const Error error = ErrorOrNone([] { IndexRename("s", "/v/s/a", "/v/s/b"); });
   EXPECT_EQ(error.code, kErrorQueryAnswer);
   EXPECT_EQ(daemon_.Requests().size(), 2u) << "nothing rewritten";
   std::vector<std::string> paths;
@@ -267,7 +267,7 @@ TEST_F(ElasticControlTest, BusySubRequestSendsTheWholeCompoundAgain) {
 
 TEST_F(ElasticControlTest, OtherFailuresAreNotRetried) {
   daemon_.Enqueue(FakeAnswer::Failure(1300, "no such index"));
-  const Error error = ErrorOf([] { ShareIndexResume("music"); });
+  const Error error = ErrorOrNone([] { ShareIndexResume("music"); });
   EXPECT_EQ(error.code, 1300);
   EXPECT_EQ(error.reason, "Request failed, msg=no such index");
   EXPECT_EQ(daemon_.Requests().size(), 1u);
@@ -278,7 +278,7 @@ TEST_F(ElasticControlTest, CommitFailureMarksTheShareOnlyOnAFullVolume) {
   for (const bool full : {false, true}) {
     platform_->volume_full = full;
     daemon_.Enqueue(FakeAnswer::Failure(1300, "write failed"));
-    const Error error = ErrorOf([] { IndexCommit("music"); });
+    const Error error = ErrorOrNone([] { IndexCommit("music"); });
     EXPECT_EQ(error.code, full ? kErrorNoSpace : 1300);
     EXPECT_EQ(error.reason, full ? "Share (music) space not enough" : "Request failed, msg=write failed");
     EXPECT_EQ(StatusMgr().GetShareStatus("music"), full ? 1u : 0u);

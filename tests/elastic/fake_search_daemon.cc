@@ -24,7 +24,7 @@ Json::Value JsonOf(const std::string& text) {
   return value;
 }
 
-Error ErrorOf(const std::function<void()>& action) {
+Error ErrorOrNone(const std::function<void()>& action) {
   try {
     action();
   } catch (const Error& error) {

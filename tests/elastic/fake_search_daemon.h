@@ -40,7 +40,7 @@ struct FakeAnswer {
 // (std::runtime_error when it is not JSON), and the Error that `action`
 // throws (code 0 when it throws none).
 Json::Value JsonOf(const std::string& text);
-Error ErrorOf(const std::function<void()>& action);
+Error ErrorOrNone(const std::function<void()>& action);
 
 // The default handler's answer: success, and for a compound request one
 // successful sub-answer per element with "has_fail": false.
