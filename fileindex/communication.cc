@@ -124,5 +124,21 @@ void SendCommandToDaemon(const std::string& command, const Json::Value& data) {
   if (length > 0) BufferRead(fd_socket, length, reply.data());
 }
 
+Json::Value FailureAnswer(int code, const std::string& message) {
+  Json::Value answer(Json::objectValue);
+  answer["success"] = false;
+  answer["error"]["code"] = code;
+  answer["error"]["msg"] = message;
+  return answer;
+}
+
+void OnStopSignals(void (*handler)(int)) {
+  struct sigaction action;
+  memset(&action, 0, sizeof(action));
+  action.sa_handler = handler;
+  sigaction(SIGTERM, &action, nullptr);
+  sigaction(SIGINT, &action, nullptr);
+}
+
 }  // namespace fileindex
 }  // namespace corvlumex

@@ -60,6 +60,14 @@ void BufferWrite(int fd, unsigned int size, const unsigned char* buffer);
 // One frame: 4-byte host-order length (counting a trailing NUL), then the
 // text and the NUL.
 void WriteFrame(int fd, const std::string& text);
+
+// The answer a daemon gives to a request it refuses:
+// {"success": false, "error": {"code": code, "msg": message}}.
+Json::Value FailureAnswer(int code, const std::string& message);
+
+// Routes SIGTERM and SIGINT of a daemon to `handler` (without SA_RESTART,
+// so a blocked accept or poll returns and the daemon can stop).
+void OnStopSignals(void (*handler)(int));
 // Reads one frame body; a trailing NUL, when present, is dropped.
 std::string ReadFrame(int fd);
 

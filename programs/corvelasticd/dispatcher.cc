@@ -4,6 +4,7 @@
 #include <unordered_map>
 
 #include "common/log.h"
+#include "fileindex/communication.h"
 #include "programs/corvelasticd/daemon_error.h"
 #include "programs/corvelasticd/json_text.h"
 #include "programs/corvelasticd/request_args.h"
@@ -12,14 +13,6 @@
 namespace corvlumex {
 namespace elasticd {
 namespace {
-
-Json::Value Failure(int code, const std::string& message) {
-  Json::Value answer(Json::objectValue);
-  answer["success"] = false;
-  answer["error"]["code"] = code;
-  answer["error"]["msg"] = message;
-  return answer;
-}
 
 Json::Value Success(Json::Value data) {
   Json::Value answer(Json::objectValue);
@@ -154,7 +147,7 @@ const std::unordered_map<std::string, CommandInfo>& Commands() {
 
 }  // namespace
 
-std::string Dispatcher::ErrorAnswer(int code, const std::string& message) { return JsonText(Failure(code, message)); }
+std::string Dispatcher::ErrorAnswer(int code, const std::string& message) { return JsonText(fileindex::FailureAnswer(code, message)); }
 
 bool Dispatcher::MayWrite(const PeerIdentity& peer) const {
   return peer.uid == 0 || std::find(options_.writer_uids.begin(), options_.writer_uids.end(), peer.uid) != options_.writer_uids.end();
@@ -167,11 +160,11 @@ std::string Dispatcher::Handle(const std::string& text, const PeerIdentity& peer
 }
 
 Json::Value Dispatcher::HandleRequest(const Json::Value& request, const PeerIdentity& peer, bool nested) {
-  if (!request.isObject()) return Failure(kCodeBadRequest, "The request must be a JSON object");
+  if (!request.isObject()) return fileindex::FailureAnswer(kCodeBadRequest, "The request must be a JSON object");
   if (request.isMember("compound")) {
-    if (nested) return Failure(kCodeBadRequest, "Compound requests cannot be nested");
+    if (nested) return fileindex::FailureAnswer(kCodeBadRequest, "Compound requests cannot be nested");
     const Json::Value& elements = request["compound"];
-    if (!elements.isArray()) return Failure(kCodeBadRequest, "\"compound\" must be an array of requests");
+    if (!elements.isArray()) return fileindex::FailureAnswer(kCodeBadRequest, "\"compound\" must be an array of requests");
     Json::Value answer(Json::objectValue);
     answer["success"] = true;
     answer["data"] = Json::Value(Json::arrayValue);
@@ -184,17 +177,17 @@ Json::Value Dispatcher::HandleRequest(const Json::Value& request, const PeerIden
     answer["has_fail"] = has_fail;
     return answer;
   }
-  if (!request["command"].isString()) return Failure(kCodeBadRequest, "The request has no string \"command\"");
+  if (!request["command"].isString()) return fileindex::FailureAnswer(kCodeBadRequest, "The request has no string \"command\"");
   const std::string command = request["command"].asString();
   const Json::Value& data = request["data"];
-  if (!data.isNull() && !data.isObject()) return Failure(kCodeBadRequest, "\"data\" must be an object");
+  if (!data.isNull() && !data.isObject()) return fileindex::FailureAnswer(kCodeBadRequest, "\"data\" must be an object");
   try {
     return Success(Run(command, data.isNull() ? Json::Value(Json::objectValue) : data, peer));
   } catch (const DaemonError& error) {
-    return Failure(error.code(), error.what());
+    return fileindex::FailureAnswer(error.code(), error.what());
   } catch (const std::exception& error) {
     CORV_LOG("%s failed unexpectedly: %s", command.c_str(), error.what());
-    return Failure(kCodeInternal, std::string("Internal error: ") + error.what());
+    return fileindex::FailureAnswer(kCodeInternal, std::string("Internal error: ") + error.what());
   }
 }
 

@@ -13,6 +13,7 @@
 
 #include "common/log.h"
 #include "common/sys.h"
+#include "fileindex/communication.h"
 #include "programs/corvelasticd/dispatcher.h"
 #include "programs/corvelasticd/index_registry.h"
 #include "programs/corvelasticd/server.h"
@@ -114,11 +115,7 @@ int main(int argc, char** argv) {
     Fail(error.what());
   }
   g_server = &server;
-  struct sigaction action;
-  memset(&action, 0, sizeof(action));
-  action.sa_handler = OnSignal;
-  sigaction(SIGTERM, &action, nullptr);
-  sigaction(SIGINT, &action, nullptr);
+  fileindex::OnStopSignals(OnSignal);
 
   registry.Start();
   CORV_LOG("corvelasticd serving %s", server_options.socket_path.c_str());

@@ -27,14 +27,6 @@ namespace {
 constexpr uint32_t kMaxRequestBytes = 1u << 20;
 constexpr int kRequestTimeoutMs = 5000;
 
-Json::Value Failure(int code, const std::string& message) {
-  Json::Value answer(Json::objectValue);
-  answer["success"] = false;
-  answer["error"]["code"] = code;
-  answer["error"]["msg"] = message;
-  return answer;
-}
-
 // Waits until a whole frame has arrived, so that reading it cannot block on
 // a client that went away in the middle. False for a client that closed,
 // sent too much or took too long.
@@ -162,11 +154,11 @@ void CommandServer::Serve(int fd) {
 std::string CommandServer::Answer(const std::string& text, uid_t uid) {
   Json::Value request;
   if (!JsonFromString(request, text) || !request.isObject() || !request["type"].isString()) {
-    return JsonToString(Failure(kErrorBadArgument, "The request must be a JSON object with a string \"type\""));
+    return JsonToString(fileindex::FailureAnswer(kErrorBadArgument, "The request must be a JSON object with a string \"type\""));
   }
   const std::string type = request["type"].asString();
   if (uid != 0 && uid != geteuid() && !read_only_(type)) {
-    return JsonToString(Failure(kErrorBadArgument, "\"" + type + "\" is allowed to root and the daemon's user only"));
+    return JsonToString(fileindex::FailureAnswer(kErrorBadArgument, "\"" + type + "\" is allowed to root and the daemon's user only"));
   }
   try {
     Json::Value answer(Json::objectValue);
@@ -174,9 +166,9 @@ std::string CommandServer::Answer(const std::string& text, uid_t uid) {
     answer["data"] = handler_(type, request["data"]);
     return JsonToString(answer);
   } catch (const Error& error) {
-    return JsonToString(Failure(error.code, error.reason));
+    return JsonToString(fileindex::FailureAnswer(error.code, error.reason));
   } catch (const std::exception& error) {
-    return JsonToString(Failure(kErrorUnexpected, error.what()));
+    return JsonToString(fileindex::FailureAnswer(kErrorUnexpected, error.what()));
   }
 }
 

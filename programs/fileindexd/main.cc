@@ -5,11 +5,11 @@
 
 #include <CLI/CLI.hpp>
 #include <cerrno>
-#include <cstring>
 #include <iostream>
 
 #include "common/log.h"
 #include "common/sys.h"
+#include "fileindex/communication.h"
 #include "fileindex/constants.h"
 #include "programs/fileindexd/command_server.h"
 #include "programs/fileindexd/daemon.h"
@@ -67,11 +67,7 @@ int main(int argc, char** argv) {
     return 1;
   }
   g_server = &server;
-  struct sigaction action;
-  memset(&action, 0, sizeof(action));
-  action.sa_handler = OnSignal;
-  sigaction(SIGTERM, &action, nullptr);
-  sigaction(SIGINT, &action, nullptr);
+  fileindex::OnStopSignals(OnSignal);
 
   daemon.Start();
   errno = 0;  // what the start-up left in errno is no failure of this line
