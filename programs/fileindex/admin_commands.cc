@@ -1,200 +1,150 @@
+// pause, resume, volume pause|resume, home enable|disable, user rename: one
+// function per subcommand. Each says what it changed, and what it found
+// already so.
 #include <json/json.h>
 #include <time.h>
 
 #include <iostream>
 
 #include "common/error.h"
-#include "fileindex/constants.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/status_mgr.h"
+#include "programs/fileindex/argument_checks.h"
 #include "programs/fileindex/commands.h"
 #include "programs/fileindex/daemon_client.h"
-#include "sdk/share.h"
 
 namespace corvlumex {
 namespace cli {
 namespace {
 
+std::string Joined(const std::vector<std::string>& names) {
+  std::string text;
+  for (const std::string& name : names) text += (text.empty() ? "" : ", ") + name;
+  return text;
+}
+
+void AddPause(CLI::App& app, Output& output) {
+  static int hours = 0;
+  CLI::App* command = app.add_subcommand("pause", "pause indexing (changes are kept and indexed on resume)");
+  command->add_option("--hours", hours, "resume by itself after this many hours (0: until resumed)")
+      ->check(CLI::NonNegativeNumber);
+  command->callback([&output] {
+    PrepareChange("pause");
+    fileindex::StatusMgr().Pause(hours);
+    const long long until = fileindex::StatusMgr().GetPauseInfo();
+    Done(output, hours == 0 ? "indexing paused until resumed (fileindex resume)"
+                            : "indexing paused until " + HumanTime(until) + " (fileindex resume ends it sooner)");
+  });
+}
+
+void AddResume(CLI::App& app, Output& output) {
+  app.add_subcommand("resume", "resume indexing")->callback([&output] {
+    PrepareChange("resume");
+    const long long before = fileindex::StatusMgr().GetPauseInfo();
+    const bool was_paused = before == 0 || (before > 0 && before > static_cast<long long>(time(nullptr)));
+    fileindex::StatusMgr().Resume();
+    Done(output, was_paused ? "indexing resumed" : "indexing was not paused; it goes on");
+  });
+}
+
+// Pauses or resumes every share on a volume, saying which changed.
+void ChangeVolume(const Output& output, const std::string& volume, bool pause) {
+  PrepareChange(pause ? "volume pause" : "volume resume");
+  const std::vector<std::string> shares = SharesOnVolume(volume);
+  std::vector<std::string> changed, unchanged;
+  const fileindex::StatusMgr before;
+  for (const std::string& share : shares) {
+    const bool paused = before.GetShareStatus(share) & fileindex::kShareStatusVolumePaused;
+    (paused == pause ? unchanged : changed).push_back(share);
+  }
+  if (pause) fileindex::VolumePause(volume);
+  else fileindex::VolumeResume(volume);
+  const std::string verb = pause ? "paused" : "resumed";
+  std::string message;
+  if (!changed.empty()) message = verb + " the shares on " + volume + ": " + Joined(changed);
+  if (!unchanged.empty()) {
+    message += (message.empty() ? "" : "; ") + std::string(pause ? "already paused: " : "not paused by the volume: ") +
+               Joined(unchanged);
+  }
+  Done(output, message);
+}
+
+void AddVolume(CLI::App& app, Output& output) {
+  static std::string path;
+  CLI::App* volume = app.add_subcommand("volume", "pause or resume indexing of every share on a volume");
+  volume->require_subcommand(1);
+  CLI::App* pause = volume->add_subcommand("pause", "pause the shares of a volume");
+  pause->add_option("path", path, "the volume's directory (/volume1)")->required();
+  pause->callback([&output] { ChangeVolume(output, path, true); });
+  CLI::App* resume = volume->add_subcommand("resume", "resume the shares of a volume");
+  resume->add_option("path", path, "the volume's directory (/volume1)")->required();
+  resume->callback([&output] { ChangeVolume(output, path, false); });
+}
+
+void AddHome(CLI::App& app, Output& output) {
+  CLI::App* home = app.add_subcommand("home", "follow the home folder service switched on or off");
+  home->require_subcommand(1);
+  auto change = [&output](bool enable) {
+    PrepareChange(enable ? "home enable" : "home disable");
+    const bool indexed = fileindex::FolderMgr().IsShareIndexed(fileindex::kHomesShare);
+    const bool disabled = fileindex::StatusMgr().GetShareStatus(fileindex::kHomesShare) & fileindex::kShareStatusHomeDisabled;
+    if (enable) fileindex::HomeEnable();
+    else fileindex::HomeDisable();
+    if (!indexed) return Done(output, "no home folder is indexed: nothing to " + std::string(enable ? "resume" : "suspend"));
+    if (enable == !disabled) return Done(output, std::string("home folders were already ") + (enable ? "indexed" : "suspended"));
+    Done(output, enable ? "home folders indexed again" : "home folders suspended");
+  };
+  home->add_subcommand("enable", "the home service was switched on")->callback([change] { change(true); });
+  home->add_subcommand("disable", "the home service was switched off")->callback([change] { change(false); });
+}
+
+void AddUser(CLI::App& app, Output& output) {
+  static std::string from, to;
+  CLI::App* user = app.add_subcommand("user", "follow a renamed user");
+  user->require_subcommand(1);
+  CLI::App* rename = user->add_subcommand("rename", "the user's home folder moved with the new name");
+  rename->add_option("from", from, "the old user name")->required();
+  rename->add_option("to", to, "the new user name")->required();
+  rename->callback([&output] {
+    PrepareChange("user rename");
+    if (from == to) throw Error(kErrorBadArgument, "the old and the new user name are the same: " + from);
+    const std::string home = std::string("/") + fileindex::kHomesShare + "/" + from;
+    size_t moved = 0;
+    const fileindex::FolderMgr configured;
+    for (const auto& folder : configured.Folders()) {
+      const std::string& path = folder->GetPath();
+      if (path == home || path.compare(0, home.size() + 1, home + "/") == 0) ++moved;
+    }
+    if (moved == 0) throw Error(kErrorFolderNotFound, "no indexed folder lies in the home of " + from + " (" + home + ")");
+    fileindex::UserRename(from, to);
+    Done(output, "moved " + std::to_string(moved) + " folder(s) of " + from + " to the home of " + to);
+  });
+}
+
+}  // namespace
+
+void PrepareChange(const std::string& command) {
+  RequireRoot(command);
+  RequireRunning(Daemon::kIndexer, "nothing was changed");
+}
+
 void Done(const Output& output, const std::string& message) {
   if (output.json) {
     Json::Value out(Json::objectValue);
     out["success"] = true;
+    out["message"] = message;
     return PrintJson(out);
   }
   std::cout << message << "\n";
 }
 
-std::string PauseText(long long resume_time) {
-  if (resume_time == 0) return "paused until resumed";
-  if (resume_time > 0 && resume_time > static_cast<long long>(time(nullptr))) {
-    return "paused until " + HumanTime(resume_time);
-  }
-  return "running";
-}
-
-std::string ShareFlags(unsigned int flags) {
-  std::string text;
-  auto add = [&text](const char* word) { text += text.empty() ? word : std::string(", ") + word; };
-  if (flags & fileindex::kShareStatusNeedReindex) add("needs reindex");
-  if (flags & fileindex::kShareStatusPaused) add("paused");
-  if (flags & fileindex::kShareStatusVolumePaused) add("volume paused");
-  if (flags & fileindex::kShareStatusHomeDisabled) add("home service off");
-  return text.empty() ? "-" : text;
-}
-
-void Status(const Output& output) {
-  const fileindex::StatusMgr status;
-  const fileindex::FolderMgr folders;
-  Json::Value daemon;
-  std::string daemon_error;
-  try {
-    daemon = AskDaemon("status", Json::Value(Json::objectValue));
-  } catch (const Error& error) {
-    daemon_error = error.reason;
-  }
-  Json::Value out(Json::objectValue);
-  out["resume_time"] = static_cast<Json::Int64>(status.GetPauseInfo());
-  out["daemon_running"] = daemon_error.empty();
-  if (!daemon_error.empty()) out["daemon_error"] = daemon_error;
-  Json::Value shares(Json::objectValue);
-  for (const std::string& share : folders.GetIndexedShares()) {
-    Json::Value entry = daemon["shares"][share].isObject() ? daemon["shares"][share] : Json::Value(Json::objectValue);
-    entry["flags"] = status.GetShareStatus(share);
-    if (!entry.isMember("state")) entry["state"] = daemon_error.empty() ? "no worker" : "-";
-    shares[share] = entry;
-  }
-  out["shares"] = shares;
-  if (output.json) return PrintJson(out);
-
-  std::cout << "indexing: " << PauseText(status.GetPauseInfo()) << "\n";
-  std::cout << "fileindexd: " << (daemon_error.empty() ? "running" : daemon_error) << "\n";
-  std::vector<std::vector<std::string>> rows;
-  for (const std::string& share : shares.getMemberNames()) {
-    const Json::Value& entry = shares[share];
-    const bool busy = entry["state"].asString() == "indexing";
-    rows.push_back({share, entry["state"].asString(),
-                    busy ? std::to_string(entry["done"].asUInt64()) + "/" + std::to_string(entry["todo"].asUInt64()) : "-",
-                    busy ? HumanDuration(entry["eta_seconds"].asDouble()) : "-",
-                    std::to_string(entry["total_done"].asUInt64()), std::to_string(entry["total_failed"].asUInt64()),
-                    HumanSize(entry["queued_bytes"].asInt64()), ShareFlags(entry["flags"].asUInt())});
-  }
-  if (rows.empty()) {
-    std::cout << "no folder is indexed (fileindex folder add PATH)\n";
-    return;
-  }
-  PrintTable({"SHARE", "STATE", "DONE/TODO", "LEFT", "INDEXED", "FAILED", "QUEUED", "FLAGS"}, rows);
-}
-
-}  // namespace
-
 void AddAdminCommands(CLI::App& app, Output& output) {
-  static int hours = 0;
-  CLI::App* pause = app.add_subcommand("pause", "pause indexing (changes are kept and indexed on resume)");
-  pause->add_option("--hours", hours, "resume by itself after this many hours (0: until resumed)")
-      ->check(CLI::NonNegativeNumber);
-  pause->callback([&output] {
-    fileindex::StatusMgr().Pause(hours);
-    Done(output, hours == 0 ? "indexing paused until resumed" : "indexing paused for " + std::to_string(hours) + " hour(s)");
-  });
-  app.add_subcommand("resume", "resume indexing")->callback([&output] {
-    fileindex::StatusMgr().Resume();
-    Done(output, "indexing resumed");
-  });
-  app.add_subcommand("status", "pause state and each share's indexing progress")->callback([&output] { Status(output); });
-
-  // Shares.
-  CLI::App* share = app.add_subcommand("share", "share operations: list, pause, resume, rename, migrate, check-recycle");
-  share->require_subcommand(1);
-  share->add_subcommand("list", "the shares and whether they are indexed")->callback([&output] {
-    const fileindex::FolderMgr folders;
-    const fileindex::StatusMgr status;
-    Json::Value out(Json::arrayValue);
-    std::vector<std::vector<std::string>> rows;
-    for (const std::string& name : sdk::SDKShare::Enum()) {
-      const sdk::SDKShare record(name);
-      Json::Value entry(Json::objectValue);
-      entry["name"] = name;
-      entry["path"] = record.GetPath();
-      entry["indexed"] = folders.IsShareIndexed(name);
-      entry["flags"] = status.GetShareStatus(name);
-      out.append(entry);
-      rows.push_back({name, record.GetPath(), YesNo(folders.IsShareIndexed(name)), ShareFlags(status.GetShareStatus(name))});
-    }
-    if (output.json) return PrintJson(out);
-    PrintTable({"SHARE", "PATH", "INDEXED", "FLAGS"}, rows);
-  });
-  static std::string share_name, share_to, path_from, path_to;
-  CLI::App* share_pause = share->add_subcommand("pause", "pause indexing of one share");
-  share_pause->add_option("name", share_name, "the share")->required();
-  share_pause->callback([&output] {
-    fileindex::SharePause(share_name);
-    Done(output, "share " + share_name + " paused");
-  });
-  CLI::App* share_resume = share->add_subcommand("resume", "resume indexing of one share");
-  share_resume->add_option("name", share_name, "the share")->required();
-  share_resume->callback([&output] {
-    fileindex::ShareResume(share_name);
-    Done(output, "share " + share_name + " resumed");
-  });
-  CLI::App* share_rename = share->add_subcommand("rename", "follow a share renamed in the share registry");
-  share_rename->add_option("from", share_name, "the old name")->required();
-  share_rename->add_option("to", share_to, "the new name")->required();
-  share_rename->callback([&output] {
-    fileindex::ShareRename(share_name, share_to);
-    Done(output, "share " + share_name + " is now " + share_to);
-  });
-  CLI::App* share_migrate = share->add_subcommand("migrate", "follow a share moved to another volume");
-  share_migrate->add_option("name", share_name, "the share")->required();
-  share_migrate->add_option("from", path_from, "its old directory")->required();
-  share_migrate->add_option("to", path_to, "its new directory")->required();
-  share_migrate->callback([&output] {
-    fileindex::ShareMigrate(share_name, path_from, path_to);
-    Done(output, "share " + share_name + " moved to " + path_to);
-  });
-  CLI::App* share_recycle = share->add_subcommand("check-recycle", "follow a share's recycle bin switched on or off");
-  share_recycle->add_option("name", share_name, "the share")->required();
-  share_recycle->callback([&output] {
-    fileindex::ShareCheckRecycle(share_name);
-    Done(output, "recycle bin of " + share_name + " checked");
-  });
-
-  // Volumes, home folders, users.
-  static std::string volume_path;
-  CLI::App* volume = app.add_subcommand("volume", "pause or resume indexing of every share on a volume");
-  volume->require_subcommand(1);
-  CLI::App* volume_pause = volume->add_subcommand("pause", "pause the shares of a volume");
-  volume_pause->add_option("path", volume_path, "the volume's directory (/volume1)")->required();
-  volume_pause->callback([&output] {
-    fileindex::VolumePause(volume_path);
-    Done(output, "shares on " + volume_path + " paused");
-  });
-  CLI::App* volume_resume = volume->add_subcommand("resume", "resume the shares of a volume");
-  volume_resume->add_option("path", volume_path, "the volume's directory (/volume1)")->required();
-  volume_resume->callback([&output] {
-    fileindex::VolumeResume(volume_path);
-    Done(output, "shares on " + volume_path + " resumed");
-  });
-  CLI::App* home = app.add_subcommand("home", "follow the home folder service switched on or off");
-  home->require_subcommand(1);
-  home->add_subcommand("enable", "the home service was switched on")->callback([&output] {
-    fileindex::HomeEnable();
-    Done(output, "home folders indexed again");
-  });
-  home->add_subcommand("disable", "the home service was switched off")->callback([&output] {
-    fileindex::HomeDisable();
-    Done(output, "home folders suspended");
-  });
-  static std::string user_from, user_to;
-  CLI::App* user = app.add_subcommand("user", "follow a renamed user");
-  user->require_subcommand(1);
-  CLI::App* user_rename = user->add_subcommand("rename", "the user's home folder moved with the new name");
-  user_rename->add_option("from", user_from, "the old user name")->required();
-  user_rename->add_option("to", user_to, "the new user name")->required();
-  user_rename->callback([&output] {
-    fileindex::UserRename(user_from, user_to);
-    Done(output, "folders of " + user_from + " moved to " + user_to);
-  });
+  AddPause(app, output);
+  AddResume(app, output);
+  AddVolume(app, output);
+  AddHome(app, output);
+  AddUser(app, output);
 }
 
 }  // namespace cli

@@ -1,32 +1,99 @@
 #include "programs/fileindex/cli_output.h"
 
+#include <stdlib.h>
 #include <time.h>
+#include <unistd.h>
+#include <utf8proc.h>
 
 #include <algorithm>
 #include <cstdio>
 #include <iostream>
 #include <memory>
 
+#include "common/error.h"
+
 namespace corvlumex {
 namespace cli {
 
 void PrintTable(const std::vector<std::string>& header, const std::vector<std::vector<std::string>>& rows) {
+  std::vector<std::vector<std::string>> cells;
+  cells.push_back(header);
+  for (const auto& row : rows) {
+    std::vector<std::string> shown;
+    for (const std::string& cell : row) shown.push_back(Printable(cell));
+    cells.push_back(shown);
+  }
   std::vector<size_t> widths(header.size(), 0);
-  auto measure = [&widths](const std::vector<std::string>& row) {
-    for (size_t i = 0; i < row.size() && i < widths.size(); ++i) widths[i] = std::max(widths[i], row[i].size());
-  };
-  measure(header);
-  for (const auto& row : rows) measure(row);
-  auto print = [&widths](const std::vector<std::string>& row) {
+  for (const auto& row : cells) {
+    for (size_t i = 0; i < row.size() && i < widths.size(); ++i) widths[i] = std::max(widths[i], DisplayWidth(row[i]));
+  }
+  for (const auto& row : cells) {
     std::string line;
     for (size_t i = 0; i < row.size() && i < widths.size(); ++i) {
       line += row[i];
-      if (i + 1 < row.size()) line += std::string(widths[i] - row[i].size() + 2, ' ');
+      if (i + 1 < row.size()) line += std::string(widths[i] - DisplayWidth(row[i]) + 2, ' ');
     }
     std::cout << line << "\n";
-  };
-  print(header);
-  for (const auto& row : rows) print(row);
+  }
+}
+
+size_t DisplayWidth(const std::string& text) {
+  size_t width = 0;
+  const auto* bytes = reinterpret_cast<const utf8proc_uint8_t*>(text.data());
+  utf8proc_ssize_t offset = 0;
+  const auto size = static_cast<utf8proc_ssize_t>(text.size());
+  while (offset < size) {
+    utf8proc_int32_t code_point = 0;
+    const utf8proc_ssize_t length = utf8proc_iterate(bytes + offset, size - offset, &code_point);
+    if (length <= 0) {
+      ++width;
+      ++offset;
+      continue;
+    }
+    width += static_cast<size_t>(std::max(0, utf8proc_charwidth(code_point)));
+    offset += length;
+  }
+  return width;
+}
+
+std::string Printable(const std::string& text) {
+  std::string shown;
+  const auto* bytes = reinterpret_cast<const utf8proc_uint8_t*>(text.data());
+  utf8proc_ssize_t offset = 0;
+  const auto size = static_cast<utf8proc_ssize_t>(text.size());
+  while (offset < size) {
+    utf8proc_int32_t code_point = 0;
+    const utf8proc_ssize_t length = utf8proc_iterate(bytes + offset, size - offset, &code_point);
+    const bool control = length > 0 && utf8proc_category(code_point) == UTF8PROC_CATEGORY_CC;
+    if (length > 0 && !control) {
+      shown.append(text, static_cast<size_t>(offset), static_cast<size_t>(length));
+      offset += length;
+      continue;
+    }
+    const unsigned char byte = bytes[offset];
+    if (byte == '\n') shown += "\\n";
+    else if (byte == '\t') shown += "\\t";
+    else if (byte == '\r') shown += "\\r";
+    else {
+      // C1 controls are two bytes; each is shown.
+      const utf8proc_ssize_t count = length > 0 ? length : 1;
+      for (utf8proc_ssize_t i = 0; i < count; ++i) {
+        char hex[8];
+        snprintf(hex, sizeof(hex), "\\x%02x", bytes[offset + i]);
+        shown += hex;
+      }
+      offset += count;
+      continue;
+    }
+    ++offset;
+  }
+  return shown;
+}
+
+bool UseColour() {
+  const char* no_colour = getenv("NO_COLOR");
+  if (no_colour != nullptr && no_colour[0] != '\0') return false;
+  return isatty(STDOUT_FILENO) == 1;
 }
 
 void PrintJson(const Json::Value& value) {
@@ -38,8 +105,27 @@ void PrintJson(const Json::Value& value) {
   std::cout << std::endl;
 }
 
-void PrintError(const Output& output, int code, const std::string& reason) {
-  std::cerr << "fileindex: error " << code << ": " << reason << std::endl;
+std::string CodeMeaning(int code) {
+  switch (code) {
+    case kErrorBadArgument: return "bad argument";
+    case kErrorShareNotFound: return "no such share (fileindex share list shows the shares)";
+    case kErrorUserLookup: return "no such user";
+    case kErrorFolderNotFound: return "not an indexed folder (fileindex folder list shows them)";
+    case kErrorPathCannotIndex: return "this path cannot be indexed";
+    case kErrorDuplicatedId: return "already indexed";
+    case kErrorSearchRequest: return "the search daemon corvelasticd did not answer";
+    case kErrorNoSpace: return "the volume is full";
+    case kErrorLoadJson: return "a configuration file cannot be read";
+    case kErrorSaveJson: return "a configuration file cannot be written";
+    case kErrorLockFile: return "a lock file cannot be taken";
+    case kErrorSwitchUser: return "this needs root";
+    default: return "failed without a reason (fileindex -v ... shows the library's log lines)";
+  }
+}
+
+void PrintError(const Output& output, int code, const std::string& given_reason) {
+  const std::string reason = given_reason.empty() ? CodeMeaning(code) : given_reason;
+  std::cerr << "fileindex: error " << code << ": " << Printable(reason) << std::endl;
   if (output.json) {
     Json::Value error(Json::objectValue);
     error["success"] = false;

@@ -12,10 +12,22 @@ namespace cli {
 
 // folder list|get|add|set|delete|reindex
 void AddFolderCommands(CLI::App& app, Output& output);
-// pause, resume, status, share ..., volume ..., home ..., user rename
+// pause, resume, volume ..., home ..., user rename
 void AddAdminCommands(CLI::App& app, Output& output);
+// share list|pause|resume|rename|migrate|check-recycle
+void AddShareCommands(CLI::App& app, Output& output);
+// status
+void AddStatusCommand(CLI::App& app, Output& output);
 // search, suggest, extract
 void AddSearchCommands(CLI::App& app, Output& output);
+
+// Root and a running fileindexd, before a command that changes the
+// configuration and tells fileindexd: a refusal changes nothing.
+void PrepareChange(const std::string& command);
+// A share's status bits in words ("paused (fileindex share resume)").
+std::string ShareFlags(unsigned int flags);
+// "share X paused" for people, {"success": true, "message"} with --json.
+void Done(const Output& output, const std::string& message);
 
 }  // namespace cli
 }  // namespace corvlumex

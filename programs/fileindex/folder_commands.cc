@@ -1,11 +1,17 @@
+// folder list|get|add|set|delete|reindex: one function per subcommand. Each
+// changing command checks its arguments and that fileindexd runs before it
+// calls the operation, so a refusal leaves everything as it was.
 #include <json/json.h>
 
 #include <iostream>
 
 #include "common/error.h"
 #include "common/file_util.h"
+#include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr.h"
+#include "programs/fileindex/argument_checks.h"
 #include "programs/fileindex/commands.h"
+#include "programs/fileindex/daemon_client.h"
 #include "programs/fileindex/folder_support.h"
 
 namespace corvlumex {
@@ -34,7 +40,13 @@ void AddCategoryOptions(CLI::App* command, FolderArgs& args) {
   command->add_option("--photo", args.photo, "index photos: on|off")->check(check);
 }
 
-void PrintFolders(const Output& output, const Json::Value& folders, bool with_status) {
+void AddWaitOptions(CLI::App* command, FolderArgs& args, const std::string& what) {
+  command->add_flag("--wait", args.wait, "wait until " + what + ", showing progress");
+  command->add_option("--timeout", args.timeout, "with --wait: give up after this many seconds (0: never)")
+      ->check(CLI::NonNegativeNumber);
+}
+
+void PrintFolders(const Json::Value& folders, bool with_status) {
   std::vector<std::vector<std::string>> rows;
   for (const Json::Value& folder : folders) {
     std::vector<std::string> row = {folder["path"].asString(), folder["name"].asString(),
@@ -43,96 +55,129 @@ void PrintFolders(const Output& output, const Json::Value& folders, bool with_st
     if (with_status) row.push_back(folder["additional"]["status"]["text"].asString());
     rows.push_back(row);
   }
-  (void)output;
   std::vector<std::string> header = {"PATH", "NAME", "DOCUMENT", "AUDIO", "VIDEO", "PHOTO"};
   if (with_status) header.push_back("STATUS");
   PrintTable(header, rows);
 }
 
-Json::Value PathList(const std::vector<std::string>& paths) {
+Json::Value JsonList(const std::vector<std::string>& paths) {
   Json::Value list(Json::arrayValue);
-  for (const std::string& path : paths) list.append(ToSharePath(path));
+  for (const std::string& path : paths) list.append(path);
   return list;
 }
 
-}  // namespace
+// What a changing command did, then (with --wait) the wait: one line per
+// folder for people, {"success", "paths", "indexed"} for scripts. Throws
+// when the wait ended before the folders were indexed.
+void Finish(const Output& output, const std::string& verb, const std::vector<std::string>& paths,
+            const FolderArgs& args) {
+  if (!output.json) {
+    for (const std::string& path : paths) std::cout << verb << " " << path << "\n";
+  }
+  const bool indexed = !args.wait || WaitForIndexing(paths, args.timeout, output.json);
+  if (output.json) {
+    Json::Value out(Json::objectValue);
+    out["success"] = true;
+    out["paths"] = JsonList(paths);
+    if (args.wait) out["indexed"] = indexed;
+    PrintJson(out);
+  }
+  if (!indexed) {
+    throw Error(kErrorUnexpected, "stopped waiting before " + (paths.size() == 1 ? paths[0] + " was" : "the folders were") +
+                                      " indexed; indexing goes on (fileindex status shows it)");
+  }
+}
 
-void AddFolderCommands(CLI::App& app, Output& output) {
-  CLI::App* folder = app.add_subcommand("folder", "indexed folders: list, get, add, set, delete, reindex");
-  folder->require_subcommand(1);
-
+void AddList(CLI::App* folder, Output& output) {
   static struct {
     unsigned offset = 0, limit = 0;
     std::string sort;
     bool desc = false;
   } list;
-  CLI::App* list_cmd = folder->add_subcommand("list", "list the indexed folders with their status");
-  list_cmd->add_option("--offset", list.offset, "skip this many folders");
-  list_cmd->add_option("--limit", list.limit, "show at most this many (0: all)");
-  list_cmd->add_option("--sort", list.sort, "sort by path, name, document, audio, video, photo, paused");
-  list_cmd->add_flag("--desc", list.desc, "sort descending");
-  list_cmd->callback([&output] {
+  CLI::App* command = folder->add_subcommand("list", "list the indexed folders with their status");
+  command->add_option("--offset", list.offset, "skip this many folders");
+  command->add_option("--limit", list.limit, "show at most this many (0: all)");
+  command->add_option("--sort", list.sort, "sort by this key")
+      ->check(CLI::IsMember({"path", "name", "document", "audio", "video", "photo", "paused"}));
+  command->add_flag("--desc", list.desc, "sort descending");
+  command->callback([&output] {
     Json::Value out, additional(Json::arrayValue);
     additional.append("status");
     fileindex::FolderList(out, list.offset, list.limit, list.sort, list.sort.empty() ? "" : (list.desc ? "DESC" : "ASC"),
                           additional);
     if (output.json) return PrintJson(out);
-    PrintFolders(output, out["folder"], true);
+    if (out["total"].asUInt() == 0) {
+      std::cout << "no folder is indexed (fileindex folder add FOLDER)\n";
+      return;
+    }
+    PrintFolders(out["folder"], true);
     std::cout << out["total"].asUInt() << " folder(s)\n";
   });
+}
 
-  static std::string get_path;
-  CLI::App* get_cmd = folder->add_subcommand("get", "show one indexed folder");
-  get_cmd->add_option("path", get_path, "the folder (/share/dir or its full path)")->required();
-  get_cmd->callback([&output] {
+void AddGet(CLI::App* folder, Output& output) {
+  static std::string path;
+  CLI::App* command = folder->add_subcommand("get", "show one indexed folder");
+  command->add_option("path", path, "the folder (/share/dir or its full path)")->required();
+  command->callback([&output] {
     Json::Value out;
-    fileindex::FolderGet(out, ToSharePath(get_path));
+    fileindex::FolderGet(out, ConfiguredFolder(path));
     if (output.json) return PrintJson(out);
     Json::Value list(Json::arrayValue);
     list.append(out);
-    PrintFolders(output, list, false);
+    PrintFolders(list, false);
   });
+}
 
+void AddAdd(CLI::App* folder, Output& output) {
   static FolderArgs add;
-  CLI::App* add_cmd = folder->add_subcommand("add", "index a folder (every category on unless switched off)");
-  add_cmd->add_option("path", add.path, "the folder (/share/dir or its full path)")->required();
-  add_cmd->add_option("--name", add.name, "display name (default: the folder's name)");
-  AddCategoryOptions(add_cmd, add);
-  add_cmd->add_flag("--wait", add.wait, "wait until the folder is indexed, showing progress");
-  add_cmd->add_option("--timeout", add.timeout, "with --wait: give up after this many seconds (0: never)");
-  add_cmd->callback([&output] {
-    const std::string path = ToSharePath(add.path);
-    Json::Value folder(Json::objectValue);
-    folder["path"] = path;
-    folder["name"] = add.name.empty() ? Basename(path) : add.name;
-    folder["document"] = OnOff(add.document, true);
-    folder["audio"] = OnOff(add.audio, true);
-    folder["video"] = OnOff(add.video, true);
-    folder["photo"] = OnOff(add.photo, true);
-    Json::Value list(Json::arrayValue);
-    list.append(folder);
-    fileindex::FolderAdd(list, false);
-    if (!output.json) std::cout << "added " << path << "\n";
-    const bool done = !add.wait || WaitForIndexing({path}, add.timeout, output.json);
-    if (output.json) {
-      Json::Value out(Json::objectValue);
-      out["success"] = true;
-      out["path"] = path;
-      if (add.wait) out["indexed"] = done;
-      PrintJson(out);
+  CLI::App* command = folder->add_subcommand("add", "index a folder (every category on unless switched off)");
+  command->add_option("path", add.path, "the folder (/share/dir or its full path)")->required();
+  command->add_option("--name", add.name, "display name (default: the folder's name)");
+  AddCategoryOptions(command, add);
+  AddWaitOptions(command, add, "the folder is indexed");
+  command->callback([&output] {
+    // Only the first folder may be added while fileindexd is down: the
+    // library starts the services then.
+    RequireRoot("folder add");
+    if (!fileindex::FolderMgr().Folders().empty()) PrepareChange("folder add");
+    const std::string path = ExistingFolder(add.path);
+    if (fileindex::FolderMgr().HasFolder(path)) {
+      throw Error(kErrorDuplicatedId, path + " is already indexed (fileindex folder set " + path +
+                                          " changes it, fileindex folder reindex " + path + " indexes it again)");
     }
-    if (!done) throw Error(kErrorUnexpected, "stopped waiting before " + path + " was indexed");
+    Json::Value entry(Json::objectValue);
+    entry["path"] = path;
+    entry["name"] = add.name.empty() ? Basename(path) : add.name;
+    entry["document"] = OnOff(add.document, true);
+    entry["audio"] = OnOff(add.audio, true);
+    entry["video"] = OnOff(add.video, true);
+    entry["photo"] = OnOff(add.photo, true);
+    Json::Value list(Json::arrayValue);
+    list.append(entry);
+    try {
+      fileindex::FolderAdd(list, false);
+    } catch (const Error& error) {
+      // The first folder starts fileindexd; when it did not come up, the
+      // folder is configured all the same and is indexed once it runs.
+      if (!fileindex::FolderMgr().HasFolder(path) || DaemonRunning(Daemon::kIndexer)) throw;
+      throw Error(error.code, path + " was added to the configuration, but " + NotRunningText(Daemon::kIndexer) +
+                                  "; it indexes the folder when it starts");
+    }
+    Finish(output, "added", {path}, add);
   });
+}
 
+void AddSet(CLI::App* folder, Output& output) {
   static FolderArgs set;
-  CLI::App* set_cmd = folder->add_subcommand("set", "change an indexed folder's name or categories");
-  set_cmd->add_option("path", set.path, "the folder (/share/dir or its full path)")->required();
-  set_cmd->add_option("--name", set.name, "new display name");
-  AddCategoryOptions(set_cmd, set);
-  set_cmd->add_flag("--wait", set.wait, "wait until the change is applied, showing progress");
-  set_cmd->add_option("--timeout", set.timeout, "with --wait: give up after this many seconds (0: never)");
-  set_cmd->callback([&output] {
-    const std::string path = ToSharePath(set.path);
+  CLI::App* command = folder->add_subcommand("set", "change an indexed folder's name or categories");
+  command->add_option("path", set.path, "the folder (/share/dir or its full path)")->required();
+  command->add_option("--name", set.name, "new display name");
+  AddCategoryOptions(command, set);
+  AddWaitOptions(command, set, "the change is applied");
+  command->callback([&output] {
+    PrepareChange("folder set");
+    const std::string path = ConfiguredFolder(set.path);
     Json::Value current;
     fileindex::FolderGet(current, path);
     current["name"] = set.name.empty() ? current["name"].asString() : set.name;
@@ -143,50 +188,47 @@ void AddFolderCommands(CLI::App& app, Output& output) {
     Json::Value list(Json::arrayValue);
     list.append(current);
     fileindex::FolderSet(list, false);
-    if (!output.json) std::cout << "changed " << path << "\n";
-    const bool done = !set.wait || WaitForIndexing({path}, set.timeout, output.json);
-    if (output.json) {
-      Json::Value out(Json::objectValue);
-      out["success"] = true;
-      out["path"] = path;
-      PrintJson(out);
-    }
-    if (!done) throw Error(kErrorUnexpected, "stopped waiting before " + path + " was indexed");
+    Finish(output, "changed", {path}, set);
   });
+}
 
-  static std::vector<std::string> delete_paths;
-  CLI::App* delete_cmd = folder->add_subcommand("delete", "stop indexing folders and remove their documents");
-  delete_cmd->add_option("paths", delete_paths, "the folders (/share/dir or full paths)")->required();
-  delete_cmd->callback([&output] {
-    fileindex::FolderDelete(PathList(delete_paths));
-    if (output.json) {
-      Json::Value out(Json::objectValue);
-      out["success"] = true;
-      return PrintJson(out);
-    }
-    for (const auto& path : delete_paths) std::cout << "deleted " << ToSharePath(path) << "\n";
+void AddDelete(CLI::App* folder, Output& output) {
+  static std::vector<std::string> paths;
+  CLI::App* command = folder->add_subcommand("delete", "stop indexing folders and remove their documents");
+  command->add_option("paths", paths, "the folders (/share/dir or full paths)")->required();
+  command->callback([&output] {
+    PrepareChange("folder delete");
+    const std::vector<std::string> checked = ConfiguredFolders(paths);
+    fileindex::FolderDelete(JsonList(checked));
+    Finish(output, "deleted", checked, FolderArgs());
   });
+}
 
+void AddReindex(CLI::App* folder, Output& output) {
   static FolderArgs reindex;
-  static std::vector<std::string> reindex_paths;
-  CLI::App* reindex_cmd = folder->add_subcommand("reindex", "index folders again from what is on disk");
-  reindex_cmd->add_option("paths", reindex_paths, "the folders (/share/dir or full paths)")->required();
-  reindex_cmd->add_flag("--wait", reindex.wait, "wait until they are indexed, showing progress");
-  reindex_cmd->add_option("--timeout", reindex.timeout, "with --wait: give up after this many seconds (0: never)");
-  reindex_cmd->callback([&output] {
-    const Json::Value list = PathList(reindex_paths);
-    fileindex::FolderReindex(list);
-    std::vector<std::string> paths;
-    for (const Json::Value& path : list) paths.push_back(path.asString());
-    if (!output.json) std::cout << "reindexing " << paths.size() << " folder(s)\n";
-    const bool done = !reindex.wait || WaitForIndexing(paths, reindex.timeout, output.json);
-    if (output.json) {
-      Json::Value out(Json::objectValue);
-      out["success"] = true;
-      PrintJson(out);
-    }
-    if (!done) throw Error(kErrorUnexpected, "stopped waiting before the folders were indexed");
+  static std::vector<std::string> paths;
+  CLI::App* command = folder->add_subcommand("reindex", "index folders again from what is on disk");
+  command->add_option("paths", paths, "the folders (/share/dir or full paths)")->required();
+  AddWaitOptions(command, reindex, "they are indexed");
+  command->callback([&output] {
+    PrepareChange("folder reindex");
+    const std::vector<std::string> checked = ConfiguredFolders(paths);
+    fileindex::FolderReindex(JsonList(checked));
+    Finish(output, "reindexing", checked, reindex);
   });
+}
+
+}  // namespace
+
+void AddFolderCommands(CLI::App& app, Output& output) {
+  CLI::App* folder = app.add_subcommand("folder", "indexed folders: list, get, add, set, delete, reindex");
+  folder->require_subcommand(1);
+  AddList(folder, output);
+  AddGet(folder, output);
+  AddAdd(folder, output);
+  AddSet(folder, output);
+  AddDelete(folder, output);
+  AddReindex(folder, output);
 }
 
 }  // namespace cli

@@ -8,16 +8,22 @@
 #include "common/error.h"
 #include "common/log.h"
 #include "programs/fileindex/cli_output.h"
+#include "programs/fileindex/command_names.h"
 #include "programs/fileindex/commands.h"
+
+#ifndef FILEINDEX_VERSION
+#error "FILEINDEX_VERSION comes from the build"
+#endif
 
 int main(int argc, char** argv) {
   using namespace corvlumex;
   signal(SIGPIPE, SIG_IGN);
   cli::Output output;
   bool verbose = false;
-  CLI::App app{"fileindex: manage indexed folders, watch indexing and search the index"};
+  CLI::App app{"fileindex: manage indexed folders, watch indexing and search the index", "fileindex"};
   app.require_subcommand(1);
   app.fallthrough();
+  app.set_version_flag("--version", "fileindex " FILEINDEX_VERSION);
   app.add_flag("--json", output.json, "print JSON instead of tables (for scripts)");
   app.add_flag("-v,--verbose", verbose, "print the library's log lines on standard error");
   app.parse_complete_callback([&verbose] {
@@ -30,10 +36,22 @@ int main(int argc, char** argv) {
   });
   cli::AddFolderCommands(app, output);
   cli::AddAdminCommands(app, output);
+  cli::AddShareCommands(app, output);
+  cli::AddStatusCommand(app, output);
   cli::AddSearchCommands(app, output);
+  if (argc == 1) {
+    // Alone, the command line shows what it can do.
+    std::cout << app.help();
+    return 0;
+  }
   try {
     app.parse(argc, argv);
   } catch (const CLI::ParseError& error) {
+    const std::string suggestion = cli::SuggestCommand(app, argc, argv);
+    if (!suggestion.empty()) {
+      std::cerr << "fileindex: " << suggestion << std::endl;
+      return error.get_exit_code() == 0 ? 1 : error.get_exit_code();
+    }
     return app.exit(error);
   } catch (const Error& error) {
     cli::PrintError(output, error.code, error.reason);

@@ -10,6 +10,7 @@
 #include "fileindex/file_type.h"
 #include "platform/platform.h"
 #include "programs/fileindex/commands.h"
+#include "programs/fileindex/daemon_client.h"
 
 namespace corvlumex {
 namespace cli {
@@ -59,8 +60,8 @@ Json::Value SearchRequest(const SearchArgs& args) {
     data["load_field"].append(field_name);
   }
   if (!args.name) {
-    // Matched words in bold on a terminal, in [brackets] otherwise.
-    const bool tty = isatty(STDOUT_FILENO) == 1;
+    // Matched words in bold on a terminal (unless NO_COLOR), in [brackets] otherwise.
+    const bool tty = UseColour();
     data["highlight"]["size"] = 80;
     data["highlight"]["pre"] = tty ? "\033[1m" : "[";
     data["highlight"]["post"] = tty ? "\033[0m" : "]";
@@ -112,6 +113,7 @@ void AddSearchCommands(CLI::App& app, Output& output) {
   search_cmd->add_option("--from", search.from, "skip this many results (paging)");
   search_cmd->add_option("--size", search.size, "show at most this many results (1-1000)")->check(CLI::Range(1, 1000));
   search_cmd->callback([&output] {
+    RequireRunning(Daemon::kSearch);
     Json::Value answer;
     elastic::SendRequestWithRetry(answer, SearchRequest(search));
     if (output.json) return PrintJson(answer["data"]);
@@ -134,6 +136,7 @@ void AddSearchCommands(CLI::App& app, Output& output) {
     request["data"]["field"] = elastic::kFieldSearchFileName;
     request["data"]["text"] = suggest.text;
     request["data"]["size"] = suggest.size;
+    RequireRunning(Daemon::kSearch);
     Json::Value answer;
     elastic::SendRequestWithRetry(answer, request);
     if (output.json) return PrintJson(answer["data"]);

@@ -17,10 +17,29 @@ system_build() {  # builds only what is needed, reusing an existing build folder
   # Configured every time: an older build folder learns about new programs.
   cmake -S "$FILEINDEX_SRC" -B "$build" -DCMAKE_BUILD_TYPE=RelWithDebInfo > "$build.configure.log" 2>&1 ||
     { cat "$build.configure.log"; return 1; }
-  cmake --build "$build" -j "$(nproc)" --target "${SYSTEM_TARGETS[@]}" 2>&1 | grep -E 'error|warning:|Built target' || true
+  # Progress as the build goes: one line per target built, and compiler
+  # diagnostics matched on their "file:line: error:" form, so that a source
+  # file named error.cc is not taken for one. A failed build ends with the
+  # errors again and the path of its full log.
+  local log="$build.build.log" status=0
+  if cmake --build "$build" -j "$(nproc)" --target "${SYSTEM_TARGETS[@]}" 2>&1 | tee "$log" | system_build_progress; then
+    status=0
+  else
+    status=${PIPESTATUS[0]}
+  fi
+  if [ "$status" -ne 0 ]; then
+    echo "build failed (full log: $log):" >&2
+    grep -E ': (fatal )?error: ' "$log" | tail -20 >&2 || true
+    return 1
+  fi
   for target in fileindexd fileindex corvelasticd corvnotifyd corvcontentextractd corvvxmnotify; do
     [ -x "$(system_program "$target")" ] || { echo "build failed: $target is missing" >&2; return 1; }
   done
+}
+
+system_build_progress() {  # filters build output to progress lines and diagnostics; never fails
+  awk '/: (fatal )?error: |: warning: / { print; fflush(); next }
+       /^\[ *[0-9]+%\] Built target / { sub(/^\[ */, ""); sub(/%\] Built target /, "% built "); print "  " $0; fflush() }'
 }
 
 system_program() {  # path of a built program
@@ -81,6 +100,48 @@ system_stop() {  # stops the daemons started by system_start (SIGTERM, then SIGK
     fi
     rm -f "$pid_file"
   done
+}
+
+system_shares() {  # the sandbox registry's shares, one "name<TAB>path" line each
+  local registry="$CORVLUMEX_ROOT/etc/corvlumex/shares.json"
+  [ -f "$registry" ] || return 0
+  grep -oE '\{"name": "[^"]*", "path": "[^"]*"\}' "$registry" |
+    sed -E 's/^\{"name": "([^"]*)", "path": "([^"]*)"\}$/\1\t\2/'
+}
+
+system_add_share() {  # directory -> prints the share's name
+  # Adds a share over the directory to the sandbox registry, keeping the
+  # shares already there: their folders stay configured, and an indexed
+  # folder whose share vanished from the registry would make every folder
+  # command fail. The name is the directory's last component, made unique
+  # when another share already has it.
+  local dir="$1" name base n=1 existing_name existing_path
+  case "$dir" in *'"'*|*'\'*) echo "scripts/run: a folder path with \" or \\ cannot be a share: $dir" >&2; return 1 ;; esac
+  base="$(basename "$dir")"
+  name="$base"
+  local lines; lines="$(system_shares)"
+  while IFS=$'\t' read -r existing_name existing_path; do
+    [ -n "$existing_name" ] || continue
+    if [ "$existing_path" = "$dir" ]; then echo "$existing_name"; return 0; fi
+  done <<< "$lines"
+  while printf '%s\n' "$lines" | cut -f1 | grep -qxF "$name"; do
+    n=$((n + 1)); name="$base-$n"
+  done
+  mkdir -p "$CORVLUMEX_ROOT/etc/corvlumex"
+  {
+    printf '['
+    local first=1
+    while IFS=$'\t' read -r existing_name existing_path; do
+      [ -n "$existing_name" ] || continue
+      [ $first -eq 1 ] || printf ',\n '
+      printf '{"name": "%s", "path": "%s"}' "$existing_name" "$existing_path"
+      first=0
+    done <<< "$lines"
+    [ $first -eq 1 ] || printf ',\n '
+    printf '{"name": "%s", "path": "%s"}]\n' "$name" "$dir"
+  } > "$CORVLUMEX_ROOT/etc/corvlumex/shares.json.new"
+  mv "$CORVLUMEX_ROOT/etc/corvlumex/shares.json.new" "$CORVLUMEX_ROOT/etc/corvlumex/shares.json"
+  echo "$name"
 }
 
 system_write_share() {  # name, directory: writes a one-share registry

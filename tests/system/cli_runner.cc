@@ -1,6 +1,7 @@
 #include "tests/system/cli_runner.h"
 
 #include <fcntl.h>
+#include <grp.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -18,7 +19,7 @@ std::string ReadAndRemove(const std::string& path) {
 
 }  // namespace
 
-CliResult RunCli(const std::vector<std::string>& args) {
+CliResult RunCli(const std::vector<std::string>& args, unsigned as_user) {
   const std::string program = ProgramPath("fileindex");
   char out_name[] = "/tmp/fileindex-cli-out-XXXXXX";
   char err_name[] = "/tmp/fileindex-cli-err-XXXXXX";
@@ -29,6 +30,7 @@ CliResult RunCli(const std::vector<std::string>& args) {
   if (pid == 0) {
     dup2(out_fd, STDOUT_FILENO);
     dup2(err_fd, STDERR_FILENO);
+    if (as_user != 0 && (setgroups(0, nullptr) != 0 || setgid(65534) != 0 || setuid(as_user) != 0)) _exit(126);
     std::vector<std::string> words{program};
     words.insert(words.end(), args.begin(), args.end());
     std::vector<char*> argv;

@@ -14,7 +14,9 @@ struct CliResult {
   std::string err;
 };
 
-CliResult RunCli(const std::vector<std::string>& args);
+// `as_user` other than 0 runs it under that user id (and group "nogroup"),
+// for what an unprivileged user sees; the caller must be root then.
+CliResult RunCli(const std::vector<std::string>& args, unsigned as_user = 0);
 
 }  // namespace testing_support
 }  // namespace corvlumex

@@ -1,0 +1,227 @@
+// End to end: the fileindex command line refuses what it cannot do before
+// changing anything, says what was wrong and what to do next, exits
+// non-zero then, and tells the truth in its status.
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <set>
+#include <sstream>
+
+#include "common/json_util.h"
+#include "tests/system/cli_runner.h"
+#include "tests/system/system_harness.h"
+
+namespace corvlumex {
+namespace testing_support {
+namespace {
+namespace fs = std::filesystem;
+
+struct Refusal {
+  std::vector<std::string> args;
+  std::vector<std::string> said;  // each must be in the error output
+};
+
+std::string FolderFile(const SystemSandbox& box) {
+  return ReadFileText(box.root() + "/var/packages/CorvLumex/etc/fileindex.folders");
+}
+
+std::string StatusFile(const SystemSandbox& box) {
+  return ReadFileText(box.root() + "/var/packages/CorvLumex/etc/fileindex.status");
+}
+
+// Each refusal exits non-zero, names the problem, and leaves the folder and
+// status files as they were.
+void ExpectRefusals(const SystemSandbox& box, const std::vector<Refusal>& refusals) {
+  for (const Refusal& refusal : refusals) {
+    const std::string folders = FolderFile(box), status = StatusFile(box);
+    const CliResult result = RunCli(refusal.args);
+    std::string command;
+    for (const std::string& arg : refusal.args) command += arg + " ";
+    EXPECT_NE(result.status, 0) << command << "\n" << result.out << result.err;
+    for (const std::string& words : refusal.said) {
+      EXPECT_NE(result.err.find(words), std::string::npos) << command << ": no \"" << words << "\" in " << result.err;
+    }
+    EXPECT_EQ(result.err.find(": \n"), std::string::npos) << command << ": an error without a reason: " << result.err;
+    EXPECT_EQ(FolderFile(box), folders) << command;
+    EXPECT_EQ(StatusFile(box), status) << command;
+  }
+}
+
+TEST(SystemCliTest, BadArgumentsAreRefusedWithWhatToDoAndChangeNothing) {
+  if (geteuid() != 0) GTEST_SKIP() << "the management operations write root's files: run as root";
+  SystemSandbox box;
+  fs::create_directories(box.Path("docs"));
+  WriteText(box.Path("docs/menu.txt"), "saffron paella");
+  const std::string outside = box.root() + "/outside";
+  fs::create_directories(outside);
+  box.StartAll();
+  const CliResult added = RunCli({"folder", "add", "/share/docs", "--wait", "--timeout", "60"});
+  ASSERT_EQ(added.status, 0) << added.err;
+  EXPECT_NE(added.out.find("added /share/docs"), std::string::npos) << added.out;
+
+  ExpectRefusals(box, {
+      {{"folder", "add", box.Path("docs/menu.txt")}, {"is a file, not a folder"}},
+      {{"folder", "add", "/share/docs/menu.txt"}, {"is a file, not a folder"}},
+      {{"folder", "add", "docs"}, {"\"docs\" is a relative path", "/share/dir"}},
+      {{"folder", "add", "/share/nothing"}, {"/share/nothing does not exist"}},
+      {{"folder", "add", outside}, {"is outside every share", "the shares are: share (" + box.share_dir() + ")"}},
+      {{"folder", "add", "/nosuch/dir"}, {"does not exist", "the shares are: share ("}},
+      {{"folder", "add", "/share/docs"}, {"error 901", "already indexed", "fileindex folder reindex /share/docs"}},
+      {{"folder", "reindex", "/share/nothing"}, {"error 902", "not an indexed folder", "/share/docs"}},
+      {{"folder", "delete", "docs"}, {"relative path"}},
+      {{"folder", "get", "/share/other"}, {"error 902", "the indexed folders are: /share/docs"}},
+      {{"share", "rename", "nosuch", "other"}, {"error 800", "no share named \"other\"", "the shares are: share"}},
+      {{"share", "rename", "nosuch", "share"}, {"no folder of share nosuch is indexed"}},
+      {{"share", "pause", "nosuch"}, {"no share named \"nosuch\""}},
+      {{"share", "check-recycle", "nosuch"}, {"no share named \"nosuch\""}},
+      {{"volume", "pause", "relative"}, {"\"relative\" is a relative path"}},
+      {{"volume", "pause", "/nowhere"}, {"no share lies on /nowhere", "the shares are: share"}},
+      {{"user", "rename", "alice", "bob"}, {"no indexed folder lies in the home of alice"}},
+      {{"serch", "saffron"}, {"unknown command \"serch\"; did you mean \"search\"?"}},
+      {{"folder", "ad", "/share/docs"}, {"did you mean \"folder add\"?"}},
+  });
+
+  // What was done is said; a second pause says it found the share paused.
+  const CliResult paused = RunCli({"share", "pause", "share"});
+  EXPECT_EQ(paused.status, 0) << paused.err;
+  EXPECT_NE(paused.out.find("share share paused"), std::string::npos) << paused.out;
+  EXPECT_NE(RunCli({"share", "pause", "share"}).out.find("was already paused"), std::string::npos);
+  const CliResult volume = RunCli({"volume", "pause", fs::path(box.share_dir()).parent_path().string()});
+  EXPECT_EQ(volume.status, 0) << volume.err;
+  EXPECT_NE(volume.out.find("paused the shares on"), std::string::npos) << volume.out;
+  EXPECT_EQ(RunCli({"volume", "resume", fs::path(box.share_dir()).parent_path().string()}).status, 0);
+  EXPECT_EQ(RunCli({"share", "resume", "share"}).status, 0);
+
+  // A user who is not root is told so, and nothing is queued.
+  const CliResult unprivileged = RunCli({"folder", "reindex", "/share/docs"}, 65534);
+  EXPECT_NE(unprivileged.status, 0);
+  EXPECT_NE(unprivileged.err.find("only root may do: run it as root"), std::string::npos) << unprivileged.err;
+  EXPECT_EQ(unprivileged.out.find("reindexing"), std::string::npos) << unprivileged.out;
+}
+
+TEST(SystemCliTest, CommandsThatNeedADaemonThatIsDownChangeNothingAndSayHowToStartIt) {
+  if (geteuid() != 0) GTEST_SKIP() << "the management operations write root's files: run as root";
+  SystemSandbox box;
+  fs::create_directories(box.Path("docs"));
+  fs::create_directories(box.Path("more"));
+  box.StartAll();
+  ASSERT_EQ(RunCli({"folder", "add", "/share/docs"}).status, 0);
+  box.StopIndexer(SIGTERM);
+  const std::string start = "fileindexd is not running: start it with systemctl start pkg-CorvLumex-fileindexd";
+  ExpectRefusals(box, {
+      {{"folder", "add", "/share/more"}, {start, "nothing was changed"}},
+      {{"folder", "delete", "/share/docs"}, {start}},
+      {{"folder", "reindex", "/share/docs"}, {start}},
+      {{"pause"}, {start}},
+      {{"share", "pause", "share"}, {start}},
+  });
+  const CliResult status = RunCli({"status"});
+  EXPECT_NE(status.status, 0);
+  EXPECT_NE(status.out.find(start), std::string::npos) << status.out;
+  EXPECT_NE(status.out.find("corvelasticd: running"), std::string::npos) << status.out;
+}
+
+TEST(SystemCliTest, SearchWithTheSearchDaemonDownSaysWhichDaemonAndHowToStartIt) {
+  SystemSandbox box;  // no daemon started
+  for (const std::vector<std::string>& args : {std::vector<std::string>{"search", "saffron"},
+                                                std::vector<std::string>{"suggest", "saf"}}) {
+    const CliResult result = RunCli(args);
+    EXPECT_NE(result.status, 0);
+    EXPECT_NE(result.err.find("corvelasticd is not running: start it with systemctl start corvelasticd"),
+              std::string::npos)
+        << result.err;
+  }
+  setenv("FILEINDEX_START_COMMAND", "scripts/run start", 1);
+  const CliResult status = RunCli({"status"});
+  unsetenv("FILEINDEX_START_COMMAND");
+  EXPECT_NE(status.status, 0);
+  for (const char* daemon : {"corvelasticd", "corvnotifyd", "fileindexd"}) {
+    EXPECT_NE(status.out.find(std::string(daemon) + " is not running: start it with scripts/run start"),
+              std::string::npos)
+        << status.out;
+  }
+}
+
+TEST(SystemCliTest, StatusCountsTheIndexAndSaysWhatTheIndexerDoes) {
+  if (geteuid() != 0) GTEST_SKIP() << "the management operations write root's files: run as root";
+  SystemSandbox box;
+  fs::create_directories(box.Path("docs/inner"));
+  WriteText(box.Path("docs/a.txt"), "one");
+  WriteText(box.Path("docs/inner/b.txt"), "two");
+  box.StartAll();
+  ASSERT_EQ(RunCli({"folder", "add", "/share/docs", "--wait", "--timeout", "60"}).status, 0);
+  ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
+  Json::Value status;
+  const CliResult json = RunCli({"--json", "status"});
+  EXPECT_EQ(json.status, 0) << json.err;
+  ASSERT_TRUE(JsonFromString(status, json.out)) << json.out;
+  const Json::Value& share = status["shares"]["share"];
+  EXPECT_EQ(share["documents"].asInt64(), static_cast<Json::Int64>(box.IndexedPaths().size()));
+  EXPECT_GT(share["index_bytes"].asInt64(), 0);
+  EXPECT_EQ(share["total_failed"].asInt64(), 0);
+  EXPECT_EQ(share["activity"].asString(), "up to date, watching for changes");
+  for (const char* daemon : {"corvelasticd", "corvnotifyd", "fileindexd"}) {
+    EXPECT_TRUE(status["daemons"][daemon]["running"].asBool()) << daemon;
+  }
+  const CliResult text = RunCli({"status"});
+  EXPECT_NE(text.out.find("indexing: on (not paused)"), std::string::npos) << text.out;
+  ASSERT_EQ(RunCli({"pause"}).status, 0);
+  EXPECT_NE(RunCli({"status"}).out.find("indexing: paused until resumed (fileindex resume)"), std::string::npos);
+  ASSERT_EQ(RunCli({"resume"}).status, 0);
+}
+
+// Column positions in display cells of the line's UTF-8 text.
+size_t DisplayColumn(const std::string& line, const std::string& cell) {
+  const size_t at = line.find(cell);
+  if (at == std::string::npos) return std::string::npos;
+  size_t columns = 0;
+  for (size_t i = 0; i < at; ++i) {
+    const unsigned char byte = static_cast<unsigned char>(line[i]);
+    if ((byte & 0xC0) == 0x80) continue;  // continuation byte
+    columns += byte >= 0xE3 && byte <= 0xE9 ? 2 : 1;  // the CJK ideographs used below take two cells
+  }
+  return columns;
+}
+
+TEST(SystemCliTest, TablesAlignByDisplayWidthAndShowControlCharactersEscaped) {
+  if (geteuid() != 0) GTEST_SKIP() << "the management operations write root's files: run as root";
+  SystemSandbox box;
+  const std::vector<std::string> names = {"plain", "caf\xc3\xa9", "\xe6\x9d\xb1\xe4\xba\xac", "bad\x1b[2Jname"};
+  for (size_t i = 0; i < names.size(); ++i) fs::create_directories(box.Path("d" + std::to_string(i)));
+  box.StartAll();
+  for (size_t i = 0; i < names.size(); ++i) {
+    const CliResult added = RunCli({"folder", "add", "/share/d" + std::to_string(i), "--name", names[i]});
+    ASSERT_EQ(added.status, 0) << added.err;
+  }
+  const CliResult listed = RunCli({"folder", "list"});
+  ASSERT_EQ(listed.status, 0) << listed.err;
+  EXPECT_EQ(listed.out.find('\x1b'), std::string::npos) << "a control character reached the terminal";
+  EXPECT_NE(listed.out.find("bad\\x1b[2Jname"), std::string::npos) << listed.out;
+  // The DOCUMENT column starts at the same display column on every line.
+  std::istringstream lines(listed.out);
+  std::string line;
+  std::set<size_t> columns;
+  while (std::getline(lines, line)) {
+    if (line.find("/share/d") == std::string::npos && line.find("PATH") == std::string::npos) continue;
+    const std::string cell = line.find("PATH") == 0 ? "DOCUMENT" : "yes";
+    columns.insert(DisplayColumn(line, cell));
+  }
+  EXPECT_EQ(columns.size(), 1u) << listed.out;
+}
+
+TEST(SystemCliTest, VersionAndTheCommandsAlone) {
+  const CliResult version = RunCli({"--version"});
+  EXPECT_EQ(version.status, 0);
+  EXPECT_EQ(version.out.rfind("fileindex ", 0), 0u) << version.out;
+  const CliResult alone = RunCli({});
+  EXPECT_EQ(alone.status, 0);
+  for (const char* command : {"folder", "status", "search", "share"}) {
+    EXPECT_NE(alone.out.find(command), std::string::npos) << alone.out;
+  }
+}
+
+}  // namespace
+}  // namespace testing_support
+}  // namespace corvlumex
