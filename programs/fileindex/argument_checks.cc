@@ -68,7 +68,7 @@ std::string ExistingFolder(const std::string& folder) {
       struct stat info;
       if (stat(path.c_str(), &info) == 0) {
         throw Error(kErrorPathCannotIndex,
-                    path + " is outside every share; only folders inside a share can be indexed. The shares are: " +
+                    path + " is outside every share; only folders inside a share can be indexed; the shares are: " +
                         KnownShares());
       }
       throw Error(kErrorBadArgument, path + " does not exist (and no share is named \"" + share_name +

@@ -37,56 +37,53 @@ void PrintTable(const std::vector<std::string>& header, const std::vector<std::v
   }
 }
 
-size_t DisplayWidth(const std::string& text) {
-  size_t width = 0;
+namespace {
+
+// Calls `each(offset, length, code_point)` for every UTF-8 sequence of
+// `text`; an invalid byte comes as length 1 and code point -1.
+template <typename Each>
+void ForEachCodePoint(const std::string& text, Each each) {
   const auto* bytes = reinterpret_cast<const utf8proc_uint8_t*>(text.data());
-  utf8proc_ssize_t offset = 0;
   const auto size = static_cast<utf8proc_ssize_t>(text.size());
-  while (offset < size) {
-    utf8proc_int32_t code_point = 0;
-    const utf8proc_ssize_t length = utf8proc_iterate(bytes + offset, size - offset, &code_point);
+  for (utf8proc_ssize_t offset = 0; offset < size;) {
+    utf8proc_int32_t code_point = -1;
+    utf8proc_ssize_t length = utf8proc_iterate(bytes + offset, size - offset, &code_point);
     if (length <= 0) {
-      ++width;
-      ++offset;
-      continue;
+      length = 1;
+      code_point = -1;
     }
-    width += static_cast<size_t>(std::max(0, utf8proc_charwidth(code_point)));
+    each(static_cast<size_t>(offset), static_cast<size_t>(length), code_point);
     offset += length;
   }
+}
+
+}  // namespace
+
+size_t DisplayWidth(const std::string& text) {
+  size_t width = 0;
+  ForEachCodePoint(text, [&width](size_t, size_t, utf8proc_int32_t code_point) {
+    width += code_point < 0 ? 1 : static_cast<size_t>(std::max(0, utf8proc_charwidth(code_point)));
+  });
   return width;
 }
 
 std::string Printable(const std::string& text) {
   std::string shown;
-  const auto* bytes = reinterpret_cast<const utf8proc_uint8_t*>(text.data());
-  utf8proc_ssize_t offset = 0;
-  const auto size = static_cast<utf8proc_ssize_t>(text.size());
-  while (offset < size) {
-    utf8proc_int32_t code_point = 0;
-    const utf8proc_ssize_t length = utf8proc_iterate(bytes + offset, size - offset, &code_point);
-    const bool control = length > 0 && utf8proc_category(code_point) == UTF8PROC_CATEGORY_CC;
-    if (length > 0 && !control) {
-      shown.append(text, static_cast<size_t>(offset), static_cast<size_t>(length));
-      offset += length;
-      continue;
+  ForEachCodePoint(text, [&](size_t offset, size_t length, utf8proc_int32_t code_point) {
+    if (code_point >= 0 && utf8proc_category(code_point) != UTF8PROC_CATEGORY_CC) {
+      shown.append(text, offset, length);
+      return;
     }
-    const unsigned char byte = bytes[offset];
-    if (byte == '\n') shown += "\\n";
-    else if (byte == '\t') shown += "\\t";
-    else if (byte == '\r') shown += "\\r";
-    else {
-      // C1 controls are two bytes; each is shown.
-      const utf8proc_ssize_t count = length > 0 ? length : 1;
-      for (utf8proc_ssize_t i = 0; i < count; ++i) {
-        char hex[8];
-        snprintf(hex, sizeof(hex), "\\x%02x", bytes[offset + i]);
-        shown += hex;
-      }
-      offset += count;
-      continue;
+    if (code_point == '\n') return void(shown += "\\n");
+    if (code_point == '\t') return void(shown += "\\t");
+    if (code_point == '\r') return void(shown += "\\r");
+    // Other controls (C1 ones are two bytes) and invalid bytes, byte by byte.
+    for (size_t i = offset; i < offset + length; ++i) {
+      char hex[8];
+      snprintf(hex, sizeof(hex), "\\x%02x", static_cast<unsigned char>(text[i]));
+      shown += hex;
     }
-    ++offset;
-  }
+  });
   return shown;
 }
 

@@ -9,6 +9,7 @@
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
+#include <filesystem>
 #include <fstream>
 #include <sstream>
 
@@ -78,6 +79,37 @@ bool SomeoneLocks(const std::string& path) {
   return false;
 }
 
+// The sandbox root a process runs under ("" for none); false when its
+// environment cannot be read (another user's process).
+bool RootOfProcess(const std::string& pid, std::string& root) {
+  std::ifstream environ("/proc/" + pid + "/environ", std::ios::binary);
+  if (!environ) return false;
+  std::string entry;
+  root.clear();
+  while (std::getline(environ, entry, '\0')) {
+    if (entry.compare(0, 15, "CORVLUMEX_ROOT=") == 0) root = entry.substr(15);
+  }
+  return true;
+}
+
+// A process named `name` that runs under this command line's sandbox root
+// (or may: one whose environment cannot be read counts).
+bool ProcessRuns(const std::string& name) {
+  const char* own = getenv("CORVLUMEX_ROOT");
+  const std::string own_root = own == nullptr ? "" : own;
+  std::error_code error;
+  for (const auto& entry : std::filesystem::directory_iterator("/proc", error)) {
+    const std::string pid = entry.path().filename().string();
+    if (pid.find_first_not_of("0123456789") != std::string::npos) continue;
+    std::ifstream comm("/proc/" + pid + "/comm");
+    std::string command;
+    if (!std::getline(comm, command) || command != name) continue;
+    std::string root;
+    if (!RootOfProcess(pid, root) || root == own_root) return true;
+  }
+  return false;
+}
+
 const char* UnitName(Daemon daemon) {
   switch (daemon) {
     case Daemon::kIndexer: return "pkg-CorvLumex-fileindexd";
@@ -102,7 +134,9 @@ bool DaemonRunning(Daemon daemon) {
   switch (daemon) {
     case Daemon::kIndexer: return Answers(SysPath(fileindex::kFileIndexDaemonSocketPath));
     case Daemon::kSearch: return Answers(ElasticSocketPath());
-    case Daemon::kNotifier: return SomeoneLocks(SysPath(kNotifierConfigDir));
+    // The notifier locks its configuration folder only when the folder
+    // existed at its start; before the first folder is added it does not.
+    case Daemon::kNotifier: return SomeoneLocks(SysPath(kNotifierConfigDir)) || ProcessRuns("corvnotifyd");
   }
   return false;
 }

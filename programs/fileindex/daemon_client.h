@@ -16,7 +16,8 @@ enum class Daemon { kIndexer, kSearch, kNotifier };
 // "fileindexd", "corvelasticd", "corvnotifyd".
 const char* DaemonName(Daemon daemon);
 // True when the daemon answers on its socket (fileindexd, corvelasticd) or
-// holds its configuration lock (corvnotifyd). Never waits.
+// holds its configuration lock or runs under this sandbox root
+// (corvnotifyd). Never waits.
 bool DaemonRunning(Daemon daemon);
 // What starts it: FILEINDEX_START_COMMAND when set (the run command's
 // wrapper sets it to its own start command), else the systemd unit.

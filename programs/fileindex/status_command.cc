@@ -105,7 +105,10 @@ void PrintStatus(const Json::Value& out) {
   std::cout << "indexing: " << out["indexing"].asString() << "\n";
   for (const std::string& name : out["daemons"].getMemberNames()) {
     const Json::Value& daemon = out["daemons"][name];
-    std::cout << name << ": " << (daemon["running"].asBool() ? "running" : daemon["problem"].asString()) << "\n";
+    std::cout << name << ": ";
+    if (daemon["running"].asBool()) std::cout << "running\n";
+    else if (daemon.isMember("start")) std::cout << "NOT RUNNING (start it with " << daemon["start"].asString() << ")\n";
+    else std::cout << daemon["problem"].asString() << "\n";
   }
   const Json::Value& shares = out["shares"];
   if (shares.empty()) {

@@ -119,7 +119,9 @@ TEST(SystemCliTest, CommandsThatNeedADaemonThatIsDownChangeNothingAndSayHowToSta
   });
   const CliResult status = RunCli({"status"});
   EXPECT_NE(status.status, 0);
-  EXPECT_NE(status.out.find(start), std::string::npos) << status.out;
+  EXPECT_NE(status.out.find("fileindexd: NOT RUNNING (start it with systemctl start pkg-CorvLumex-fileindexd)"),
+            std::string::npos)
+      << status.out;
   EXPECT_NE(status.out.find("corvelasticd: running"), std::string::npos) << status.out;
 }
 
@@ -138,7 +140,7 @@ TEST(SystemCliTest, SearchWithTheSearchDaemonDownSaysWhichDaemonAndHowToStartIt)
   unsetenv("FILEINDEX_START_COMMAND");
   EXPECT_NE(status.status, 0);
   for (const char* daemon : {"corvelasticd", "corvnotifyd", "fileindexd"}) {
-    EXPECT_NE(status.out.find(std::string(daemon) + " is not running: start it with scripts/run start"),
+    EXPECT_NE(status.out.find(std::string(daemon) + ": NOT RUNNING (start it with scripts/run start)"),
               std::string::npos)
         << status.out;
   }
