@@ -3,6 +3,8 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <set>
+
 #include "common/error.h"
 #include "common/sys.h"
 #include "fileindex/folder_mgr.h"
@@ -107,6 +109,28 @@ std::vector<std::string> SharesOnVolume(const std::string& volume) {
   }
   if (shares.empty()) throw Error(kErrorBadArgument, "no share lies on " + path + "; the shares are: " + KnownShares());
   return shares;
+}
+
+std::string ReasonOf(int code, const std::string& reason) {
+  if (code == kErrorShareEnum) {
+    return reason + " (the share registry " + SysPath("/etc/corvlumex/shares.json") +
+           " cannot be read; fileindex -v ... shows what is wrong in it)";
+  }
+  if (!reason.empty() || code != kErrorShareNotFound) return reason;
+  try {
+    const std::set<std::string> known = sdk::SDKShare::Enum();
+    std::string missing;
+    for (const std::string& share : fileindex::FolderMgr().GetIndexedShares()) {
+      if (known.count(share) == 0) missing += (missing.empty() ? "" : ", ") + share;
+    }
+    if (!missing.empty()) {
+      return "indexed folders belong to shares the share registry no longer lists: " + missing +
+             " (add them back to " + SysPath("/etc/corvlumex/shares.json") +
+             ", or after a rename run fileindex share rename OLD NEW); the shares are: " + KnownShares();
+    }
+  } catch (const Error&) {
+  }
+  return reason;  // PrintError gives the code's meaning
 }
 
 }  // namespace cli

@@ -35,5 +35,10 @@ std::vector<std::string> ConfiguredFolders(const std::vector<std::string>& folde
 // Throws 120 for a relative path or a volume without any share.
 std::vector<std::string> SharesOnVolume(const std::string& volume);
 
+// The reason to print for an error the operations threw: their own, or for
+// one without a reason words that name what is wrong (an unknown share:
+// the indexed shares the share registry no longer lists).
+std::string ReasonOf(int code, const std::string& reason);
+
 }  // namespace cli
 }  // namespace corvlumex

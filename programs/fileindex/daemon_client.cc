@@ -153,7 +153,9 @@ std::string NotRunningText(Daemon daemon) {
 
 void RequireRunning(Daemon daemon, const std::string& consequence) {
   if (DaemonRunning(daemon)) return;
-  throw Error(kErrorSystem, NotRunningText(daemon) + (consequence.empty() ? "" : " (" + consequence + ")"));
+  // The library's code for a search daemon that cannot be reached; 502 for the others.
+  const ErrorCode code = daemon == Daemon::kSearch ? kErrorSearchRequest : kErrorSystem;
+  throw Error(code, NotRunningText(daemon) + (consequence.empty() ? "" : " (" + consequence + ")"));
 }
 
 Json::Value AskDaemon(const std::string& type, const Json::Value& data) {

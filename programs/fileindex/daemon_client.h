@@ -24,7 +24,7 @@ bool DaemonRunning(Daemon daemon);
 std::string StartCommand(Daemon daemon);
 // "fileindexd is not running: start it with systemctl start ...".
 std::string NotRunningText(Daemon daemon);
-// Throws Error 502 with NotRunningText (and `consequence`, e.g. "nothing was
+// Throws Error 913 (corvelasticd) or 502 (the others) with NotRunningText (and `consequence`, e.g. "nothing was
 // changed", when given) when the daemon does not run.
 void RequireRunning(Daemon daemon, const std::string& consequence = "");
 

@@ -7,6 +7,7 @@
 
 #include "common/error.h"
 #include "common/log.h"
+#include "programs/fileindex/argument_checks.h"
 #include "programs/fileindex/cli_output.h"
 #include "programs/fileindex/command_names.h"
 #include "programs/fileindex/commands.h"
@@ -54,7 +55,7 @@ int main(int argc, char** argv) {
     }
     return app.exit(error);
   } catch (const Error& error) {
-    cli::PrintError(output, error.code, error.reason);
+    cli::PrintError(output, error.code, cli::ReasonOf(error.code, error.reason));
     return 1;
   } catch (const std::exception& error) {
     cli::PrintError(output, kErrorUnexpected, error.what());

@@ -124,7 +124,7 @@ void PrintStatus(const Json::Value& out) {
   }
   std::cout << "\n";
   PrintTable({"SHARE", "DOCUMENTS", "INDEX SIZE", "NOT INDEXED", "NOW", "FLAGS"}, rows);
-  std::cout << "(NOT INDEXED: files that could not be indexed since fileindexd started; fileindex -v shows why)\n";
+  std::cout << "(NOT INDEXED: files that could not be indexed since fileindexd started; the fileindexd log names each)\n";
 }
 
 // Returns the exit condition: false when a daemon is down.

@@ -37,9 +37,9 @@ system_build() {  # builds only what is needed, reusing an existing build folder
   done
 }
 
-system_build_progress() {  # filters build output to progress lines and diagnostics; never fails
+system_build_progress() {  # filters build output to one line per target built, and diagnostics; never fails
   awk '/: (fatal )?error: |: warning: / { print; fflush(); next }
-       /^\[ *[0-9]+%\] Built target / { sub(/^\[ */, ""); sub(/%\] Built target /, "% built "); print "  " $0; fflush() }'
+       /^\[ *[0-9]+%\] Built target / { sub(/^.*Built target /, ""); if (!seen[$0]++) { print "  built " $0; fflush() } }'
 }
 
 system_program() {  # path of a built program
@@ -113,31 +113,26 @@ system_add_share() {  # directory -> prints the share's name
   # Adds a share over the directory to the sandbox registry, keeping the
   # shares already there: their folders stay configured, and an indexed
   # folder whose share vanished from the registry would make every folder
-  # command fail. The name is the directory's last component, made unique
-  # when another share already has it.
-  local dir="$1" name base n=1 existing_name existing_path
+  # command fail. A share's directory ends in its name, so a second folder
+  # with the name of a registered share is refused.
+  local dir="$1" name existing_name existing_path lines
   case "$dir" in *'"'*|*'\'*) echo "scripts/run: a folder path with \" or \\ cannot be a share: $dir" >&2; return 1 ;; esac
-  base="$(basename "$dir")"
-  name="$base"
-  local lines; lines="$(system_shares)"
+  name="$(basename "$dir")"
+  lines="$(system_shares)"
   while IFS=$'\t' read -r existing_name existing_path; do
-    [ -n "$existing_name" ] || continue
-    if [ "$existing_path" = "$dir" ]; then echo "$existing_name"; return 0; fi
+    [ "$existing_name" = "$name" ] || continue
+    [ "$existing_path" = "$dir" ] && { echo "$name"; return 0; }
+    echo "scripts/run: the share \"$name\" is already $existing_path; a share is named after its folder, so" \
+      "$dir cannot be one too: rename that folder, or start afresh (scripts/run stop; rm -r ${CORVLUMEX_ROOT%/root})" >&2
+    return 1
   done <<< "$lines"
-  while printf '%s\n' "$lines" | cut -f1 | grep -qxF "$name"; do
-    n=$((n + 1)); name="$base-$n"
-  done
   mkdir -p "$CORVLUMEX_ROOT/etc/corvlumex"
   {
     printf '['
-    local first=1
     while IFS=$'\t' read -r existing_name existing_path; do
       [ -n "$existing_name" ] || continue
-      [ $first -eq 1 ] || printf ',\n '
-      printf '{"name": "%s", "path": "%s"}' "$existing_name" "$existing_path"
-      first=0
+      printf '{"name": "%s", "path": "%s"},\n ' "$existing_name" "$existing_path"
     done <<< "$lines"
-    [ $first -eq 1 ] || printf ',\n '
     printf '{"name": "%s", "path": "%s"}]\n' "$name" "$dir"
   } > "$CORVLUMEX_ROOT/etc/corvlumex/shares.json.new"
   mv "$CORVLUMEX_ROOT/etc/corvlumex/shares.json.new" "$CORVLUMEX_ROOT/etc/corvlumex/shares.json"

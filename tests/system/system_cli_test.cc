@@ -2,7 +2,9 @@
 // changing anything, says what was wrong and what to do next, exits
 // non-zero then, and tells the truth in its status.
 #include <gtest/gtest.h>
+#include <stdlib.h>
 #include <signal.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <filesystem>
@@ -211,6 +213,48 @@ TEST(SystemCliTest, TablesAlignByDisplayWidthAndShowControlCharactersEscaped) {
     columns.insert(DisplayColumn(line, cell));
   }
   EXPECT_EQ(columns.size(), 1u) << listed.out;
+}
+
+// system_add_share of the run command's shell library; returns the name it
+// printed.
+std::string AddShareAsTheRunCommandDoes(const std::string& dir, int expected_status = 0) {
+  fs::create_directories(dir);
+  const std::string out = testing::TempDir() + "/add-share-" + std::to_string(getpid());
+  const std::string command = "bash -c 'set -euo pipefail; source \"" FILEINDEX_SOURCE_DIR
+                              "/scripts/lib/system.sh\"; system_add_share \"$0\"' '" + dir + "' > '" + out + "'";
+  const int status = system(command.c_str());
+  EXPECT_EQ(WIFEXITED(status) ? WEXITSTATUS(status) : -1, expected_status) << command;
+  std::string name = ReadFileText(out);
+  unlink(out.c_str());
+  while (!name.empty() && name.back() == '\n') name.pop_back();
+  return name;
+}
+
+TEST(SystemCliTest, TheRunCommandAddsSharesBesideThoseAlreadyIndexed) {
+  if (geteuid() != 0) GTEST_SKIP() << "the management operations write root's files: run as root";
+  SystemSandbox box;
+  fs::create_directories(box.Path("docs"));
+  box.StartAll();
+  ASSERT_EQ(RunCli({"folder", "add", "/share/docs"}).status, 0);
+  EXPECT_EQ(AddShareAsTheRunCommandDoes(box.root() + "/volume2/docs"), "docs");
+  EXPECT_EQ(AddShareAsTheRunCommandDoes(box.root() + "/volume2/docs"), "docs");  // registered once
+  EXPECT_EQ(AddShareAsTheRunCommandDoes(box.root() + "/volume3/docs", 1), "");   // a second "docs" is refused
+  EXPECT_EQ(AddShareAsTheRunCommandDoes(box.root() + "/volume3/notes"), "notes");
+  // The folder of the first share still has its share: folder commands work.
+  const CliResult listed = RunCli({"folder", "list"});
+  EXPECT_EQ(listed.status, 0) << listed.err;
+  EXPECT_NE(listed.out.find("/share/docs"), std::string::npos) << listed.out;
+  const CliResult added = RunCli({"folder", "add", "/notes"});
+  EXPECT_EQ(added.status, 0) << added.err;
+  const CliResult shares = RunCli({"share", "list"});
+  for (const char* name : {"share ", "docs ", "notes "}) EXPECT_NE(shares.out.find(name), std::string::npos) << shares.out;
+
+  // A registry that lost an indexed share (what rewriting it used to do):
+  // the error names the share instead of an empty reason.
+  WriteText(box.root() + "/etc/corvlumex/shares.json", "[{\"name\": \"docs\", \"path\": \"" + box.root() + "/volume2/docs\"}]\n");
+  const CliResult broken = RunCli({"folder", "list"});
+  EXPECT_NE(broken.status, 0);
+  EXPECT_NE(broken.err.find("shares the share registry no longer lists: notes, share"), std::string::npos) << broken.err;
 }
 
 TEST(SystemCliTest, VersionAndTheCommandsAlone) {
