@@ -21,7 +21,7 @@ system_build() {  # builds only what is needed, reusing an existing build folder
   # diagnostics matched on their "file:line: error:" form, so that a source
   # file named error.cc is not taken for one. A failed build ends with the
   # errors again and the path of its full log.
-  local log="$build.build.log" status=0
+  local log="$build/build-progress.log" status=0
   if cmake --build "$build" -j "$(nproc)" --target "${SYSTEM_TARGETS[@]}" 2>&1 | tee "$log" | system_build_progress; then
     status=0
   else
