@@ -87,6 +87,23 @@ std::string Printable(const std::string& text) {
   return shown;
 }
 
+std::string PrintableKeeping(const std::string& text, const std::vector<std::string>& kept) {
+  std::string shown, plain;
+  for (size_t at = 0; at < text.size();) {
+    const auto marker = std::find_if(kept.begin(), kept.end(), [&](const std::string& word) {
+      return !word.empty() && text.compare(at, word.size(), word) == 0;
+    });
+    if (marker == kept.end()) {
+      plain += text[at++];
+      continue;
+    }
+    shown += Printable(plain) + *marker;
+    plain.clear();
+    at += marker->size();
+  }
+  return shown + Printable(plain);
+}
+
 bool UseColour() {
   const char* no_colour = getenv("NO_COLOR");
   if (no_colour != nullptr && no_colour[0] != '\0') return false;

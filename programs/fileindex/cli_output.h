@@ -33,6 +33,8 @@ size_t DisplayWidth(const std::string& text);
 // `text` with control characters (and invalid UTF-8 bytes) as \n, \t, \xHH,
 // so a file name cannot move the cursor or break a table line.
 std::string Printable(const std::string& text);
+// Printable, but the `kept` strings (our own bold on and off) pass as they are.
+std::string PrintableKeeping(const std::string& text, const std::vector<std::string>& kept);
 // Bold on (and off) when standard output is a terminal and NO_COLOR is unset.
 bool UseColour();
 

@@ -79,6 +79,7 @@ void Finish(const Output& output, const std::string& verb, const std::vector<std
     Json::Value out(Json::objectValue);
     out["success"] = true;
     out["paths"] = JsonList(paths);
+    if (paths.size() == 1) out["path"] = paths[0];  // as scripts read a single folder's answer
     if (args.wait) out["indexed"] = indexed;
     PrintJson(out);
   }

@@ -18,6 +18,9 @@ namespace {
 
 namespace elastic = fileindex::elastic;
 
+constexpr char kBoldOn[] = "\033[1m";
+constexpr char kBoldOff[] = "\033[0m";
+
 struct SearchArgs {
   std::string query;
   bool name = false;
@@ -63,8 +66,8 @@ Json::Value SearchRequest(const SearchArgs& args) {
     // Matched words in bold on a terminal (unless NO_COLOR), in [brackets] otherwise.
     const bool tty = UseColour();
     data["highlight"]["size"] = 80;
-    data["highlight"]["pre"] = tty ? "\033[1m" : "[";
-    data["highlight"]["post"] = tty ? "\033[0m" : "]";
+    data["highlight"]["pre"] = tty ? kBoldOn : "[";
+    data["highlight"]["post"] = tty ? kBoldOff : "]";
   }
   Json::Value request(Json::objectValue);
   request["command"] = "search";
@@ -89,7 +92,9 @@ void PrintHits(const SearchArgs& args, const Json::Value& result) {
     for (char& c : snippet) {
       if (c == '\n' || c == '\r' || c == '\t') c = ' ';
     }
-    std::cout << "  " << hit["fields"][elastic::kFieldPath].asString() << ": " << snippet << "\n";
+    // A file's own control characters are shown escaped; only our bold reaches the terminal.
+    std::cout << "  " << Printable(hit["fields"][elastic::kFieldPath].asString()) << ": "
+              << PrintableKeeping(snippet, {kBoldOn, kBoldOff}) << "\n";
   }
   const long long total = result["total"].asInt64();
   std::cout << total << " result(s)";

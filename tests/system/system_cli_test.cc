@@ -154,6 +154,7 @@ TEST(SystemCliTest, StatusCountsTheIndexAndSaysWhatTheIndexerDoes) {
   fs::create_directories(box.Path("docs/inner"));
   WriteText(box.Path("docs/a.txt"), "one");
   WriteText(box.Path("docs/inner/b.txt"), "two");
+  WriteText(box.Path("docs/inner/bad\x1b[2J.txt"), "crimson \x1b[31m tide");
   box.StartAll();
   ASSERT_EQ(RunCli({"folder", "add", "/share/docs", "--wait", "--timeout", "60"}).status, 0);
   ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
@@ -174,6 +175,12 @@ TEST(SystemCliTest, StatusCountsTheIndexAndSaysWhatTheIndexerDoes) {
   ASSERT_EQ(RunCli({"pause"}).status, 0);
   EXPECT_NE(RunCli({"status"}).out.find("indexing: paused until resumed (fileindex resume)"), std::string::npos);
   ASSERT_EQ(RunCli({"resume"}).status, 0);
+
+  // A name's or a content's escape sequence reaches no terminal through a search.
+  const CliResult found = RunCli({"search", "crimson"});
+  EXPECT_EQ(found.status, 0) << found.err;
+  EXPECT_EQ(found.out.find('\x1b'), std::string::npos) << found.out;
+  EXPECT_NE(found.out.find("bad\\x1b[2J.txt"), std::string::npos) << found.out;
 }
 
 // Column positions in display cells of the line's UTF-8 text.
