@@ -73,7 +73,7 @@ int main(int argc, char** argv) {
       return 0;
     }
     if (option == "--log-stderr") {
-      SetLogSink([](int, const std::string& line) { std::cerr << line << std::endl; });
+      LogToStderr("corvelasticd");
       continue;
     }
     if (i + 1 >= argc) Fail("unknown option or missing value: " + option + "\n" + kUsage);

@@ -13,6 +13,7 @@
 #include "common/json_util.h"
 #include "fileindex/communication.h"
 #include "fileindex/status_mgr.h"
+#include "tests/system/cli_runner.h"
 #include "tests/system/system_harness.h"
 
 namespace corvlumex {
@@ -88,6 +89,46 @@ TEST(SystemCrashTest, LostNotificationsLeadToAFullReindexThatConverges) {
   EXPECT_EQ(box.Search("nobody listened").size(), 1u);
   // It was the queue's crash marker, not the events, that brought the index back.
   EXPECT_NE(box.indexer().Log().find("Queue crashed"), std::string::npos) << box.Logs();
+}
+
+bool StatusSays(const std::string& text) { return RunCli({"status"}).out.find(text) != std::string::npos; }
+
+// While the notifier is down nobody sees a change: status says so, and its
+// next start has each share checked against the disk, which brings back
+// everything made, changed and deleted meanwhile.
+TEST(SystemCrashTest, ChangesWhileTheNotifierIsDownAreFoundWhenItStartsAgain) {
+  SystemSandbox box;
+  fs::create_directories(box.Path("docs/keep"));
+  WriteText(box.Path("docs/keep/old.txt"), "an old file");
+  box.StartAll();
+  box.AddFolder("docs");
+  ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
+  const std::string missed = "against the disk: changes may have been missed";
+  EXPECT_TRUE(StatusSays("corvnotifyd: running\n")) << RunCli({"status"}).out;
+
+  int round = 0;
+  for (const int stop_signal : {SIGKILL, SIGTERM}) {
+    const std::string tag = std::to_string(++round);
+    box.StopNotifier(stop_signal);
+    EXPECT_TRUE(StatusSays("corvnotifyd: not running: changes on disk are not seen now")) << RunCli({"status"}).out;
+    fs::create_directories(box.Path("docs/new" + tag));
+    for (int i = 0; i < 20; ++i) {
+      WriteText(box.Path("docs/new" + tag + "/f" + std::to_string(i) + ".txt"), "unseen" + tag + " marmalade");
+    }
+    fs::remove_all(box.Path(round == 1 ? "docs/keep" : "docs/new1"));
+    // Held back, so the pending check can be seen in status before it runs.
+    fileindex::StatusMgr().Pause(0);
+    box.StartNotifier();
+    EXPECT_TRUE(PollUntil([&] { return StatusSays("share: waiting to be checked " + missed); },
+                          std::chrono::seconds(30)))
+        << RunCli({"status"}).out << box.Logs();
+    fileindex::StatusMgr().Resume();
+    ASSERT_EQ(box.Converge(box.DiskPaths("docs"), std::chrono::seconds(60)), "") << box.Logs();
+    EXPECT_EQ(box.Search("unseen" + tag).size(), 20u);
+    EXPECT_TRUE(PollUntil([&] { return !StatusSays(missed); }, std::chrono::seconds(30)))
+        << RunCli({"status"}).out;
+    EXPECT_TRUE(StatusSays("corvnotifyd: running\n"));
+  }
 }
 
 // Fills the volume holding `path` with one file until it is full.
