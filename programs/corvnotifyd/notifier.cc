@@ -96,9 +96,9 @@ void Notifier::WriteStartMarkers() {
   }
   writer_.Flush(Clock::now(), true);
   if (queues.empty()) return;
-  CORV_LOG("started: changes made while no notifier ran were not seen, so the %zu watched share%s checked against "
-           "the disk (a crash marker in each queue)",
-           queues.size(), queues.size() == 1 ? " is" : "s are");
+  CORV_LOG("started: changes made while no notifier ran were not seen, so each watched share is checked against the "
+           "disk (a crash marker in the queue of %zu share%s)",
+           queues.size(), queues.size() == 1 ? "" : "s");
 }
 
 void Notifier::Stop() {

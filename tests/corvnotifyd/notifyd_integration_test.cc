@@ -267,7 +267,8 @@ TEST_F(NotifydTest, EveryStartMarksEachWatchedShareForACheckAgainstTheDisk) {
   box_.WriteConfig("fileindex@other.json", other_queue, {other_share + "/pics"});
   std::ofstream(box_.config_dir() + "/fileindex@bare.json") << "{\"queue\": \"" << bare_queue << "\", \"config\": null}\n";
   const QueueLine share_marker = Line(kEventQueueCrash, box_.share(), true);
-  const QueueLine other_marker = Line(kEventQueueCrash, other_share, true);
+  // Not a registered share: its first folder stands for it.
+  const QueueLine other_marker = Line(kEventQueueCrash, other_share + "/pics", true);
   EXPECT_EQ(platform::ProbeNotifier(box_.config_dir()), platform::NotifierState::kNotRunning);
 
   // A clean stop, a kill -9: whatever changed meanwhile went unseen, so each
@@ -277,7 +278,7 @@ TEST_F(NotifydTest, EveryStartMarksEachWatchedShareForACheckAgainstTheDisk) {
     auto daemon = box_.Start();
     EXPECT_EQ(platform::ProbeNotifier(box_.config_dir()), platform::NotifierState::kRunning);
     const std::string sync = box_.docs() + "/sync" + std::to_string(stop_signal);
-    ASSERT_TRUE(box_.Sync(sync));
+    ASSERT_TRUE(box_.Sync(sync)) << ReadFileText(box_.log_path());
     const auto lines = box_.Queue();
     EXPECT_EQ(Count(lines, kEventQueueCrash), before + 1);
     ASSERT_GE(lines.size(), 2u);
