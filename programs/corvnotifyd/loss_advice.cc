@@ -6,15 +6,36 @@ namespace corvlumex {
 namespace notifyd {
 namespace {
 
-// "sysctl -w <key>=<value>": `factor` times the limit in force, or
-// `fallback` when it is unknown.
-std::string RaiseCommand(const std::string& key, long in_force, long factor, long fallback) {
-  return "sysctl -w " + key + "=" + std::to_string(in_force > 0 ? in_force * factor : fallback) +
-         " (and in /etc/sysctl.d/ to keep it)";
-}
+// One kernel limit: its sysctl, what reaching it means, when a new value
+// takes effect, and the value proposed (a multiple of the one in force).
+struct Limit {
+  const char* key;
+  const char* reached;      // what happened, before " at <key>=<value>"
+  const char* in_force_is;  // which value that is
+  const char* raised;       // after "it was raised to <value> since"
+  const char* raise_then;   // after the proposed sysctl command
+  long factor;
+  long fallback;  // proposed when the value in force is unknown
+};
 
-std::string Quoted(const std::string& key, long value) {
-  return value > 0 ? key + "=" + std::to_string(value) : key + " (value unknown)";
+constexpr Limit kQueueLength{"fs.inotify.max_queued_events", "the kernel's inotify event queue overflowed",
+                             "the length in force since corvnotifyd started",
+                             ", which takes effect when corvnotifyd is restarted",
+                             ", then restart corvnotifyd, which reads it when it starts", 4, 65536};
+constexpr Limit kWatches{"fs.inotify.max_user_watches", "the kernel has no inotify watch left",
+                         "the limit when a watch was refused",
+                         ", so the folders are watched again with the next crash marker", ", which takes effect at once",
+                         2, 1048576};
+
+std::string Advise(const Limit& limit, long in_force, long now) {
+  const std::string key = limit.key;
+  std::string text = std::string(limit.reached) + " at " +
+                     (in_force > 0 ? key + "=" + std::to_string(in_force) : key + " (value unknown)") + ", " +
+                     limit.in_force_is;
+  if (in_force > 0 && now > in_force) return text + "; it was raised to " + std::to_string(now) + " since" + limit.raised;
+  return text + "; raise it, e.g. sysctl -w " + key + "=" +
+         std::to_string(in_force > 0 ? in_force * limit.factor : limit.fallback) +
+         " (and in /etc/sysctl.d/ to keep it)" + limit.raise_then;
 }
 
 }  // namespace
@@ -28,27 +49,8 @@ long ReadInotifyLimit(const char* name) {
 
 std::string LossAdvice(LossKind kind, long in_force, long now) {
   switch (kind) {
-    case LossKind::kKernelOverflow: {
-      const std::string key = "fs.inotify.max_queued_events";
-      std::string text = "the kernel's inotify event queue overflowed at " + Quoted(key, in_force) +
-                         ", the length in force since corvnotifyd started";
-      if (in_force > 0 && now > in_force) {
-        return text + "; it was raised to " + std::to_string(now) +
-               " since, which takes effect when corvnotifyd is restarted";
-      }
-      return text + "; raise it, e.g. " + RaiseCommand(key, in_force, 4, 65536) +
-             ", then restart corvnotifyd, which reads it when it starts";
-    }
-    case LossKind::kNoWatches: {
-      const std::string key = "fs.inotify.max_user_watches";
-      std::string text = "the kernel has no inotify watch left at " + Quoted(key, in_force) +
-                         ", the limit when a watch was refused";
-      if (in_force > 0 && now > in_force) {
-        return text + "; it was raised to " + std::to_string(now) +
-               " since, so the folders are watched again with the next crash marker";
-      }
-      return text + "; raise it, e.g. " + RaiseCommand(key, in_force, 2, 1048576) + ", which takes effect at once";
-    }
+    case LossKind::kKernelOverflow: return Advise(kQueueLength, in_force, now);
+    case LossKind::kNoWatches: return Advise(kWatches, in_force, now);
     case LossKind::kQueueUnwritable:
       return "the queue could not be written for too long and its pending lines were dropped";
   }
