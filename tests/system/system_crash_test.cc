@@ -93,6 +93,13 @@ TEST(SystemCrashTest, LostNotificationsLeadToAFullReindexThatConverges) {
 
 bool StatusSays(const std::string& text) { return RunCli({"status"}).out.find(text) != std::string::npos; }
 
+// Files the indexer extracted and stored since it started.
+uint64_t Extracted(SystemSandbox& box) {
+  Json::Value status;
+  if (!JsonFromString(status, box.IndexerStatus())) return 0;
+  return status["shares"]["share"]["total_extracted"].asUInt64();
+}
+
 // While the notifier is down nobody sees a change: status says so, and its
 // next start has each share checked against the disk, which brings back
 // everything made, changed and deleted meanwhile.
@@ -100,6 +107,8 @@ TEST(SystemCrashTest, ChangesWhileTheNotifierIsDownAreFoundWhenItStartsAgain) {
   SystemSandbox box;
   fs::create_directories(box.Path("docs/keep"));
   WriteText(box.Path("docs/keep/old.txt"), "an old file");
+  fs::create_directories(box.Path("docs/stable"));
+  for (int i = 0; i < 30; ++i) WriteText(box.Path("docs/stable/s" + std::to_string(i) + ".txt"), "unchanged");
   box.StartAll();
   box.AddFolder("docs");
   ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
@@ -109,6 +118,7 @@ TEST(SystemCrashTest, ChangesWhileTheNotifierIsDownAreFoundWhenItStartsAgain) {
   int round = 0;
   for (const int stop_signal : {SIGKILL, SIGTERM}) {
     const std::string tag = std::to_string(++round);
+    const uint64_t extracted_before = Extracted(box);
     box.StopNotifier(stop_signal);
     EXPECT_TRUE(StatusSays("corvnotifyd: not running: changes on disk are not seen now")) << RunCli({"status"}).out;
     fs::create_directories(box.Path("docs/new" + tag));
@@ -128,6 +138,10 @@ TEST(SystemCrashTest, ChangesWhileTheNotifierIsDownAreFoundWhenItStartsAgain) {
     EXPECT_TRUE(PollUntil([&] { return !StatusSays(missed); }, std::chrono::seconds(30)))
         << RunCli({"status"}).out;
     EXPECT_TRUE(StatusSays("corvnotifyd: running\n"));
+    // The check is cheap: the 20 new files and their folders are extracted,
+    // the 30 unchanged files are not extracted again.
+    EXPECT_GE(Extracted(box) - extracted_before, 20u);
+    EXPECT_LE(Extracted(box) - extracted_before, 25u);
   }
 }
 
