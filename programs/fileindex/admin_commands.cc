@@ -9,8 +9,8 @@
 #include "fileindex/index_mgr.h"
 #include "fileindex/queue_mgr.h"
 #include "fileindex/status_mgr.h"
-#include "programs/fileindex/commands.h"
 #include "platform/linux/notifier_presence.h"
+#include "programs/fileindex/commands.h"
 #include "programs/fileindex/daemon_client.h"
 #include "sdk/share.h"
 
