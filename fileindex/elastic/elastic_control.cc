@@ -114,6 +114,22 @@ void SendRequestNoResult(const Json::Value& req) {
   SendRequestWithRetry(res, req);
 }
 
+bool IsIndexReady(const std::string& share) {
+  Json::Value req(Json::objectValue);
+  req["command"] = "index_list";
+  Json::Value res;
+  try {
+    SendRequestImpl(res, req);
+  } catch (const Error&) {
+    return false;
+  }
+  const std::string id = GetFileIndexID(share);
+  for (const Json::Value& index : res["data"]) {
+    if (index.isObject() && index["id"] == id) return index["state"] != "opening";
+  }
+  return true;  // no such index: its requests fail at once, not busy
+}
+
 void ShareIndexCreate(const std::string& share) {
   Json::Value req = MakeRequest("index_create", share);
   req["data"]["path"] = sdk::SDKShare(share).GetDBPath();

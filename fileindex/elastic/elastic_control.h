@@ -22,6 +22,12 @@ void SendRequestWithRetry(Json::Value& res, const Json::Value& req);
 // The same, for commands whose answer is not needed.
 void SendRequestNoResult(const Json::Value& req);
 
+// False while the search daemon cannot take the share's requests at once:
+// it does not run, or it is still opening the share's index after a start
+// (a request would then be answered busy, which the busy retry waits out for
+// a quarter of an hour). One request, without the busy retry.
+bool IsIndexReady(const std::string& share);
+
 // Share indexes.
 void ShareIndexCreate(const std::string& share);
 void ShareIndexDelete(const std::string& share);

@@ -163,7 +163,22 @@ void OpApplier::Attr(const std::string& path) {
 
 void OpApplier::Delete(const std::string& path) {
   settle_.Forget(path);
+  DeleteDocument(path);
+}
+
+void OpApplier::DeleteDocument(const std::string& path) {
   Guard("delete", path, [&] { elastic::IndexDel(share_, path); });
+}
+
+void OpApplier::Refresh(const std::string& path) {
+  const Kind kind = KindOf(path);
+  if (kind == Kind::kMissing) {
+    DeleteDocument(path);
+    return;
+  }
+  if (kind == Kind::kDir) return;
+  const Verdict verdict = rules_.Judge(path, false);
+  if (verdict.index) UpsertFile(path, verdict.need_meta, false);
 }
 
 bool OpApplier::SameSettings(const std::string& a, const std::string& b) const {
@@ -202,12 +217,18 @@ void OpApplier::Rename(const std::string& from, const std::string& to) {
       }
     });
   }
+  // Documents still held under an old name the disk no longer has are
+  // ghosts: a rename cut short by a crash and replayed, or moves of a killed
+  // indexer's last request that the search daemon finished after it. No later
+  // event names that path again, so they go now.
+  const bool from_gone = KindOf(from) == Kind::kMissing;
+  if (from_gone) DeleteTree(from);
   if (kind == Kind::kMissing) {
     // Moved on again already; the event that moved it is queued behind this one.
     return;
   }
   if (!moved) {
-    DeleteTree(from);
+    if (!from_gone) DeleteTree(from);
     if (is_dir) {
       Reindex(to);
     } else {
@@ -279,8 +300,7 @@ void OpApplier::Resync(const std::vector<std::string>& roots, const std::string&
   for (const auto& [path, stamp] : indexed) {
     if (keep.count(path) != 0) continue;
     CheckInterrupt();
-    settle_.Forget(path);
-    Guard("delete", path, [&] { elastic::IndexDel(share_, path); });
+    Delete(path);
   }
 }
 
@@ -323,8 +343,7 @@ void OpApplier::UpdateCfg(const std::string& path, const Json::Value& changed) {
         work.push_back(Pending{entry.path, verdict.need_meta});
         continue;
       }
-      settle_.Forget(entry.path);
-      Guard("delete", entry.path, [&] { elastic::IndexDel(share_, entry.path); });
+      Delete(entry.path);
     }
     progress_.Done(share_);
   }

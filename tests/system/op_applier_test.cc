@@ -103,6 +103,47 @@ TEST_F(OpApplierTest, ARenameWithoutAnOldDocumentIsReadFromDisk) {
                                   "document_del_by_query " + Docs("old.c") + "/", "document_upsert_by_id " + Docs("new.c")}));
 }
 
+// After a crash a rename is applied again over what its first run already
+// moved, or its target has moved on: whatever the index still holds under an
+// old name that is gone from disk is removed, whether the move found a document.
+TEST_F(OpApplierTest, ARenameWhoseSourceIsGoneRemovesWhatIsLeftUnderIt) {
+  root_.WriteFile("volume1/share/docs/C.c", "x");
+  Json::Value below(Json::arrayValue);
+  below.append(Json::Value(Json::objectValue));
+  below[0]["CORVMDPath"] = Docs("B/f.c");
+  below[0]["CORVMDFSName"] = "f.c";
+  below[0]["CORVMDParent"] = Docs("B");
+  const std::string set = "document_set_by_id " + Docs("B");
+  const std::string listed = "document_get_by_query " + Docs("B") + "/";
+  const std::string compound = " ";  // carries no command of its own
+  const std::string del = "document_del_by_id " + Docs("B");
+  const std::string del_below = "document_del_by_query " + Docs("B") + "/";
+  struct Case {
+    const char* name;
+    const char* to;
+    bool old_document;  // B's own document is still there to move
+    Lines expected;
+  };
+  const std::vector<Case> cases = {
+      {"target gone, no old document", "gone", false, Lines{set, del, del_below}},
+      {"target gone, old document moved", "gone", true, Lines{set, listed, compound, del, del_below}},
+      {"target there, old document moved", "C.c", true, Lines{set, listed, compound, del, del_below}},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    const size_t before = daemon_.Requests().size();
+    if (c.old_document) {
+      daemon_.Enqueue(FakeAnswer::Success(Json::Value(Json::objectValue)));
+      daemon_.Enqueue(FakeAnswer::Success(below));
+    } else {
+      daemon_.Enqueue(FakeAnswer::Failure(2020, "No document with the id"));
+    }
+    applier_->Rename(Docs("B"), Docs(c.to));
+    const Lines sent = Sent();
+    EXPECT_EQ(Lines(sent.begin() + before, sent.end()), c.expected);
+  }
+}
+
 TEST_F(OpApplierTest, ARenameIntoAHiddenFolderRemovesTheDocuments) {
   root_.MakeDir("volume1/share/docs/@tmp");
   root_.WriteFile("volume1/share/docs/@tmp/a.c", "x");

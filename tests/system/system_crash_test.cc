@@ -7,8 +7,10 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <filesystem>
+#include <algorithm>
 #include <cstdlib>
+#include <filesystem>
+#include <thread>
 
 #include "common/json_util.h"
 #include "fileindex/communication.h"
@@ -59,6 +61,102 @@ TEST(SystemCrashTest, KillDuringALargeBatchThenRestartConverges) {
   ASSERT_EQ(rename(box.Path("bulk/d1").c_str(), box.Path("bulk/moved").c_str()), 0);
   box.StartIndexer();
   ASSERT_EQ(box.Converge(box.DiskPaths("bulk"), std::chrono::seconds(120)), "");
+}
+
+// The indexer dies while it moves the documents of a large folder, and the
+// folder moves on again before it is back: nothing may stay under the name
+// in between, which the disk no longer has.
+TEST(SystemCrashTest, KillDuringAFolderRenameThenAnotherRenameConverges) {
+  SystemSandbox box;
+  fs::create_directories(box.Path("big/A"));
+  for (int i = 0; i < 2000; ++i) WriteText(box.Path("big/A/f" + std::to_string(i) + ".txt"), "renamed " + std::to_string(i));
+  box.StartAll();
+  box.AddFolder("big");
+  ASSERT_EQ(box.Converge(box.DiskPaths("big"), std::chrono::seconds(120)), "");
+
+  ASSERT_EQ(rename(box.Path("big/A").c_str(), box.Path("big/B").c_str()), 0);
+  ASSERT_TRUE(PollUntil([&] { return box.IndexerStatus().find("\"indexing\"") != std::string::npos; },
+                        std::chrono::seconds(30)));
+  box.StopIndexer(SIGKILL);
+  ASSERT_EQ(rename(box.Path("big/B").c_str(), box.Path("big/C").c_str()), 0);
+  box.StartIndexer();
+  ASSERT_EQ(box.Converge(box.DiskPaths("big"), std::chrono::seconds(120)), "");
+}
+
+// Files written into `relative` while indexing is paused, so that they make
+// one batch when it resumes; returns once the batch is under way.
+void StartABulkBatch(SystemSandbox& box, const std::string& relative, int files) {
+  fileindex::StatusMgr().Pause(0);
+  for (int i = 0; i < files; ++i) WriteText(box.Path(relative + "/f" + std::to_string(i) + ".txt"), "bulk " + std::to_string(i));
+  const std::string last = "f" + std::to_string(files - 1) + ".txt";
+  ASSERT_TRUE(PollUntil([&] { return ReadFileText(box.Path("@eaDir/fileindex.queue")).find(last) != std::string::npos; },
+                        std::chrono::seconds(30)));
+  fileindex::StatusMgr().Resume();
+  ASSERT_TRUE(MidBatch(box)) << box.Logs();
+}
+
+size_t CountBelow(const std::set<std::string>& paths, const std::string& folder) {
+  return std::count_if(paths.begin(), paths.end(), [&](const std::string& path) { return path.rfind(folder + "/", 0) == 0; });
+}
+
+uint64_t TotalExtracted(SystemSandbox& box) {
+  Json::Value status;
+  JsonFromString(status, box.IndexerStatus());
+  return status["shares"]["share"]["total_extracted"].asUInt64();
+}
+
+TEST(SystemCrashTest, AFileWrittenDuringABulkBatchIsSearchableBeforeTheBatchEnds) {
+  SystemSandbox box;
+  fs::create_directories(box.Path("top/bulk"));
+  fs::create_directories(box.Path("top/inbox"));
+  box.StartAll();
+  box.AddFolder("top");
+  ASSERT_EQ(box.Converge(box.DiskPaths("top")), "");
+
+  constexpr int kBulk = 3000;
+  StartABulkBatch(box, "top/bulk", kBulk);
+  WriteText(box.Path("top/inbox/fresh.txt"), "a zebrafinch arrived");
+  ASSERT_TRUE(PollUntil([&] { return box.Search("zebrafinch").size() == 1; }, std::chrono::seconds(120))) << box.Logs();
+  // It did not wait for the bulk batch to end.
+  EXPECT_LT(CountBelow(box.IndexedPaths(), box.Path("top/bulk")), static_cast<size_t>(kBulk));
+  ASSERT_EQ(box.Converge(box.DiskPaths("top"), std::chrono::seconds(120)), "");
+}
+
+// The search daemon dies in the middle of a large batch: what was committed
+// before is not done again, and the indexer follows the restarted daemon at
+// once instead of after its grown back-off.
+TEST(SystemCrashTest, ASearchDaemonRestartCostsOnlyTheUncommittedSlice) {
+  SystemSandbox box;
+  fs::create_directories(box.Path("bulk"));
+  box.StartAll();
+  box.AddFolder("bulk");
+  ASSERT_EQ(box.Converge(box.DiskPaths("bulk")), "");
+
+  constexpr int kBulk = 3000;
+  StartABulkBatch(box, "bulk", kBulk);
+  ASSERT_TRUE(PollUntil([&] { return TotalExtracted(box) >= kBulk / 2; }, std::chrono::seconds(120))) << box.Logs();
+  box.StopSearchDaemon(SIGKILL);
+  const uint64_t extracted_at_kill = TotalExtracted(box);
+  box.StartSearchDaemon();
+  ASSERT_EQ(box.Converge(box.DiskPaths("bulk"), std::chrono::seconds(120)), "");
+  // Whole batch again would be kBulk + extracted_at_kill.
+  EXPECT_LT(TotalExtracted(box), kBulk + extracted_at_kill / 2) << extracted_at_kill;
+}
+
+TEST(SystemCrashTest, TheIndexerFollowsARestartedSearchDaemonWithinItsBackOff) {
+  SystemSandbox box;
+  fs::create_directories(box.Path("docs"));
+  box.StartAll();
+  box.AddFolder("docs");
+  ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
+
+  box.StopSearchDaemon(SIGKILL);
+  WriteText(box.Path("docs/late.txt"), "written while searching was down");
+  // The indexer's attempts fail and its back-off grows: 1, 2, 4, 8, then 16 s.
+  std::this_thread::sleep_for(std::chrono::seconds(17));
+  box.StartSearchDaemon();
+  // The next attempt of the back-off alone would come some 14 s from here.
+  ASSERT_EQ(box.Converge(box.DiskPaths("docs"), std::chrono::seconds(10)), "") << box.Logs();
 }
 
 TEST(SystemCrashTest, LostNotificationsLeadToAFullReindexThatConverges) {
