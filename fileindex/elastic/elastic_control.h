@@ -4,6 +4,7 @@
 #pragma once
 
 #include <json/json.h>
+#include <sys/types.h>
 
 #include <string>
 #include <vector>
@@ -53,6 +54,11 @@ void IndexRename(const std::string& share, const std::string& path_from, const s
 // Appends the paths of the documents below `prefix` to `paths`, in the
 // daemon's order; Error 916 when the answer carries no list.
 void IndexGetByPrefixPath(const std::string& share, const std::string& prefix, std::vector<std::string>& paths);
+// The paths of the documents of one file, by its device and inode (every
+// name of a file with hard links that the index holds).
+std::vector<std::string> IndexPathsOfFile(const std::string& share, dev_t device, ino_t inode);
+// "<device>:<inode>", the value of the file-identity field.
+std::string FileIdentity(dev_t device, ino_t inode);
 // Makes the share's changes durable. When that fails on a volume short of
 // space, the share is marked for reindexing and Error 1003 is thrown.
 void IndexCommit(const std::string& share);

@@ -99,11 +99,39 @@ void OpApplier::Apply(const fileindex::OP& op) {
   progress_.Done(share_);
 }
 
-void OpApplier::UpsertFile(const std::string& path, bool need_meta, bool settle) {
-  if (settle && !settle_.Admit(path, SettleTracker::Clock::now())) return;  // its turn comes later
+bool OpApplier::UpsertFile(const std::string& path, bool need_meta, bool settle) {
+  if (settle && !settle_.Admit(path, SettleTracker::Clock::now())) return false;  // its turn comes later
   Guard("upsert", path, [&] {
     elastic::IndexUpsert(share_, path, need_meta);
     progress_.Extracted(share_);
+  });
+  return true;
+}
+
+void OpApplier::ReachOtherNames(const std::string& path, bool attributes_only) {
+  struct stat st;
+  if (lstat(path.c_str(), &st) != 0 || S_ISDIR(st.st_mode) || st.st_nlink < 2) {
+    errno = 0;
+    return;
+  }
+  Guard("update of the other names of", path, [&] {
+    for (const std::string& other : elastic::IndexPathsOfFile(share_, st.st_dev, st.st_ino)) {
+      struct stat other_st;
+      const bool same_file = other != path && lstat(other.c_str(), &other_st) == 0 && other_st.st_dev == st.st_dev &&
+                             other_st.st_ino == st.st_ino;
+      errno = 0;
+      if (!same_file) continue;  // moved or replaced since: its own events say what became of it
+      const Verdict verdict = rules_.Judge(other, false);
+      if (!verdict.index) continue;
+      Guard(attributes_only ? "attribute update" : "upsert", other, [&] {
+        if (attributes_only) {
+          elastic::IndexAttr(share_, other);
+        } else {
+          elastic::IndexUpsert(share_, other, verdict.need_meta);
+        }
+        progress_.Extracted(share_);
+      });
+    }
   });
 }
 
@@ -133,14 +161,17 @@ bool OpApplier::Present(const std::string& path, Kind* kind, Verdict* verdict) {
 void OpApplier::Upsert(const std::string& path) {
   Kind kind;
   Verdict verdict;
-  if (Present(path, &kind, &verdict)) UpsertFile(path, verdict.need_meta, kind == Kind::kFile);
+  if (!Present(path, &kind, &verdict)) return;
+  if (UpsertFile(path, verdict.need_meta, kind == Kind::kFile) && kind == Kind::kFile) ReachOtherNames(path, false);
 }
 
 void OpApplier::UpsertSettled(const std::string& path) {
   const Kind kind = KindOf(path);
   if (kind == Kind::kMissing) return;  // its delete was (or will be) queued
   const Verdict verdict = rules_.Judge(path, kind == Kind::kDir);
-  if (verdict.index) UpsertFile(path, verdict.need_meta, false);
+  if (!verdict.index) return;
+  UpsertFile(path, verdict.need_meta, false);
+  if (kind == Kind::kFile) ReachOtherNames(path, false);
 }
 
 void OpApplier::Attr(const std::string& path) {
@@ -159,6 +190,7 @@ void OpApplier::Attr(const std::string& path) {
       progress_.Extracted(share_);
     }
   });
+  if (kind == Kind::kFile) ReachOtherNames(path, true);
 }
 
 void OpApplier::Delete(const std::string& path) {

@@ -84,7 +84,12 @@ class OpApplier {
   };
   // Runs one file's step; a per-file error is logged and counted.
   void Guard(const std::string& what, const std::string& path, const std::function<void()>& step);
-  void UpsertFile(const std::string& path, bool need_meta, bool settle);
+  // False when the settle interval deferred it.
+  bool UpsertFile(const std::string& path, bool need_meta, bool settle);
+  // A file with hard links changed through `path`: its other names that the
+  // index holds get the new document too (only its attributes when
+  // `attributes_only`), since no event names them.
+  void ReachOtherNames(const std::string& path, bool attributes_only);
   struct Pending {
     std::string path;
     bool need_meta = false;

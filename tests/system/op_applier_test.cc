@@ -2,9 +2,11 @@
 // search daemon; extraction is a stand-in platform answer.
 #include <gtest/gtest.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <filesystem>
+#include <functional>
 #include <memory>
 
 #include "common/error.h"
@@ -142,6 +144,45 @@ TEST_F(OpApplierTest, ARenameWhoseSourceIsGoneRemovesWhatIsLeftUnderIt) {
     const Lines sent = Sent();
     EXPECT_EQ(Lines(sent.begin() + before, sent.end()), c.expected);
   }
+}
+
+// A file with three names, changed through one: the others the index holds
+// get the new document (attributes only for an attribute change); a name
+// that is no longer this file is left to its own events.
+TEST_F(OpApplierTest, AChangeThroughOneHardLinkReachesItsOtherNames) {
+  root_.WriteFile("volume1/share/docs/a.c", "x");
+  root_.WriteFile("volume1/share/docs/other.c", "another file");
+  ASSERT_EQ(link(Docs("a.c").c_str(), Docs("b.c").c_str()), 0);
+  ASSERT_EQ(link(Docs("a.c").c_str(), Docs("c.c").c_str()), 0);
+  Json::Value names(Json::arrayValue);
+  for (const char* name : {"a.c", "b.c", "c.c", "other.c"}) {
+    Json::Value doc(Json::objectValue);
+    doc["CORVMDPath"] = Docs(name);
+    names.append(doc);
+  }
+  struct Case {
+    const char* name;
+    std::function<void()> apply;
+    std::string command;
+  };
+  const std::vector<Case> cases = {
+      {"upsert", [&] { applier_->Upsert(Docs("a.c")); }, "document_upsert_by_id "},
+      {"attributes", [&] { applier_->Attr(Docs("a.c")); }, "document_set_by_id "},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    const size_t before = daemon_.Requests().size();
+    daemon_.Enqueue(FakeAnswer::Success(Json::Value(Json::objectValue)));
+    daemon_.Enqueue(FakeAnswer::Success(names));
+    c.apply();
+    const Lines sent = Sent();
+    EXPECT_EQ(Lines(sent.begin() + before, sent.end()),
+              (Lines{c.command + Docs("a.c"), "document_get_by_query ", c.command + Docs("b.c"), c.command + Docs("c.c")}));
+  }
+  // The query asks for the file's identity, which every stored document carries.
+  const Json::Value query = daemon_.Requests()[1]["data"]["query"]["qsl"]["term"]["CORVMDFSFileID"];
+  EXPECT_TRUE(query.isString() && !query.asString().empty()) << daemon_.Requests()[1];
+  EXPECT_EQ(daemon_.Requests()[0]["data"]["data"]["CORVMDFSFileID"], query);
 }
 
 TEST_F(OpApplierTest, ARenameIntoAHiddenFolderRemovesTheDocuments) {
