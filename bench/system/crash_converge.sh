@@ -20,6 +20,7 @@ probe="$BUILD/bench/system/system_index_probe"
 share="$SCRATCH/crash"
 work="$share/work"
 stop_file="$SCRATCH/stop-work"
+step_file="$SCRATCH/next-step"
 
 bench_start crash
 mkdir -p "$work"
@@ -35,9 +36,9 @@ work_step() {  # step number: creates a folder of files, renames the previous on
   echo "line $step" >> "$work/seed1.txt"
 }
 
-work_loop() {  # runs steps until the stop file appears
+work_loop() {  # runs steps until the stop file appears; the next step's number goes to $step_file
   local step=$1
-  while [ ! -e "$stop_file" ]; do work_step "$step"; step=$((step + 1)); done
+  while [ ! -e "$stop_file" ]; do work_step "$step"; step=$((step + 1)); echo "$step" > "$step_file"; done
 }
 
 disk_paths() { find "$share" -path "$share/@eaDir" -prune -o -print | sort; }
@@ -45,13 +46,13 @@ index_paths() { "$probe" paths crash 2>/dev/null | sort; }
 
 now_ms() { date +%s%3N; }
 
-step=0
+echo 1 > "$step_file"
 for daemon in $DAEMONS; do
   times=()
   failed=0
   for kill in $(seq "$KILLS"); do
     rm -f "$stop_file"
-    work_loop $((step + 1)) &
+    work_loop "$(cat "$step_file")" &
     worker=$!
     sleep "$(awk -v r=$RANDOM 'BEGIN {printf "%.2f", 0.5 + 2.5 * r / 32768}')"
     kill -KILL "$(cat "$(system_pid_file "$daemon")")"
@@ -59,7 +60,6 @@ for daemon in $DAEMONS; do
     system_start > /dev/null
     touch "$stop_file"
     wait "$worker"
-    step=$((step + 1000))
     start=$(now_ms)
     deadline=$((start + LIMIT * 1000))
     until [ "$(disk_paths)" = "$(index_paths)" ]; do
