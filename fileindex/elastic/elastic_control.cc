@@ -128,8 +128,10 @@ bool IsIndexReady(const std::string& share) {
   Json::Value res;
   try {
     SendRequestImpl(res, req);
-  } catch (const Error&) {
-    return false;
+  } catch (const Error& error) {
+    // Not running, or not taking requests yet. Any other answer is for the
+    // real requests to meet and report.
+    return error.code != kErrorSearchRequest && !IsElasticBusyCode(error.code);
   }
   const std::string id = GetFileIndexID(share);
   for (const Json::Value& index : res["data"]) {

@@ -56,6 +56,8 @@ void FreshLane::Run() {
       // The search daemon's trouble is the batch's to report and retry; the
       // lines stay in the queue for it.
     } catch (const BatchInterrupted&) {
+    } catch (const std::exception& error) {
+      CORV_LOG("fresh files of share %s: %s", share_.c_str(), error.what());
     }
     lock.lock();
   }

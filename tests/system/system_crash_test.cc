@@ -133,13 +133,20 @@ uint64_t TotalExtracted(SystemSandbox& box) {
   return status["shares"]["share"]["total_extracted"].asUInt64();
 }
 
+// Starts the daemons with the folder /share/<folder> (and `extra`, below it)
+// created, added and indexed.
+void StartWithFolder(SystemSandbox& box, const std::string& folder, const std::string& extra = "") {
+  fs::create_directories(box.Path(folder));
+  if (!extra.empty()) fs::create_directories(box.Path(folder + "/" + extra));
+  box.StartAll();
+  box.AddFolder(folder);
+  ASSERT_EQ(box.Converge(box.DiskPaths(folder)), "");
+}
+
 TEST(SystemCrashTest, AFileWrittenDuringABulkBatchIsSearchableBeforeTheBatchEnds) {
   SystemSandbox box;
-  fs::create_directories(box.Path("top/bulk"));
+  StartWithFolder(box, "top", "bulk");
   fs::create_directories(box.Path("top/inbox"));
-  box.StartAll();
-  box.AddFolder("top");
-  ASSERT_EQ(box.Converge(box.DiskPaths("top")), "");
 
   constexpr int kBulk = 3000;
   StartABulkBatch(box, "top/bulk", kBulk);
@@ -155,11 +162,7 @@ TEST(SystemCrashTest, AFileWrittenDuringABulkBatchIsSearchableBeforeTheBatchEnds
 // once instead of after its grown back-off.
 TEST(SystemCrashTest, ASearchDaemonRestartCostsOnlyTheUncommittedSlice) {
   SystemSandbox box;
-  fs::create_directories(box.Path("bulk"));
-  box.StartAll();
-  box.AddFolder("bulk");
-  ASSERT_EQ(box.Converge(box.DiskPaths("bulk")), "");
-
+  StartWithFolder(box, "bulk");
   constexpr int kBulk = 3000;
   StartABulkBatch(box, "bulk", kBulk);
   ASSERT_TRUE(PollUntil([&] { return TotalExtracted(box) >= kBulk / 2; }, std::chrono::seconds(120))) << box.Logs();
@@ -173,11 +176,7 @@ TEST(SystemCrashTest, ASearchDaemonRestartCostsOnlyTheUncommittedSlice) {
 
 TEST(SystemCrashTest, TheIndexerFollowsARestartedSearchDaemonWithinItsBackOff) {
   SystemSandbox box;
-  fs::create_directories(box.Path("docs"));
-  box.StartAll();
-  box.AddFolder("docs");
-  ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
-
+  StartWithFolder(box, "docs");
   box.StopSearchDaemon(SIGKILL);
   WriteText(box.Path("docs/late.txt"), "written while searching was down");
   // The indexer's attempts fail and its back-off grows: 1, 2, 4, 8, then 16 s.
