@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <filesystem>
+#include <fstream>
 #include <functional>
 #include <memory>
 
@@ -13,6 +14,7 @@
 #include "fileindex/folder_mgr.h"
 #include "fileindex/optree.h"
 #include "platform/linux/linux_platform.h"
+#include "programs/fileindexd/fresh_lane.h"
 #include "programs/fileindexd/index_rules.h"
 #include "programs/fileindexd/op_applier.h"
 #include "programs/fileindexd/progress.h"
@@ -183,6 +185,39 @@ TEST_F(OpApplierTest, AChangeThroughOneHardLinkReachesItsOtherNames) {
   const Json::Value query = daemon_.Requests()[1]["data"]["query"]["qsl"]["term"]["CORVMDFSFileID"];
   EXPECT_TRUE(query.isString() && !query.asString().empty()) << daemon_.Requests()[1];
   EXPECT_EQ(daemon_.Requests()[0]["data"]["data"]["CORVMDFSFileID"], query);
+}
+
+// The fresh lane reads what the notifier appended to the live queue: the
+// files of a folder with few new lines are stored (or their documents
+// deleted) and committed; bulk folders, renames and folders wait for the
+// in-order pass; a file is refreshed again only when it changed.
+TEST_F(OpApplierTest, TheFreshLaneStoresTheFilesOfSmallGroupsOnly) {
+  const std::string queue = root_.path() + "/fileindex.queue";
+  const auto line = [](int event, const std::string& path, bool is_dir = false) {
+    return R"({"event": )" + std::to_string(event) + R"(, "is_dir": )" + (is_dir ? "true" : "false") +
+           R"(, "path": ")" + path + "\"}\n";
+  };
+  root_.WriteFile("volume1/share/docs/new.c", "fresh");
+  root_.MakeDir("volume1/share/docs/bulk");
+  std::string lines = line(0x40, Docs("new.c")) + line(0x80, Docs("gone.c")) + line(0x40, Docs("bulk"), true) +
+                      R"({"event": 256, "path": ")" + Docs("moved.c") + R"(", "path_old": ")" + Docs("was.c") + "\"}\n";
+  for (int i = 0; i < 9; ++i) {
+    root_.WriteFile("volume1/share/docs/bulk/f" + std::to_string(i) + ".c", "bulk");
+    lines += line(0x40, Docs("bulk/f" + std::to_string(i) + ".c"));
+  }
+  root_.WriteFile("fileindex.queue", lines + R"({"event": 2, "path": ")" + Docs("new"));
+  FreshLane lane("share", queue, *applier_, FreshLaneOptions());
+  EXPECT_EQ(lane.Look(), 2u);
+  EXPECT_EQ(Sent(), (Lines{"document_upsert_by_id " + Docs("new.c"), "document_del_by_id " + Docs("gone.c"), "commit "}));
+
+  // The half line, completed, names the same unchanged file: nothing to do.
+  std::ofstream(queue, std::ios::app) << ".c\"}\n" << line(0x2, Docs("new.c"));
+  EXPECT_EQ(lane.Look(), 0u);
+  // Changed since: stored again.
+  root_.WriteFile("volume1/share/docs/new.c", "fresher and longer");
+  std::ofstream(queue, std::ios::app) << line(0x2, Docs("new.c"));
+  EXPECT_EQ(lane.Look(), 1u);
+  EXPECT_EQ(daemon_.Requests().size(), 5u);
 }
 
 TEST_F(OpApplierTest, ARenameIntoAHiddenFolderRemovesTheDocuments) {
