@@ -10,6 +10,7 @@
 #include "common/sys.h"
 #include "fileindex/constants.h"
 #include "fileindex/custom_event.h"
+#include "fileindex/elastic/comm.h"
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr.h"
@@ -191,9 +192,10 @@ bool ShareWorker::RunOnce() {
 
   if (status & fileindex::kShareStatusNeedReindex) {
     progress_.StartBatch(share_, 1);
+    const pid_t daemon = LastSearchDaemonPid();
     applier.FullReindex();
     progress_.Done(share_);
-    fileindex::elastic::IndexCommit(share_);
+    CommitSince(daemon);
     fileindex::StatusMgr().UnsetShareStatus(share_, fileindex::kShareStatusNeedReindex);
     progress_.EndBatch(share_);
     worked = true;
@@ -222,11 +224,12 @@ bool ShareWorker::RunOnce() {
     lane.Start();
     ApplyInSlices(applier, ops, first, mark);
   }
+  const pid_t daemon = LastSearchDaemonPid();
   for (const std::string& path : due) {
     applier.UpsertSettled(path);
     progress_.Done(share_);
   }
-  fileindex::elastic::IndexCommit(share_);
+  CommitSince(daemon);
   settle_->Confirm(due, SettleTracker::Clock::now());
   // The deferred files must be on disk before the queue that named them goes.
   CORV_CHECK_THROW(!settle_->Save(), kErrorSaveJson, "Failed to save json: " + queue_path_ + kSettleSuffix);
@@ -252,15 +255,25 @@ bool ShareWorker::RunOnce() {
 void ShareWorker::ApplyInSlices(OpApplier& applier, const std::vector<std::shared_ptr<fileindex::OP>>& ops,
                                 size_t first, const BatchMark& mark) {
   auto slice_end = std::chrono::steady_clock::now() + options_.slice;
+  pid_t daemon = LastSearchDaemonPid();
   for (size_t i = first; i < ops.size(); ++i) {
     CheckInterrupt();
     applier.Apply(*ops[i]);
-    if (i + 1 == ops.size() || std::chrono::steady_clock::now() < slice_end) continue;
+    if (i + 1 < ops.size() && std::chrono::steady_clock::now() < slice_end) continue;
+    CommitSince(daemon);
     // What the deferred list gained in this slice must survive its skipping.
-    fileindex::elastic::IndexCommit(share_);
     if (settle_->Save()) mark.Save(i + 1);
     slice_end = std::chrono::steady_clock::now() + options_.slice;
+    daemon = LastSearchDaemonPid();
   }
+}
+
+void ShareWorker::CommitSince(pid_t daemon) {
+  fileindex::elastic::IndexCommit(share_);
+  // A daemon restarted between two requests answers the next one as if
+  // nothing happened, but the writes before were not committed and are gone.
+  CORV_CHECK_THROW(LastSearchDaemonPid() != daemon, kErrorSearchRequest,
+                   "corvelasticd restarted during the batch; it goes on from its last committed slice");
 }
 
 }  // namespace fileindexd

@@ -5,6 +5,8 @@
 // and the extractions its settle tracker deferred.
 #pragma once
 
+#include <sys/types.h>
+
 #include <atomic>
 #include <chrono>
 #include <functional>
@@ -62,6 +64,9 @@ class ShareWorker {
   // Waits out `backoff`, or less when the search daemon, which was not
   // reachable, accepts connections again.
   void WaitToRetry(const Error& error, std::chrono::milliseconds backoff);
+  // Commits; Error 913 when the search daemon that took the commit is not the
+  // one that answered at `daemon` (a restart lost the writes in between).
+  void CommitSince(pid_t daemon);
   // Waits while the search daemon is down or still opening the share's index
   // (after its restart), so that no request of a round meets its busy answer.
   void WaitUntilIndexReady();
