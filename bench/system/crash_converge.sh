@@ -67,7 +67,10 @@ for daemon in $DAEMONS; do
         diff <(disk_paths) <(index_paths) | grep '^[<>]' > "$SCRATCH/diff" || true
         echo "$daemon kill $kill: NOT converged after $LIMIT s: $(grep -c '^<' "$SCRATCH/diff") on disk only, $(grep -c '^>' "$SCRATCH/diff") in the index only (e.g. $(head -1 "$SCRATCH/diff"))"
         failed=$((failed + 1))
-        "$(system_program fileindex)" folder reindex /crash --wait > /dev/null
+        # A daemon that hangs is reported above and started afresh here.
+        system_running fileindexd || system_start > /dev/null
+        "$(system_program fileindex)" folder reindex /crash --wait --timeout 120 > /dev/null ||
+          echo "$daemon kill $kill: the reindex did not finish either (fileindexd stuck?)"
         break
       fi
       sleep 0.2
