@@ -198,6 +198,10 @@ const char kFileIndexMappingsText[] = R"json({
 		"CORVMDSpotlightBoost": {
 			"type": "text",
 			"analyzer": "white space"
+		},
+		"CORVMDFSFileID": {
+			"analyzer": "keyword",
+			"_all": false
 		}
 	}
 })json";

@@ -17,6 +17,8 @@ inline constexpr char kFieldSearchFileName[] = "CORVMDSearchFileName";
 inline constexpr char kFieldDisplayName[] = "CORVMDDisplayName";
 inline constexpr char kFieldKind[] = "CORVMDKind";
 inline constexpr char kFieldExtension[] = "CORVMDExtension";
+// "<device>:<inode>" of a file: the names of one file (hard links) share it.
+inline constexpr char kFieldFileID[] = "CORVMDFSFileID";
 // Content-extraction option: also extract the file's metadata.
 inline constexpr char kOptionNeedMeta[] = "need_meta";
 

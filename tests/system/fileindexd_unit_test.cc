@@ -7,11 +7,13 @@
 #include <algorithm>
 #include <filesystem>
 #include <fstream>
+#include <functional>
 
 #include "common/error.h"
 #include "common/file_util.h"
 #include "common/json_util.h"
 #include "fileindex/folder_mgr.h"
+#include "programs/fileindexd/batch_mark.h"
 #include "programs/fileindexd/command_server.h"
 #include "programs/fileindexd/folder_walker.h"
 #include "programs/fileindexd/index_rules.h"
@@ -198,6 +200,35 @@ TEST(CommandServerTest, AnswersCarryTheCodeAndRefuseChangesFromOtherUsers) {
   }
   // The refused command never reached the handler.
   EXPECT_EQ(std::count(seen.begin(), seen.end(), "resume"), 0);
+}
+
+// How far a batch got is trusted only for the very file it was saved for.
+TEST(BatchMarkTest, ACountHoldsForItsOwnBatchFileOnly) {
+  SandboxRoot root;
+  const std::string batch = root.WriteFile("queue.tmp", "line 1\nline 2\n");
+  const BatchMark mark(batch);
+  EXPECT_EQ(mark.Load(), 0u);  // none saved
+  ASSERT_TRUE(mark.Save(5));
+  EXPECT_EQ(mark.Load(), 5u);
+  const struct {
+    const char* name;
+    std::function<void()> change;
+  } cases[] = {
+      {"grown", [&] { std::ofstream(batch, std::ios::app) << "line 3\n"; }},
+      {"replaced", [&] { root.WriteFile("queue.tmp", "another batch\n"); }},
+      {"gone", [&] { unlink(batch.c_str()); }},
+  };
+  for (const auto& c : cases) {
+    root.WriteFile("queue.tmp", "line 1\nline 2\n");
+    ASSERT_TRUE(mark.Save(5));
+    c.change();
+    EXPECT_EQ(mark.Load(), 0u) << c.name;
+  }
+  root.WriteFile("queue.tmp", "line 1\nline 2\n");
+  ASSERT_TRUE(mark.Save(2));
+  mark.Clear();
+  EXPECT_EQ(mark.Load(), 0u);
+  EXPECT_FALSE(IsFileExist(batch + ".applied"));
 }
 
 TEST(ProgressBoardTest, CountsPerShareAndResetsAtTheEndOfABatch) {

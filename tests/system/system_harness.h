@@ -38,6 +38,9 @@ class SystemSandbox {
   void StartAll(const std::vector<std::string>& indexer_args = {},
                 const std::map<std::string, std::string>& notifier_env = {});
   void StartIndexer(const std::vector<std::string>& args = {});
+  // corvelasticd alone (after StopSearchDaemon), and its kill -9 (or another signal).
+  void StartSearchDaemon();
+  void StopSearchDaemon(int signal);
   // kill -9 (or another signal) of fileindexd.
   void StopIndexer(int signal);
   ChildProcess& indexer() { return *indexer_; }
