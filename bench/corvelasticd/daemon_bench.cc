@@ -29,7 +29,7 @@
 
 #include "common/json_util.h"
 #include "fileindex/communication.h"
-#include "programs/corvelasticd/request_frame.h"
+#include "fileindex/frame_reader.h"
 
 namespace {
 
@@ -66,7 +66,7 @@ Json::Value Request(const Json::Value& request) {
   if (fd < 0) throw std::runtime_error("connect failed");
   corvlumex::fileindex::WriteFrame(fd, JsonToString(request));
   std::string text;
-  corvlumex::elasticd::ReadRequestFrame(fd, 1u << 30, 600000, 600000, &text);
+  corvlumex::fileindex::ReadFrameBounded(fd, 1u << 30, 600000, 600000, &text);
   close(fd);
   Json::Value answer;
   JsonFromString(answer, text);

@@ -35,7 +35,9 @@ SortRequest ParseSort(const Json::Value& sort) {
     request.descending = request.field == "_score";
   } else if (first.isObject() && first["field"].isString()) {
     request.field = first["field"].asString();
-    const std::string order = first.get("order", request.field == "_score" ? "desc" : "asc").asString();
+    const Json::Value& given = first["order"];
+    if (!given.isNull() && !given.isString()) throw DaemonError(kCodeBadArgument, "\"order\" must be \"asc\" or \"desc\"");
+    const std::string order = given.isNull() ? (request.field == "_score" ? "desc" : "asc") : given.asString();
     if (order != "asc" && order != "desc") throw DaemonError(kCodeBadArgument, "\"order\" must be \"asc\" or \"desc\"");
     request.descending = order == "desc";
   } else {
@@ -101,7 +103,8 @@ Json::Value RunSearch(const IndexRegistry& registry, const Json::Value& data, co
   const int64_t from = OptionalInt(data, "from", 0);
   const int64_t size = OptionalInt(data, "size", kDefaultSize);
   if (from < 0 || size < 0 || size > kMaxSize) throw DaemonError(kCodeBadArgument, "\"size\" must be 0.." + std::to_string(kMaxSize) + " and \"from\" at least 0");
-  if (from + size > kMaxWindow) throw DaemonError(kCodeBadArgument, "\"from\" + \"size\" must not exceed " + std::to_string(kMaxWindow));
+  // Compared without adding: a huge "from" must not overflow.
+  if (from > kMaxWindow - size) throw DaemonError(kCodeBadArgument, "\"from\" + \"size\" must not exceed " + std::to_string(kMaxWindow));
   const SortRequest sort = ParseSort(data["sort"]);
   const std::vector<std::string> load_fields = OptionalStrings(data, "load_field");
   const bool track_total = OptionalBool(data, "track_total", false);

@@ -12,14 +12,15 @@
 #include <chrono>
 #include <cstring>
 #include <stdexcept>
+#include <new>
 #include <thread>
 
 #include "common/error.h"
 #include "common/log.h"
 #include "common/sys.h"
 #include "fileindex/communication.h"
+#include "fileindex/frame_reader.h"
 #include "programs/corvelasticd/daemon_error.h"
-#include "programs/corvelasticd/request_frame.h"
 
 namespace corvlumex {
 namespace elasticd {
@@ -200,10 +201,12 @@ void Server::WorkerLoop() {
 }
 
 void Server::Serve(int fd) {
+  using fileindex::FrameStatus;
   const PeerIdentity peer = ReadPeerIdentity(fd);
   std::string request;
   for (;;) {
-    const FrameStatus status = ReadRequestFrame(fd, options_.max_frame_bytes, options_.idle_ms, options_.stall_ms, &request);
+    const FrameStatus status =
+        fileindex::ReadFrameBounded(fd, options_.max_frame_bytes, options_.idle_ms, options_.stall_ms, &request, options_.frame_ms);
     if (status == FrameStatus::kTooLarge) {
       // The rest of the frame is not read, so the connection cannot go on.
       SendAnswer(fd, Dispatcher::ErrorAnswer(kCodeFrameTooLarge, "The request is larger than " +
@@ -215,7 +218,24 @@ void Server::Serve(int fd) {
       return;
     }
     if (status != FrameStatus::kOk) return;
-    SendAnswer(fd, dispatcher_.Handle(request, peer));
+    SendAnswer(fd, AnswerTo(request, peer));
+  }
+}
+
+std::string Server::AnswerTo(const std::string& request, const PeerIdentity& peer) {
+  // Whatever one request throws ends that request, never the daemon: an
+  // exception leaving a worker thread would abort every search.
+  try {
+    return dispatcher_.Handle(request, peer);
+  } catch (const std::bad_alloc&) {
+    CORV_LOG("a request of %zu bytes ran out of memory", request.size());
+    return Dispatcher::ErrorAnswer(kCodeInternal, "The daemon ran out of memory for this request");
+  } catch (const std::exception& error) {
+    CORV_LOG("a request failed unexpectedly: %s", error.what());
+    return Dispatcher::ErrorAnswer(kCodeInternal, std::string("Internal error: ") + error.what());
+  } catch (...) {
+    CORV_LOG("a request failed unexpectedly");
+    return Dispatcher::ErrorAnswer(kCodeInternal, "Internal error");
   }
 }
 

@@ -27,6 +27,7 @@ struct ServerOptions {
   int max_clients = 256;
   int idle_ms = 60000;                 // a kept-open connection with no new request
   int stall_ms = 10000;                // a frame that stops arriving half way
+  int frame_ms = 60000;                // a whole frame, from its first byte (a client trickling bytes)
 };
 
 class Server {
@@ -44,6 +45,8 @@ class Server {
 
  private:
   void Serve(int fd);
+  // The answer to one request text; never throws.
+  std::string AnswerTo(const std::string& request, const PeerIdentity& peer);
   // With mutex_ held.
   void StartWorker();
   void WorkerLoop();

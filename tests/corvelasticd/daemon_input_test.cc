@@ -93,6 +93,66 @@ TEST_F(DaemonInputTest, OversizeFramesAndClientsThatVanishMidFrameDisturbNobody)
   ExpectAlive();
 }
 
+// Requests built to stop or tie up the daemon, at its default frame bound.
+class HostileInputTest : public DaemonTest {
+ protected:
+  std::string Repeat(const std::string& piece, int times) {
+    std::string out;
+    for (int i = 0; i < times; ++i) out += piece;
+    return out;
+  }
+  std::string Words(int count) {
+    std::string out;
+    for (int i = 0; i < count; ++i) out += "w" + std::to_string(i) + " ";
+    return out;
+  }
+  std::string SearchOf(const std::string& qsl, const std::string& extra = "") {
+    return R"({"command": "search", "data": {)" + extra + R"("query": {"qsl": )" + qsl + "}}}";
+  }
+  std::string Match(const std::string& text) { return R"({"match": {"_all": ")" + text + R"("}})"; }
+};
+
+TEST_F(HostileInputTest, EveryHostileRequestIsAnsweredWithItsCodeAndTheDaemonServesOn) {
+  std::string many_terms;
+  for (int i = 0; i < 2000; ++i) many_terms += (i > 0 ? ", \"" : "\"") + std::to_string(i) + "\"";
+  std::string wide_bool;
+  for (int i = 0; i < 5; ++i) wide_bool += std::string(i > 0 ? ", " : "") + Match(Words(60));
+  const struct {
+    const char* what;
+    std::string request;
+    int code;
+    const char* message;  // a part of the answer's message
+  } cases[] = {
+      {"arrays nested past the JSON reader's limit", Repeat("[", 1001) + Repeat("]", 1001), 2000, "JSON"},
+      {"objects nested past the limit", Repeat(R"({"a":)", 1001) + "1" + Repeat("}", 1001), 2000, "JSON"},
+      {"nesting past the limit inside a request", SearchOf(Repeat("[", 1200) + Repeat("]", 1200)), 2000, "JSON"},
+      {"a match of 100,000 words", SearchOf(Match(Words(100000))), 2030, "words"},
+      {"65 words in one clause", SearchOf(Match(Words(65))), 2030, "64 words"},
+      {"300 words over five clauses", SearchOf(R"({"bool": {"should": [)" + wide_bool + "]}}"), 2030, "256 words"},
+      {"one word of 70,000 letters", SearchOf(Match(std::string(70000, 'a'))), 2030, "bytes"},
+      {"a word that analyzes to 100 words", SearchOf(Match(Repeat("ab-", 100))), 2030, "64 words"},
+      {"a name substring longer than any name", SearchOf(R"({"match": {"CORVMDSearchFileName": ")" + std::string(2000, 'n') + R"("}})"), 2030, "1024"},
+      {"2,000 terms", SearchOf(R"({"terms": {"CORVMDExtension": [)" + many_terms + "]}}"), 2030, "terms"},
+      {"a huge from", SearchOf(R"({"match_all": {}})", R"("from": 9223372036854775807, "size": 10, )"), 2002, "from"},
+      {"a size beyond 64 bits", SearchOf(R"({"match_all": {}})", R"("size": 1e300, )"), 2002, "size"},
+      {"a sort order that is an array", SearchOf(R"({"match_all": {}})", R"("sort": {"field": "CORVMDFSSize", "order": []}, )"), 2002, "order"},
+      {"an operator that is an object", SearchOf(R"({"match": {"_all": {"query": "x", "operator": {}}}})"), 2030, "operator"},
+      {"bytes that are not UTF-8", "{\"command\": \"\xff\xfe\x80\"}", 2001, "Unknown"},
+  };
+  for (const auto& c : cases) {
+    const std::string answer_text = SendRaw(daemon_->socket_path(), Frame(c.request));
+    Json::Value answer;
+    ASSERT_TRUE(JsonFromString(answer, answer_text)) << c.what << ": no answer; " << daemon_->LogText();
+    EXPECT_EQ(answer["error"]["code"].asInt(), c.code) << c.what << ": " << answer_text;
+    EXPECT_NE(answer["error"]["msg"].asString().find(c.message), std::string::npos) << c.what << ": " << answer_text;
+    ASSERT_TRUE(Run("index_list")["success"].asBool()) << c.what;
+  }
+  // The limits leave ordinary queries alone: 64 words in a clause, 256 in all.
+  std::string at_limit;
+  for (int i = 0; i < 4; ++i) at_limit += std::string(i > 0 ? ", " : "") + Match(Words(64));
+  EXPECT_TRUE(Search(R"({"bool": {"should": [)" + at_limit + "]}}")["success"].asBool());
+}
+
 TEST_F(DaemonInputTest, TheSearchLanguage) {
   const auto add = [&](const std::string& path, const std::string& text, long long size, long long date) {
     Json::Value data;

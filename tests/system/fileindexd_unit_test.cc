@@ -7,6 +7,9 @@
 #include <algorithm>
 #include <filesystem>
 #include <fstream>
+#include <memory>
+#include <stdexcept>
+#include <thread>
 
 #include "common/error.h"
 #include "common/file_util.h"
@@ -17,6 +20,9 @@
 #include "programs/fileindexd/index_rules.h"
 #include "programs/fileindexd/progress.h"
 #include "programs/fileindexd/settle_tracker.h"
+#include "fileindex/frame_reader.h"
+#include "tests/support/child_process.h"
+#include "tests/support/frame_client.h"
 #include "tests/support/log_capture.h"
 
 namespace corvlumex {
@@ -165,6 +171,86 @@ TEST(FolderWalkerTest, ListsTheTreeWithoutEnteringLinksOrExcludedFolders) {
                                               top + "/skip/"}));
   EXPECT_TRUE(WalkFolder(top + "/missing").empty());
   ASSERT_EQ(WalkFolder(top + "/a/b/f.txt").size(), 1u);  // a file is its own walk
+}
+
+// The command socket served for real on a private socket, with limits a
+// loaded test machine cannot reach by accident.
+class CommandSocketTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    CommandLimits limits;
+    limits.request_timeout_ms = 60000;
+    limits.max_connections = 8;
+    server_ = std::make_unique<CommandServer>(
+        socket_, [](const std::string& type, const Json::Value&) {
+          if (type == "boom") throw std::logic_error("not a library error");
+          if (type != "status") throw Error(kErrorBadArgument, "Unknown command: " + type);
+          return Json::Value(Json::objectValue);
+        },
+        [](const std::string&) { return true; }, limits);
+    server_->Listen();
+    thread_ = std::thread([this] { server_->Run(); });
+  }
+  void TearDown() override {
+    server_->Stop();
+    thread_.join();
+  }
+  // The answer's error code; 0 for success, -1 for no answer.
+  int CodeOf(const std::string& bytes) {
+    Json::Value answer;
+    if (!JsonFromString(answer, testing_support::SendRaw(socket_, bytes))) return -1;
+    return answer["success"].asBool() ? 0 : answer["error"]["code"].asInt();
+  }
+
+  SandboxRoot root_;
+  std::string socket_ = root_.path() + "/fileindexd.sock";
+  std::unique_ptr<CommandServer> server_;
+  std::thread thread_;
+};
+
+TEST_F(CommandSocketTest, HostileFramesAreAnsweredAndNoClientHoldsUpAnother) {
+  using testing_support::Frame;
+  const std::string status = Frame(R"({"type": "status"})");
+  const uint32_t huge = 0xFFFFFFF0u;
+  const struct {
+    const char* what;
+    std::string bytes;
+    int code;
+  } cases[] = {
+      {"arrays nested past the JSON reader's limit", Frame(std::string(1001, '[') + std::string(1001, ']')), 120},
+      {"a length of 4 GiB", std::string(reinterpret_cast<const char*>(&huge), 4), 120},
+      {"an empty frame", std::string(4, '\0'), 120},
+      {"a type that is an array", Frame(R"({"type": ["status"]})"), 120},
+      {"not UTF-8", Frame("{\"type\": \"\xff\xfe\"}"), 120},
+      {"a handler that throws something else than an Error", Frame(R"({"type": "boom"})"), 9999},
+      // More than a socket buffer holds: it never arrives whole before it is read.
+      {"a request of 600 KB", Frame(R"({"type": "status", "data": ")" + std::string(600000, 'x') + R"("})"), 0},
+      {"a frame cut short", status.substr(0, 7), -1},
+  };
+  for (const auto& c : cases) {
+    EXPECT_EQ(CodeOf(c.bytes), c.code) << c.what;
+    EXPECT_EQ(CodeOf(status), 0) << "after " << c.what;
+  }
+  // Clients that send nothing or half a request hold only their own connection:
+  // the others are answered meanwhile, and so are they once they finish.
+  std::vector<int> slow;
+  for (int i = 0; i < 4; ++i) {
+    slow.push_back(testing_support::ConnectTo(socket_));
+    ASSERT_GE(slow.back(), 0);
+  }
+  ASSERT_EQ(write(slow[0], status.data(), 6), 6);
+  EXPECT_EQ(CodeOf(status), 0);
+  ASSERT_EQ(write(slow[0], status.data() + 6, status.size() - 6), static_cast<ssize_t>(status.size() - 6));
+  std::string answer;
+  EXPECT_EQ(fileindex::ReadFrameBounded(slow[0], 1u << 20, 20000, 20000, &answer), fileindex::FrameStatus::kOk);
+  EXPECT_NE(answer.find("\"success\":true"), std::string::npos) << answer;
+  // Beyond the connection limit a client is told to come back, not queued.
+  for (int i = 0; i < 8; ++i) slow.push_back(testing_support::ConnectTo(socket_));
+  Json::Value refused;
+  ASSERT_TRUE(JsonFromString(refused, testing_support::SendRaw(socket_, status)));
+  EXPECT_NE(refused["error"]["msg"].asString().find("try again later"), std::string::npos);
+  for (const int fd : slow) close(fd);
+  EXPECT_TRUE(testing_support::PollUntil([&] { return CodeOf(status) == 0; }, std::chrono::seconds(20)));
 }
 
 TEST(CommandServerTest, AnswersCarryTheCodeAndRefuseChangesFromOtherUsers) {
