@@ -1,6 +1,7 @@
 #include "programs/corvelasticd/search.h"
 
 #include <algorithm>
+#include <chrono>
 #include <map>
 
 #include "programs/corvelasticd/daemon_error.h"
@@ -17,6 +18,9 @@ constexpr int64_t kMaxWindow = 100000;          // from + size
 constexpr size_t kDefaultCheckBudget = 1000;     // candidates checked past the page for the total
 constexpr size_t kSuggestCheckBudget = 200;
 constexpr int64_t kMaxSuggestions = 100;
+// How long a search naming no index waits for indexes still opening after a
+// start (usually milliseconds) before it answers 1401 rather than leave one out.
+constexpr std::chrono::milliseconds kOpeningWait{2000};
 
 struct SortRequest {
   std::string field = "_score";
@@ -74,7 +78,7 @@ std::vector<std::shared_ptr<IndexHandle>> TargetIndexes(const IndexRegistry& reg
   } else if (data.isMember("id")) {
     ids.push_back(RequiredString(data, "id"));
   } else {
-    return registry.Ready();  // no index named: every ready index
+    return registry.AllForSearch(kOpeningWait);  // no index named: every index
   }
   std::vector<std::shared_ptr<IndexHandle>> handles;
   for (const std::string& id : ids) handles.push_back(registry.Get(id));
