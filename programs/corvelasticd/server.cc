@@ -8,6 +8,7 @@
 #include <sys/un.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <chrono>
 #include <cstring>
@@ -181,6 +182,19 @@ void Server::WorkerLoop() {
       ++waiting_;
       continue;
     }
+    const PeerIdentity peer = ReadPeerIdentity(fd);
+    const bool counted = peer.uid != 0 && std::find(options_.trusted_uids.begin(), options_.trusted_uids.end(), peer.uid) ==
+                                              options_.trusted_uids.end();
+    if (counted && per_user_[peer.uid] >= options_.max_clients_per_user) {
+      lock.unlock();
+      SendAnswer(fd, Dispatcher::ErrorAnswer(kCodeBusy, "Too many connections from user " + std::to_string(peer.uid) +
+                                                            "; close some or try again later"));
+      close(fd);
+      lock.lock();
+      ++waiting_;
+      continue;
+    }
+    if (counted) ++per_user_[peer.uid];
     ++serving_;
     open_fds_.insert(fd);
     // Someone must be waiting for the next client (or to tell it the server is full).
@@ -188,11 +202,12 @@ void Server::WorkerLoop() {
     lock.unlock();
     const struct timeval send_timeout = {options_.stall_ms / 1000, (options_.stall_ms % 1000) * 1000};
     setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &send_timeout, sizeof(send_timeout));
-    Serve(fd);
+    Serve(fd, peer);
     lock.lock();
     open_fds_.erase(fd);
     close(fd);
     --serving_;
+    if (counted && --per_user_[peer.uid] == 0) per_user_.erase(peer.uid);
     if (waiting_ >= kMaxIdleWorkers) break;
     ++waiting_;
   }
@@ -200,9 +215,8 @@ void Server::WorkerLoop() {
   if (--workers_ == 0) all_done_.notify_all();
 }
 
-void Server::Serve(int fd) {
+void Server::Serve(int fd, const PeerIdentity& peer) {
   using fileindex::FrameStatus;
-  const PeerIdentity peer = ReadPeerIdentity(fd);
   std::string request;
   for (;;) {
     const FrameStatus status =

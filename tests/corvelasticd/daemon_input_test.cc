@@ -296,3 +296,52 @@ TEST_F(DaemonInputTest, OrdinaryUsersSeeOnlyFilesTheyCanReadAndCannotChangeIndex
 }  // namespace
 }  // namespace elasticd_test
 }  // namespace corvlumex
+
+namespace corvlumex {
+namespace elasticd_test {
+namespace {
+
+class PerUserLimitTest : public DaemonTest {
+ protected:
+  std::vector<std::string> ExtraArgs() override { return {"--max-clients-per-user", "2"}; }
+};
+
+TEST_F(PerUserLimitTest, OneUserCannotTakeEveryConnection) {
+  if (geteuid() != 0) GTEST_SKIP() << "needs root to run a client as another user";
+  const struct passwd* nobody = getpwnam("nobody");
+  ASSERT_NE(nobody, nullptr);
+  chmod(root_.path().c_str(), 0755);
+  const std::string socket = daemon_->socket_path();
+  const std::string out = AsUser(*nobody, [&]() -> std::string {
+    try {
+      const Json::Value list = Data(R"({"command": "index_list"})");
+      // Two connections held open, each known to be served; the daemon counts
+      // a closed one out only once it has seen the close, so refusals of the
+      // first tries are tried again.
+      std::vector<int> held;
+      for (int attempt = 0; held.size() < 2 && attempt < 500; ++attempt) {
+        const int fd = ConnectTo(socket);
+        if (Exchange(fd, list)["success"].asBool()) {
+          held.push_back(fd);
+        } else {
+          close(fd);
+        }
+      }
+      const Json::Value refused = Send(socket, list);
+      std::string result = std::to_string(held.size()) + " " + refused["error"]["code"].asString() + " " +
+                           refused["error"]["msg"].asString();
+      for (const int fd : held) close(fd);
+      return result;
+    } catch (const std::exception& error) {
+      return error.what();
+    }
+  });
+  EXPECT_EQ(out.substr(0, 7), "2 1400 ") << out;
+  EXPECT_NE(out.find("Too many connections from user"), std::string::npos) << out;
+  // Root, the library's user, is not counted.
+  EXPECT_TRUE(Run("index_list")["success"].asBool());
+}
+
+}  // namespace
+}  // namespace elasticd_test
+}  // namespace corvlumex
