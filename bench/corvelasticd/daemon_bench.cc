@@ -30,6 +30,7 @@
 #include "common/json_util.h"
 #include "fileindex/communication.h"
 #include "fileindex/frame_reader.h"
+#include "tests/support/frame_client.h"
 
 namespace {
 
@@ -48,18 +49,7 @@ struct Options {
 
 std::string g_socket;
 
-int Connect() {
-  const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  sockaddr_un address;
-  memset(&address, 0, sizeof(address));
-  address.sun_family = AF_UNIX;
-  strncpy(address.sun_path, g_socket.c_str(), sizeof(address.sun_path) - 1);
-  if (connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)) != 0) {
-    close(fd);
-    return -1;
-  }
-  return fd;
-}
+int Connect() { return corvlumex::testing_support::ConnectTo(g_socket); }
 
 Json::Value Request(const Json::Value& request) {
   const int fd = Connect();
