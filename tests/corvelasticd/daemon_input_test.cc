@@ -306,7 +306,7 @@ class PerUserLimitTest : public DaemonTest {
   std::vector<std::string> ExtraArgs() override { return {"--max-clients-per-user", "2"}; }
 };
 
-TEST_F(PerUserLimitTest, OneUserCannotTakeEveryConnection) {
+TEST_F(PerUserLimitTest, OneUserCannotTakeEveryConnectionNorSendHugeCompounds) {
   if (geteuid() != 0) GTEST_SKIP() << "needs root to run a client as another user";
   const struct passwd* nobody = getpwnam("nobody");
   ASSERT_NE(nobody, nullptr);
@@ -331,13 +331,18 @@ TEST_F(PerUserLimitTest, OneUserCannotTakeEveryConnection) {
       std::string result = std::to_string(held.size()) + " " + refused["error"]["code"].asString() + " " +
                            refused["error"]["msg"].asString();
       for (const int fd : held) close(fd);
-      return result;
+      // Nor carry a million searches in one compound request.
+      Json::Value compound;
+      for (int i = 0; i < 65; ++i) compound["compound"].append(list);
+      const Json::Value too_many = Send(socket, compound);
+      return result + "\n" + too_many["error"]["code"].asString() + " " + too_many["error"]["msg"].asString();
     } catch (const std::exception& error) {
       return error.what();
     }
   });
   EXPECT_EQ(out.substr(0, 7), "2 1400 ") << out;
   EXPECT_NE(out.find("Too many connections from user"), std::string::npos) << out;
+  EXPECT_NE(out.find("\n2000 A compound request may hold at most 64 requests"), std::string::npos) << out;
   // Root, the library's user, is not counted.
   EXPECT_TRUE(Run("index_list")["success"].asBool());
 }
