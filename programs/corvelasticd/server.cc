@@ -13,6 +13,7 @@
 #include <chrono>
 #include <cstring>
 #include <stdexcept>
+#include <system_error>
 #include <new>
 #include <thread>
 
@@ -129,7 +130,15 @@ void Server::Run() {
 void Server::StartWorker() {
   ++workers_;
   ++waiting_;
-  std::thread([this] { WorkerLoop(); }).detach();
+  try {
+    std::thread([this] { WorkerLoop(); }).detach();
+  } catch (const std::system_error& error) {
+    // No thread to be had now (a flood of connections): the running
+    // workers serve on; the next connection tries again.
+    --workers_;
+    --waiting_;
+    CORV_LOG("cannot start a connection worker: %s", error.what());
+  }
 }
 
 int Server::Accept(int poll_fd) {
