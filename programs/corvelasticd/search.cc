@@ -18,6 +18,8 @@ constexpr int64_t kMaxWindow = 100000;          // from + size
 constexpr size_t kDefaultCheckBudget = 1000;     // candidates checked past the page for the total
 constexpr size_t kSuggestCheckBudget = 200;
 constexpr int64_t kMaxSuggestions = 100;
+constexpr size_t kMaxLoadFields = 256;       // an index has a few dozen fields
+constexpr size_t kMaxMarkBytes = 64;         // highlight marks: "<em>", a terminal's bold
 // How long a search naming no index waits for indexes still opening after a
 // start (usually milliseconds) before it answers 1401 rather than leave one out.
 constexpr std::chrono::milliseconds kOpeningWait{2000};
@@ -73,7 +75,8 @@ std::vector<std::shared_ptr<IndexHandle>> TargetIndexes(const IndexRegistry& reg
     if (!data["ids"].isArray()) throw DaemonError(kCodeBadArgument, "\"ids\" must be an array of index ids");
     for (const Json::Value& id : data["ids"]) {
       if (!id.isString()) throw DaemonError(kCodeBadArgument, "\"ids\" must be an array of index ids");
-      ids.push_back(id.asString());
+      // Each index once, however often it is named.
+      if (std::find(ids.begin(), ids.end(), id.asString()) == ids.end()) ids.push_back(id.asString());
     }
   } else if (data.isMember("id")) {
     ids.push_back(RequiredString(data, "id"));
@@ -111,6 +114,9 @@ Json::Value RunSearch(const IndexRegistry& registry, const Json::Value& data, co
   if (from > kMaxWindow - size) throw DaemonError(kCodeBadArgument, "\"from\" + \"size\" must not exceed " + std::to_string(kMaxWindow));
   const SortRequest sort = ParseSort(data["sort"]);
   const std::vector<std::string> load_fields = OptionalStrings(data, "load_field");
+  if (load_fields.size() > kMaxLoadFields) {
+    throw DaemonError(kCodeBadArgument, "\"load_field\" names more than " + std::to_string(kMaxLoadFields) + " fields");
+  }
   const bool track_total = OptionalBool(data, "track_total", false);
   Json::Value clause;
   if (data.isMember("query")) {
@@ -127,6 +133,10 @@ Json::Value RunSearch(const IndexRegistry& registry, const Json::Value& data, co
     style.size = static_cast<size_t>(std::clamp<int64_t>(OptionalInt(highlight, "size", 160), 20, 2000));
     style.pre = OptionalString(highlight, "pre", style.pre);
     style.post = OptionalString(highlight, "post", style.post);
+    // They are written around every word found in every hit.
+    if (style.pre.size() > kMaxMarkBytes || style.post.size() > kMaxMarkBytes) {
+      throw DaemonError(kCodeBadArgument, "\"pre\" and \"post\" may be " + std::to_string(kMaxMarkBytes) + " bytes at most");
+    }
   } else if (!highlight.isNull() && !highlight.isBool()) {
     throw DaemonError(kCodeBadArgument, "\"highlight\" must be true or {\"field\", \"size\", \"pre\", \"post\"}");
   }

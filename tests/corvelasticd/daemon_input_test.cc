@@ -138,6 +138,8 @@ TEST_F(HostileInputTest, EveryHostileRequestIsAnsweredWithItsCodeAndTheDaemonSer
       {"a sort order that is an array", SearchOf(R"({"match_all": {}})", R"("sort": {"field": "CORVMDFSSize", "order": []}, )"), 2002, "order"},
       {"an operator that is an object", SearchOf(R"({"match": {"_all": {"query": "x", "operator": {}}}})"), 2030, "operator"},
       {"bytes that are not UTF-8", "{\"command\": \"\xff\xfe\x80\"}", 2001, "Unknown"},
+      {"highlight marks of 1 MB", SearchOf(R"({"match_all": {}})", R"("highlight": {"pre": ")" + std::string(1 << 20, '<') + R"("}, )"), 2002, "pre"},
+      {"10,000 fields to load", SearchOf(R"({"match_all": {}})", R"("load_field": [)" + Repeat(R"("a", )", 10000) + R"("a"], )"), 2002, "load_field"},
   };
   for (const auto& c : cases) {
     const std::string answer_text = SendRaw(daemon_->socket_path(), Frame(c.request));
@@ -147,6 +149,12 @@ TEST_F(HostileInputTest, EveryHostileRequestIsAnsweredWithItsCodeAndTheDaemonSer
     EXPECT_NE(answer["error"]["msg"].asString().find(c.message), std::string::npos) << c.what << ": " << answer_text;
     ASSERT_TRUE(Run("index_list")["success"].asBool()) << c.what;
   }
+  // An index named 100,000 times is searched once.
+  Upsert("/volume1/share/one.txt", "word");
+  Commit();
+  const Json::Value repeated = Send(daemon_->socket_path(), Data(SearchOf(R"({"match_all": {}})", R"("ids": [)" +
+                                                                 Repeat(R"("fileindex_share", )", 100000) + R"("fileindex_share"], )")));
+  EXPECT_EQ(repeated["data"]["total"].asInt(), 1) << JsonToString(repeated).substr(0, 300);
   // The limits leave ordinary queries alone: 64 words in a clause, 256 in all.
   std::string at_limit;
   for (int i = 0; i < 4; ++i) at_limit += std::string(i > 0 ? ", " : "") + Match(Words(64));
