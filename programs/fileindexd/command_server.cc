@@ -99,25 +99,43 @@ void CommandServer::Run() {
       errno = 0;
       continue;
     }
+    struct ucred peer;
+    socklen_t peer_size = sizeof(peer);
+    if (getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &peer, &peer_size) != 0) {
+      errno = 0;
+      close(fd);
+      continue;
+    }
+    // Root and the daemon's own user (the management operations) are never
+    // turned away; every other user has a share of the connections.
+    const bool counted = peer.uid != 0 && peer.uid != geteuid();
     Connections& open = *connections_;
     std::unique_lock<std::mutex> lock(open.mutex);
-    if (static_cast<int>(open.fds.size()) >= limits_.max_connections) {
+    if (counted && (open.counted >= limits_.max_connections || open.per_user[peer.uid] >= limits_.max_connections_per_user)) {
       lock.unlock();
       SendAnswer(fd, Failure(kErrorSystem, "Too many connections to fileindexd; try again later"));
       close(fd);
       continue;
     }
     open.fds.insert(fd);
+    if (counted) ++open.counted, ++open.per_user[peer.uid];
+    const auto finished = [fd, counted, uid = peer.uid](Connections& connections) {
+      connections.fds.erase(fd);
+      if (counted) {
+        --connections.counted;
+        if (--connections.per_user[uid] == 0) connections.per_user.erase(uid);
+      }
+    };
     try {
-      std::thread([this, fd, connections = connections_] {
-        Serve(fd);
+      std::thread([this, fd, uid = peer.uid, finished, connections = connections_] {
+        Serve(fd, uid);
         std::lock_guard<std::mutex> guard(connections->mutex);
-        connections->fds.erase(fd);
+        finished(*connections);
         close(fd);
         connections->all_closed.notify_all();
       }).detach();
     } catch (const std::system_error&) {
-      open.fds.erase(fd);
+      finished(open);
       lock.unlock();
       SendAnswer(fd, Failure(kErrorSystem, "fileindexd cannot take the connection now; try again later"));
       close(fd);
@@ -130,14 +148,8 @@ void CommandServer::Run() {
   open.all_closed.wait(lock, [&open] { return open.fds.empty(); });
 }
 
-void CommandServer::Serve(int fd) {
+void CommandServer::Serve(int fd, uid_t uid) {
   using fileindex::FrameStatus;
-  struct ucred peer;
-  socklen_t peer_size = sizeof(peer);
-  if (getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &peer, &peer_size) != 0) {
-    errno = 0;
-    return;
-  }
   // A client that does not read its answer holds its own thread only so long.
   const struct timeval send_timeout = {limits_.request_timeout_ms / 1000, (limits_.request_timeout_ms % 1000) * 1000};
   setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &send_timeout, sizeof(send_timeout));
@@ -160,7 +172,7 @@ void CommandServer::Serve(int fd) {
   {
     // Commands are run one at a time, as they always were.
     std::lock_guard<std::mutex> guard(handler_mutex_);
-    answer = Answer(request, peer.uid);
+    answer = Answer(request, uid);
   }
   SendAnswer(fd, answer);
 }

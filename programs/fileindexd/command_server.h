@@ -10,6 +10,7 @@
 #include <condition_variable>
 #include <cstdint>
 #include <functional>
+#include <map>
 #include <memory>
 #include <mutex>
 #include <set>
@@ -22,7 +23,10 @@ namespace fileindexd {
 struct CommandLimits {
   uint32_t max_request_bytes = 1u << 20;  // the commands carry a share name or a time
   int request_timeout_ms = 5000;          // to begin a request, and then to send it whole
-  int max_connections = 32;               // read at once; more are answered "try again later"
+  // Connections of users other than root and the daemon's own read at once,
+  // in all and per user; more are answered "try again later".
+  int max_connections = 32;
+  int max_connections_per_user = 8;
 };
 
 class CommandServer {
@@ -49,7 +53,7 @@ class CommandServer {
   std::string Answer(const std::string& request, uid_t uid);
 
  private:
-  void Serve(int fd);
+  void Serve(int fd, uid_t uid);
 
   std::string socket_path_;
   Handler handler_;
@@ -64,6 +68,8 @@ class CommandServer {
     std::mutex mutex;
     std::condition_variable all_closed;
     std::set<int> fds;
+    int counted = 0;                 // of users other than root and the daemon's own
+    std::map<uid_t, int> per_user;   // the counted ones, by user
   };
   std::shared_ptr<Connections> connections_ = std::make_shared<Connections>();
 };

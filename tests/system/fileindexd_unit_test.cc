@@ -1,7 +1,9 @@
 // The parts of fileindexd on their own: the settle tracker, the indexing
 // rules, the folder walk, the command answers and the progress board.
 #include <gtest/gtest.h>
+#include <grp.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -244,13 +246,47 @@ TEST_F(CommandSocketTest, HostileFramesAreAnsweredAndNoClientHoldsUpAnother) {
   std::string answer;
   EXPECT_EQ(fileindex::ReadFrameBounded(slow[0], 1u << 20, 20000, 20000, &answer), fileindex::FrameStatus::kOk);
   EXPECT_NE(answer.find("\"success\":true"), std::string::npos) << answer;
-  // Beyond the connection limit a client is told to come back, not queued.
-  for (int i = 0; i < 8; ++i) slow.push_back(testing_support::ConnectTo(socket_));
-  Json::Value refused;
-  ASSERT_TRUE(JsonFromString(refused, testing_support::SendRaw(socket_, status)));
-  EXPECT_NE(refused["error"]["msg"].asString().find("try again later"), std::string::npos);
   for (const int fd : slow) close(fd);
-  EXPECT_TRUE(testing_support::PollUntil([&] { return CodeOf(status) == 0; }, std::chrono::seconds(20)));
+}
+
+TEST_F(CommandSocketTest, AnotherUserCannotTakeEveryConnection) {
+  if (geteuid() != 0) GTEST_SKIP() << "needs root to connect as another user";
+  chmod(root_.path().c_str(), 0755);
+  const std::string status = testing_support::Frame(R"({"type": "status"})");
+  int told[2], done[2];
+  ASSERT_EQ(0, pipe(told));
+  ASSERT_EQ(0, pipe(done));
+  const pid_t child = fork();
+  if (child == 0) {
+    // As nobody: its own share of connections held open, and one more.
+    close(told[0]);
+    close(done[1]);
+    if (setgroups(0, nullptr) != 0 || setgid(65534) != 0 || setuid(65534) != 0) _exit(3);
+    std::vector<int> held;
+    for (int i = 0; i < 8; ++i) held.push_back(testing_support::ConnectTo(socket_));
+    std::string refused;
+    try {
+      refused = testing_support::SendRaw(socket_, status);
+    } catch (const std::exception& error) {
+      refused = error.what();
+    }
+    if (write(told[1], refused.data(), refused.size()) < 0) _exit(4);
+    close(told[1]);
+    char byte;
+    if (read(done[0], &byte, 1) < 0) _exit(5);
+    _exit(0);
+  }
+  close(told[1]);
+  close(done[0]);
+  std::string refused;
+  char buffer[4096];
+  for (ssize_t n; (n = read(told[0], buffer, sizeof(buffer))) > 0;) refused.append(buffer, static_cast<size_t>(n));
+  EXPECT_NE(refused.find("try again later"), std::string::npos) << refused;
+  // Root is served meanwhile.
+  EXPECT_EQ(CodeOf(status), 0);
+  close(done[1]);
+  close(told[0]);
+  waitpid(child, nullptr, 0);
 }
 
 TEST(CommandServerTest, AnswersCarryTheCodeAndRefuseChangesFromOtherUsers) {
