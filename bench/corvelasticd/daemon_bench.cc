@@ -29,7 +29,8 @@
 
 #include "common/json_util.h"
 #include "fileindex/communication.h"
-#include "programs/corvelasticd/request_frame.h"
+#include "fileindex/frame_reader.h"
+#include "tests/support/frame_client.h"
 
 namespace {
 
@@ -48,25 +49,14 @@ struct Options {
 
 std::string g_socket;
 
-int Connect() {
-  const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  sockaddr_un address;
-  memset(&address, 0, sizeof(address));
-  address.sun_family = AF_UNIX;
-  strncpy(address.sun_path, g_socket.c_str(), sizeof(address.sun_path) - 1);
-  if (connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)) != 0) {
-    close(fd);
-    return -1;
-  }
-  return fd;
-}
+int Connect() { return corvlumex::testing_support::ConnectTo(g_socket); }
 
 Json::Value Request(const Json::Value& request) {
   const int fd = Connect();
   if (fd < 0) throw std::runtime_error("connect failed");
   corvlumex::fileindex::WriteFrame(fd, JsonToString(request));
   std::string text;
-  corvlumex::elasticd::ReadRequestFrame(fd, 1u << 30, 600000, 600000, &text);
+  corvlumex::fileindex::ReadFrameBounded(fd, 1u << 30, 600000, 600000, &text);
   close(fd);
   Json::Value answer;
   JsonFromString(answer, text);

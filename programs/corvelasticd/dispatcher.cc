@@ -14,6 +14,8 @@ namespace corvlumex {
 namespace elasticd {
 namespace {
 
+constexpr Json::ArrayIndex kMaxUserCompound = 64;
+
 Json::Value Success(Json::Value data) {
   Json::Value answer(Json::objectValue);
   answer["success"] = true;
@@ -165,6 +167,13 @@ Json::Value Dispatcher::HandleRequest(const Json::Value& request, const PeerIden
     if (nested) return fileindex::FailureAnswer(kCodeBadRequest, "Compound requests cannot be nested");
     const Json::Value& elements = request["compound"];
     if (!elements.isArray()) return fileindex::FailureAnswer(kCodeBadRequest, "\"compound\" must be an array of requests");
+    // The library renames a folder's descendants in one compound of any
+    // size; anybody else's compound is bounded, or one frame could carry a
+    // million searches.
+    if (!MayWrite(peer) && elements.size() > kMaxUserCompound) {
+      return fileindex::FailureAnswer(kCodeBadRequest, "A compound request may hold at most " + std::to_string(kMaxUserCompound) +
+                                                           " requests; send the others separately");
+    }
     Json::Value answer(Json::objectValue);
     answer["success"] = true;
     answer["data"] = Json::Value(Json::arrayValue);

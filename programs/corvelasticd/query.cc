@@ -2,6 +2,7 @@
 
 #include <time.h>
 
+#include <algorithm>
 #include <cmath>
 #include <cstring>
 #include <optional>
@@ -13,8 +14,16 @@ namespace corvlumex {
 namespace elasticd {
 namespace {
 
+// What one query may ask of the daemon. Every word is a look-up in the
+// full-text index, and the whole expression is evaluated for every candidate:
+// a 100,000-word match took over 12 s of CPU. People type a few words; the
+// library's own queries stay far below these.
 constexpr int kMaxDepth = 32;
-constexpr size_t kMaxClauses = 1024;
+constexpr size_t kMaxClauses = 1024;          // clauses, and values of "terms"
+constexpr size_t kMaxClauseWords = 64;        // words of one match/term on a text field
+constexpr size_t kMaxQueryWords = 256;        // words of the whole query
+constexpr size_t kMaxQueryTextBytes = 64u << 10;  // bytes of every text in the query
+constexpr size_t kMaxSubstringBytes = 1024;   // a name substring (names are at most 255 bytes)
 constexpr const char* kAllField = "_all";
 
 [[noreturn]] void Bad(const std::string& what) { throw DaemonError(kCodeBadQuery, "Bad query: " + what); }
@@ -52,7 +61,7 @@ class Parser {
 
   QueryNode Clause(const Json::Value& clause, int depth, bool negated) {
     if (depth > kMaxDepth) Bad("clauses nested deeper than " + std::to_string(kMaxDepth));
-    if (++clauses_ > kMaxClauses) Bad("more than " + std::to_string(kMaxClauses) + " clauses");
+    CountClause();
     if (!clause.isObject() || clause.size() != 1) Bad("a clause must be an object with exactly one key: " + Short(clause));
     const std::string kind = clause.getMemberNames().front();
     const Json::Value& body = clause[kind];
@@ -75,6 +84,26 @@ class Parser {
     builder["indentation"] = "";
     std::string text = Json::writeString(builder, value);
     return text.size() > 120 ? text.substr(0, 120) + "..." : text;
+  }
+
+  void CountClause() {
+    if (++clauses_ > kMaxClauses) Bad("more than " + std::to_string(kMaxClauses) + " clauses and \"terms\" values; split the query");
+  }
+
+  // Every text the query searches for counts towards its size.
+  const std::string& CountText(const std::string& text) {
+    text_bytes_ += text.size();
+    if (text_bytes_ > kMaxQueryTextBytes) {
+      Bad("the texts of the query are longer than " + std::to_string(kMaxQueryTextBytes) + " bytes; search for fewer words");
+    }
+    return text;
+  }
+
+  void CountWords(size_t clause_words) {
+    if (clause_words > kMaxClauseWords) {
+      Bad("more than " + std::to_string(kMaxClauseWords) + " words in one clause; search for fewer words");
+    }
+    if (++words_ > kMaxQueryWords) Bad("more than " + std::to_string(kMaxQueryWords) + " words in the query; search for fewer words");
   }
 
   const FieldSpec& Field(const std::string& name) const {
@@ -156,14 +185,21 @@ class Parser {
     std::vector<std::string> word_expressions;
     // Words are split on blanks first so each word is analyzed per column kind.
     std::vector<std::string> raw_words;
-    ForEachBlankSeparated(text, &raw_words);
+    ForEachBlankSeparated(CountText(text), &raw_words);
+    size_t clause_words = 0;
     for (const std::string& word : raw_words) {
       std::vector<std::string> alternatives;
+      // A word is as many words as it analyzes to ("ac-3" is two): each is a look-up.
+      size_t most_tokens = 0;
       for (const auto& group : groups) {
+        size_t group_tokens = 0;
         for (const auto& tokens : AnalyzeQuery(group.first, word)) {
           alternatives.push_back(ColumnFilter(group.second) + " : " + Phrase(tokens));
+          group_tokens += tokens.size();
         }
+        most_tokens = std::max(most_tokens, group_tokens);
       }
+      for (size_t i = 0; i < most_tokens; ++i) CountWords(++clause_words);
       if (alternatives.empty()) continue;
       std::string expression = alternatives.size() == 1 ? alternatives[0] : "(";
       if (alternatives.size() > 1) {
@@ -201,6 +237,9 @@ class Parser {
     QueryNode node;
     node.type = QueryNode::Type::kName;
     node.code = field_def.code;
+    if (CountText(text).size() > kMaxSubstringBytes) {
+      Bad("the text searched in \"" + field_def.name + "\" is longer than " + std::to_string(kMaxSubstringBytes) + " bytes");
+    }
     const std::string folded = Fold(text, FoldMode::kSearch);
     if (folded.empty()) return QueryNode{};  // every name holds the empty text
     if (CodePointCount(folded) >= 3) {
@@ -212,6 +251,7 @@ class Parser {
   }
 
   QueryNode KeyIn(std::vector<std::string> keys) {
+    for (const std::string& key : keys) CountText(key);
     QueryNode node;
     node.type = QueryNode::Type::kKeyIn;
     node.keys = std::move(keys);
@@ -228,7 +268,7 @@ class Parser {
 
   QueryNode KeywordToken(const FieldSpec& field_def, const std::string& value) {
     std::vector<std::string> tokens;
-    Analyze(Analyzer::kKeyword, value, &tokens);
+    Analyze(Analyzer::kKeyword, CountText(value), &tokens);
     QueryNode node;
     if (tokens.empty()) {
       node.type = QueryNode::Type::kNone;
@@ -245,7 +285,9 @@ class Parser {
     if (argument.isObject()) {
       if (!argument["query"].isString()) Bad("\"match\" on \"" + field + "\" needs a string \"query\"");
       text = argument["query"].asString();
-      const std::string op = argument.get("operator", "and").asString();
+      const Json::Value& given = argument["operator"];
+      if (!given.isNull() && !given.isString()) Bad("\"operator\" must be \"and\" or \"or\"");
+      const std::string op = given.isNull() ? "and" : given.asString();
       if (op != "and" && op != "or") Bad("\"operator\" must be \"and\" or \"or\"");
       any = op == "or";
     } else {
@@ -280,17 +322,26 @@ class Parser {
     const FieldSpec* field_def = field == kAllField ? nullptr : &Field(field);
     if (field_def != nullptr && IsKey(*field_def)) {
       std::vector<std::string> keys;
-      for (const Json::Value& value : argument) keys.push_back(ScalarText(field, value));
+      for (const Json::Value& value : argument) {
+        CountClause();
+        keys.push_back(ScalarText(field, value));
+      }
       return KeyIn(std::move(keys));
     }
     if (field_def != nullptr && (field_def->kind == FieldKind::kNumber || field_def->kind == FieldKind::kBool)) {
       std::vector<SqlValue> numbers;
-      for (const Json::Value& value : argument) numbers.push_back(Number(*field_def, value));
+      for (const Json::Value& value : argument) {
+        CountClause();
+        numbers.push_back(Number(*field_def, value));
+      }
       return NumberIn(*field_def, std::move(numbers));
     }
     QueryNode node;
     node.type = QueryNode::Type::kBool;
-    for (const Json::Value& value : argument) node.should.push_back(Term(field, value, negated));
+    for (const Json::Value& value : argument) {
+      CountClause();
+      node.should.push_back(Term(field, value, negated));
+    }
     if (node.should.empty()) node.type = QueryNode::Type::kNone;
     return node;
   }
@@ -299,6 +350,7 @@ class Parser {
     const Json::Value& value = argument.isObject() ? argument["value"] : argument;
     if (!value.isString()) Bad("\"prefix\" on \"" + field + "\" needs a string");
     const std::string text = value.asString();
+    CountText(text);
     std::vector<std::string> columns;
     std::vector<std::string> tokens;
     if (field == kAllField) {
@@ -323,6 +375,7 @@ class Parser {
       }
     }
     if (tokens.empty()) return QueryNode{};  // every value starts with ""
+    for (size_t i = 1; i <= tokens.size(); ++i) CountWords(i);
     QueryNode node;
     node.type = columns.empty() ? QueryNode::Type::kNone : QueryNode::Type::kText;
     node.fts = ColumnFilter(columns) + " : " + Phrase(tokens) + " *";
@@ -380,6 +433,8 @@ class Parser {
   const IndexSchema& schema_;
   std::set<std::string>* highlight_;
   size_t clauses_ = 0;
+  size_t words_ = 0;
+  size_t text_bytes_ = 0;
 };
 
 // The first full-text clause every hit must satisfy: the clause itself, or

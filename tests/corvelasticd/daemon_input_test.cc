@@ -93,6 +93,74 @@ TEST_F(DaemonInputTest, OversizeFramesAndClientsThatVanishMidFrameDisturbNobody)
   ExpectAlive();
 }
 
+// Requests built to stop or tie up the daemon, at its default frame bound.
+class HostileInputTest : public DaemonTest {
+ protected:
+  std::string Repeat(const std::string& piece, int times) {
+    std::string out;
+    for (int i = 0; i < times; ++i) out += piece;
+    return out;
+  }
+  std::string Words(int count) {
+    std::string out;
+    for (int i = 0; i < count; ++i) out += "w" + std::to_string(i) + " ";
+    return out;
+  }
+  std::string SearchOf(const std::string& qsl, const std::string& extra = "") {
+    return R"({"command": "search", "data": {)" + extra + R"("query": {"qsl": )" + qsl + "}}}";
+  }
+  std::string Match(const std::string& text) { return R"({"match": {"_all": ")" + text + R"("}})"; }
+};
+
+TEST_F(HostileInputTest, EveryHostileRequestIsAnsweredWithItsCodeAndTheDaemonServesOn) {
+  std::string many_terms;
+  for (int i = 0; i < 2000; ++i) many_terms += (i > 0 ? ", \"" : "\"") + std::to_string(i) + "\"";
+  std::string wide_bool;
+  for (int i = 0; i < 5; ++i) wide_bool += std::string(i > 0 ? ", " : "") + Match(Words(60));
+  const struct {
+    const char* what;
+    std::string request;
+    int code;
+    const char* message;  // a part of the answer's message
+  } cases[] = {
+      {"arrays nested past the JSON reader's limit", Repeat("[", 1001) + Repeat("]", 1001), 2000, "JSON"},
+      {"objects nested past the limit", Repeat(R"({"a":)", 1001) + "1" + Repeat("}", 1001), 2000, "JSON"},
+      {"nesting past the limit inside a request", SearchOf(Repeat("[", 1200) + Repeat("]", 1200)), 2000, "JSON"},
+      {"a match of 100,000 words", SearchOf(Match(Words(100000))), 2030, "words"},
+      {"65 words in one clause", SearchOf(Match(Words(65))), 2030, "64 words"},
+      {"300 words over five clauses", SearchOf(R"({"bool": {"should": [)" + wide_bool + "]}}"), 2030, "256 words"},
+      {"one word of 70,000 letters", SearchOf(Match(std::string(70000, 'a'))), 2030, "bytes"},
+      {"a word that analyzes to 100 words", SearchOf(Match(Repeat("ab-", 100))), 2030, "64 words"},
+      {"a name substring longer than any name", SearchOf(R"({"match": {"CORVMDSearchFileName": ")" + std::string(2000, 'n') + R"("}})"), 2030, "1024"},
+      {"2,000 terms", SearchOf(R"({"terms": {"CORVMDExtension": [)" + many_terms + "]}}"), 2030, "terms"},
+      {"a huge from", SearchOf(R"({"match_all": {}})", R"("from": 9223372036854775807, "size": 10, )"), 2002, "from"},
+      {"a size beyond 64 bits", SearchOf(R"({"match_all": {}})", R"("size": 1e300, )"), 2002, "size"},
+      {"a sort order that is an array", SearchOf(R"({"match_all": {}})", R"("sort": {"field": "CORVMDFSSize", "order": []}, )"), 2002, "order"},
+      {"an operator that is an object", SearchOf(R"({"match": {"_all": {"query": "x", "operator": {}}}})"), 2030, "operator"},
+      {"bytes that are not UTF-8", "{\"command\": \"\xff\xfe\x80\"}", 2001, "Unknown"},
+      {"highlight marks of 1 MB", SearchOf(R"({"match_all": {}})", R"("highlight": {"pre": ")" + std::string(1 << 20, '<') + R"("}, )"), 2002, "pre"},
+      {"10,000 fields to load", SearchOf(R"({"match_all": {}})", R"("load_field": [)" + Repeat(R"("a", )", 10000) + R"("a"], )"), 2002, "load_field"},
+  };
+  for (const auto& c : cases) {
+    const std::string answer_text = SendRaw(daemon_->socket_path(), Frame(c.request));
+    Json::Value answer;
+    ASSERT_TRUE(JsonFromString(answer, answer_text)) << c.what << ": no answer; " << daemon_->LogText();
+    EXPECT_EQ(answer["error"]["code"].asInt(), c.code) << c.what << ": " << answer_text;
+    EXPECT_NE(answer["error"]["msg"].asString().find(c.message), std::string::npos) << c.what << ": " << answer_text;
+    ASSERT_TRUE(Run("index_list")["success"].asBool()) << c.what;
+  }
+  // An index named 100,000 times is searched once.
+  Upsert("/volume1/share/one.txt", "word");
+  Commit();
+  const Json::Value repeated = Send(daemon_->socket_path(), Data(SearchOf(R"({"match_all": {}})", R"("ids": [)" +
+                                                                 Repeat(R"("fileindex_share", )", 100000) + R"("fileindex_share"], )")));
+  EXPECT_EQ(repeated["data"]["total"].asInt(), 1) << JsonToString(repeated).substr(0, 300);
+  // The limits leave ordinary queries alone: 64 words in a clause, 256 in all.
+  std::string at_limit;
+  for (int i = 0; i < 4; ++i) at_limit += std::string(i > 0 ? ", " : "") + Match(Words(64));
+  EXPECT_TRUE(Search(R"({"bool": {"should": [)" + at_limit + "]}}")["success"].asBool());
+}
+
 TEST_F(DaemonInputTest, TheSearchLanguage) {
   const auto add = [&](const std::string& path, const std::string& text, long long size, long long date) {
     Json::Value data;
@@ -231,6 +299,60 @@ TEST_F(DaemonInputTest, OrdinaryUsersSeeOnlyFilesTheyCanReadAndCannotChangeIndex
   EXPECT_EQ(answer["error"]["code"].asInt(), 2004);
   // Root sees everything.
   EXPECT_EQ(Search(R"({"match": {"_all": "common"}})")["data"]["total"].asInt(), 153);
+}
+
+}  // namespace
+}  // namespace elasticd_test
+}  // namespace corvlumex
+
+namespace corvlumex {
+namespace elasticd_test {
+namespace {
+
+class PerUserLimitTest : public DaemonTest {
+ protected:
+  std::vector<std::string> ExtraArgs() override { return {"--max-clients-per-user", "2"}; }
+};
+
+TEST_F(PerUserLimitTest, OneUserCannotTakeEveryConnectionNorSendHugeCompounds) {
+  if (geteuid() != 0) GTEST_SKIP() << "needs root to run a client as another user";
+  const struct passwd* nobody = getpwnam("nobody");
+  ASSERT_NE(nobody, nullptr);
+  chmod(root_.path().c_str(), 0755);
+  const std::string socket = daemon_->socket_path();
+  const std::string out = AsUser(*nobody, [&]() -> std::string {
+    try {
+      const Json::Value list = Data(R"({"command": "index_list"})");
+      // Two connections held open, each known to be served; the daemon counts
+      // a closed one out only once it has seen the close, so refusals of the
+      // first tries are tried again.
+      std::vector<int> held;
+      for (int attempt = 0; held.size() < 2 && attempt < 500; ++attempt) {
+        const int fd = ConnectTo(socket);
+        if (Exchange(fd, list)["success"].asBool()) {
+          held.push_back(fd);
+        } else {
+          close(fd);
+        }
+      }
+      const Json::Value refused = Send(socket, list);
+      std::string result = std::to_string(held.size()) + " " + refused["error"]["code"].asString() + " " +
+                           refused["error"]["msg"].asString();
+      for (const int fd : held) close(fd);
+      // Nor carry a million searches in one compound request.
+      Json::Value compound;
+      for (int i = 0; i < 65; ++i) compound["compound"].append(list);
+      const Json::Value too_many = Send(socket, compound);
+      return result + "\n" + too_many["error"]["code"].asString() + " " + too_many["error"]["msg"].asString();
+    } catch (const std::exception& error) {
+      return error.what();
+    }
+  });
+  EXPECT_EQ(out.substr(0, 7), "2 1400 ") << out;
+  EXPECT_NE(out.find("Too many connections from user"), std::string::npos) << out;
+  EXPECT_NE(out.find("\n2000 A compound request may hold at most 64 requests"), std::string::npos) << out;
+  // Root, the library's user, is not counted.
+  EXPECT_TRUE(Run("index_list")["success"].asBool());
 }
 
 }  // namespace

@@ -1,13 +1,18 @@
 // The parts of fileindexd on their own: the settle tracker, the indexing
 // rules, the folder walk, the command answers and the progress board.
 #include <gtest/gtest.h>
+#include <grp.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <filesystem>
 #include <fstream>
 #include <functional>
+#include <memory>
+#include <stdexcept>
+#include <thread>
 
 #include "common/error.h"
 #include "common/file_util.h"
@@ -19,6 +24,9 @@
 #include "programs/fileindexd/index_rules.h"
 #include "programs/fileindexd/progress.h"
 #include "programs/fileindexd/settle_tracker.h"
+#include "fileindex/frame_reader.h"
+#include "tests/support/child_process.h"
+#include "tests/support/frame_client.h"
 #include "tests/support/log_capture.h"
 
 namespace corvlumex {
@@ -167,6 +175,120 @@ TEST(FolderWalkerTest, ListsTheTreeWithoutEnteringLinksOrExcludedFolders) {
                                               top + "/skip/"}));
   EXPECT_TRUE(WalkFolder(top + "/missing").empty());
   ASSERT_EQ(WalkFolder(top + "/a/b/f.txt").size(), 1u);  // a file is its own walk
+}
+
+// The command socket served for real on a private socket, with limits a
+// loaded test machine cannot reach by accident.
+class CommandSocketTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    CommandLimits limits;
+    limits.request_timeout_ms = 60000;
+    limits.max_connections = 8;
+    server_ = std::make_unique<CommandServer>(
+        socket_, [](const std::string& type, const Json::Value&) {
+          if (type == "boom") throw std::logic_error("not a library error");
+          if (type != "status") throw Error(kErrorBadArgument, "Unknown command: " + type);
+          return Json::Value(Json::objectValue);
+        },
+        [](const std::string&) { return true; }, limits);
+    server_->Listen();
+    thread_ = std::thread([this] { server_->Run(); });
+  }
+  void TearDown() override {
+    server_->Stop();
+    thread_.join();
+  }
+  // The answer's error code; 0 for success, -1 for no answer.
+  int CodeOf(const std::string& bytes) {
+    Json::Value answer;
+    if (!JsonFromString(answer, testing_support::SendRaw(socket_, bytes))) return -1;
+    return answer["success"].asBool() ? 0 : answer["error"]["code"].asInt();
+  }
+
+  SandboxRoot root_;
+  std::string socket_ = root_.path() + "/fileindexd.sock";
+  std::unique_ptr<CommandServer> server_;
+  std::thread thread_;
+};
+
+TEST_F(CommandSocketTest, HostileFramesAreAnsweredAndNoClientHoldsUpAnother) {
+  using testing_support::Frame;
+  const std::string status = Frame(R"({"type": "status"})");
+  const uint32_t huge = 0xFFFFFFF0u;
+  const struct {
+    const char* what;
+    std::string bytes;
+    int code;
+  } cases[] = {
+      {"arrays nested past the JSON reader's limit", Frame(std::string(1001, '[') + std::string(1001, ']')), 120},
+      {"a length of 4 GiB", std::string(reinterpret_cast<const char*>(&huge), 4), 120},
+      {"an empty frame", std::string(4, '\0'), 120},
+      {"a type that is an array", Frame(R"({"type": ["status"]})"), 120},
+      {"not UTF-8", Frame("{\"type\": \"\xff\xfe\"}"), 120},
+      {"a handler that throws something else than an Error", Frame(R"({"type": "boom"})"), 9999},
+      // More than a socket buffer holds: it never arrives whole before it is read.
+      {"a request of 600 KB", Frame(R"({"type": "status", "data": ")" + std::string(600000, 'x') + R"("})"), 0},
+      {"a frame cut short", status.substr(0, 7), -1},
+  };
+  for (const auto& c : cases) {
+    EXPECT_EQ(CodeOf(c.bytes), c.code) << c.what;
+    EXPECT_EQ(CodeOf(status), 0) << "after " << c.what;
+  }
+  // Clients that send nothing or half a request hold only their own connection:
+  // the others are answered meanwhile, and so are they once they finish.
+  std::vector<int> slow;
+  for (int i = 0; i < 4; ++i) {
+    slow.push_back(testing_support::ConnectTo(socket_));
+    ASSERT_GE(slow.back(), 0);
+  }
+  ASSERT_EQ(write(slow[0], status.data(), 6), 6);
+  EXPECT_EQ(CodeOf(status), 0);
+  ASSERT_EQ(write(slow[0], status.data() + 6, status.size() - 6), static_cast<ssize_t>(status.size() - 6));
+  std::string answer;
+  EXPECT_EQ(fileindex::ReadFrameBounded(slow[0], 1u << 20, 20000, 20000, &answer), fileindex::FrameStatus::kOk);
+  EXPECT_NE(answer.find("\"success\":true"), std::string::npos) << answer;
+  for (const int fd : slow) close(fd);
+}
+
+TEST_F(CommandSocketTest, AnotherUserCannotTakeEveryConnection) {
+  if (geteuid() != 0) GTEST_SKIP() << "needs root to connect as another user";
+  chmod(root_.path().c_str(), 0755);
+  const std::string status = testing_support::Frame(R"({"type": "status"})");
+  int told[2], done[2];
+  ASSERT_EQ(0, pipe(told));
+  ASSERT_EQ(0, pipe(done));
+  const pid_t child = fork();
+  if (child == 0) {
+    // As nobody: its own share of connections held open, and one more.
+    close(told[0]);
+    close(done[1]);
+    if (setgroups(0, nullptr) != 0 || setgid(65534) != 0 || setuid(65534) != 0) _exit(3);
+    std::vector<int> held;
+    for (int i = 0; i < 8; ++i) held.push_back(testing_support::ConnectTo(socket_));
+    std::string refused;
+    try {
+      refused = testing_support::SendRaw(socket_, status);
+    } catch (const std::exception& error) {
+      refused = error.what();
+    }
+    if (write(told[1], refused.data(), refused.size()) < 0) _exit(4);
+    close(told[1]);
+    char byte;
+    if (read(done[0], &byte, 1) < 0) _exit(5);
+    _exit(0);
+  }
+  close(told[1]);
+  close(done[0]);
+  std::string refused;
+  char buffer[4096];
+  for (ssize_t n; (n = read(told[0], buffer, sizeof(buffer))) > 0;) refused.append(buffer, static_cast<size_t>(n));
+  EXPECT_NE(refused.find("try again later"), std::string::npos) << refused;
+  // Root is served meanwhile.
+  EXPECT_EQ(CodeOf(status), 0);
+  close(done[1]);
+  close(told[0]);
+  waitpid(child, nullptr, 0);
 }
 
 TEST(CommandServerTest, AnswersCarryTheCodeAndRefuseChangesFromOtherUsers) {

@@ -22,7 +22,8 @@ constexpr const char kWorkerInstallPath[] = "/var/packages/CorvLumex/target/bin/
 // Sends `fd` with one byte; false with errno on failure. Never raises SIGPIPE.
 bool SendDescriptor(int socket, int fd);
 // Receives a descriptor sent by SendDescriptor: the descriptor, -1 on end of
-// stream or failure (errno 0 at a clean end of stream).
+// stream or failure (errno 0 at a clean end of stream, EPROTO when the byte
+// came without a descriptor).
 int ReceiveDescriptor(int socket);
 
 }  // namespace extract
