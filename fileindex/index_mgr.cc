@@ -81,6 +81,7 @@ void FolderUpsert(const Json::Value& folder_list, bool create, bool updater_mode
     UpsertCORVNotifydCfg(share_name, folder_mgr);
   }
   folder_mgr.Save();
+  UpdateSpotlightShares(folder_mgr);
   for (const std::string& share_name : touched_shares) SendSettingChanged(share_name, true);
   if (updater_mode) return;
   for (const std::shared_ptr<Folder>& folder : reindex_list) {

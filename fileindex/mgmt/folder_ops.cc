@@ -176,6 +176,7 @@ void FolderDelete(const Json::Value& path_list) {
     }
     for (const std::string& full_path : share.to_reindex) QueueReindex(full_path);
   }
+  UpdateSpotlightShares(folder_mgr);
   if (folder_mgr.Folders().empty()) SetupRelatedServices(false);
 }
 
