@@ -69,6 +69,9 @@ std::string WriteSpotlightConfig(const SpotlightConfig& config,
   for (const std::string& share : config.shares) {
     text += "\n[" + share + "]\n";
     text += std::string("\tspotlight = ") + (config.enabled ? "yes" : "no") + "\n";
+    // A share takes the defaults of [global] as they stood where the share
+    // was defined, and smb.conf defines its shares before this file.
+    text += std::string("\tspotlight backend = ") + (config.enabled ? "elasticsearch" : "noindex") + "\n";
     text += "\telasticsearch:index = " + SpotlightIndexName(index_of(share)) + "\n";
   }
   return text;

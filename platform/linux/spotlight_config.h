@@ -11,6 +11,7 @@
 //   	...
 //   [photo]                                     (one section per indexed share; Samba
 //   	spotlight = yes                           merges it into the share's own section)
+//   	spotlight backend = elasticsearch
 //   	elasticsearch:index = fileindex_photo
 //
 // The file is also where the switch's state is read back from: the back end

@@ -6,7 +6,6 @@
 
 #include "common/log.h"
 #include "programs/corvspotlightd/answer_writer.h"
-#include "programs/corvspotlightd/peer_check.h"
 
 namespace corvlumex {
 namespace spotlightd {
@@ -23,7 +22,7 @@ void Answer(httplib::Response& response, int status, const std::string& type, co
 }  // namespace
 
 HttpListener::HttpListener(ListenerOptions options, const SearchHandler& handler)
-    : options_(std::move(options)), handler_(handler), server_(std::make_unique<httplib::Server>()) {
+    : options_(std::move(options)), gate_(options_.allowed_uids), handler_(handler), server_(std::make_unique<httplib::Server>()) {
   httplib::Server& server = *server_;
   const size_t threads = options_.max_connections;
   server.new_task_queue = [threads] { return new httplib::ThreadPool(threads); };
@@ -34,7 +33,7 @@ HttpListener::HttpListener(ListenerOptions options, const SearchHandler& handler
   server.set_payload_max_length(options_.max_body_bytes);
 
   server.set_pre_routing_handler([this](const httplib::Request& request, httplib::Response& response) {
-    if (PeerAllowed(request.local_addr, request.local_port, request.remote_addr, request.remote_port)) {
+    if (gate_.Allowed(TcpConnection{request.local_addr, request.local_port, request.remote_addr, request.remote_port})) {
       return httplib::Server::HandlerResponse::Unhandled;
     }
     Answer(response, 403, "security_exception", "only Samba may search here (root or the service user)");
@@ -93,16 +92,6 @@ int HttpListener::Bind() {
 bool HttpListener::Serve() { return server_->listen_after_bind(); }
 
 void HttpListener::Stop() { server_->stop(); }
-
-bool HttpListener::PeerAllowed(const std::string& local_address, int local_port, const std::string& remote_address,
-                               int remote_port) const {
-  const std::optional<uid_t> owner =
-      PeerSocketOwner(TcpConnection{local_address, local_port, remote_address, remote_port});
-  if (owner && options_.allowed_uids.count(*owner) > 0) return true;
-  CORV_LOG("refused a search from %s:%d (%s)", remote_address.c_str(), remote_port,
-           owner ? ("user id " + std::to_string(*owner)).c_str() : "owner unknown");
-  return false;
-}
 
 }  // namespace spotlightd
 }  // namespace corvlumex

@@ -7,8 +7,9 @@
 // fail), so idle connections are kept for `idle_timeout`, and each connection
 // holds one thread of a pool of `max_connections`.
 //
-// Every request's peer is checked first (peer_check.h): anyone but root and
-// the service user gets 403 and the connection is closed. Routes:
+// Every request's peer is checked first (peer_gate.h): anyone but root, the
+// service user and Samba acting for an SMB user gets 403 and the connection
+// is closed. Routes:
 //   POST /<index>/_search[?...]   the search (search_handler.h)
 //   any other method there        405
 //   anything else                 404
@@ -24,6 +25,7 @@
 #include <string>
 
 #include "platform/platform.h"
+#include "programs/corvspotlightd/peer_gate.h"
 #include "programs/corvspotlightd/search_handler.h"
 
 namespace httplib {
@@ -61,10 +63,8 @@ class HttpListener {
   void Stop();
 
  private:
-  bool PeerAllowed(const std::string& local_address, int local_port, const std::string& remote_address,
-                   int remote_port) const;
-
   ListenerOptions options_;
+  PeerGate gate_;
   const SearchHandler& handler_;
   std::unique_ptr<httplib::Server> server_;
 };

@@ -36,7 +36,7 @@ class NetlinkSocket {
 
 }  // namespace
 
-std::optional<uid_t> PeerSocketOwner(const TcpConnection& connection) {
+std::optional<PeerSocket> FindPeerSocket(const TcpConnection& connection) {
   struct {
     nlmsghdr header;
     inet_diag_req_v2 request;
@@ -78,7 +78,12 @@ std::optional<uid_t> PeerSocketOwner(const TcpConnection& connection) {
     if (header->nlmsg_type != SOCK_DIAG_BY_FAMILY) return std::nullopt;  // NLMSG_ERROR: no such socket
     if (header->nlmsg_len < NLMSG_LENGTH(sizeof(inet_diag_msg))) return std::nullopt;
     const inet_diag_msg* answer = static_cast<const inet_diag_msg*>(NLMSG_DATA(header));
-    return static_cast<uid_t>(answer->idiag_uid);
+    PeerSocket peer;
+    peer.owner = static_cast<uid_t>(answer->idiag_uid);
+    peer.inode = answer->idiag_inode;
+    peer.cookie = static_cast<uint64_t>(answer->id.idiag_cookie[0]) |
+                  (static_cast<uint64_t>(answer->id.idiag_cookie[1]) << 32);
+    return peer;
   }
   return std::nullopt;
 }

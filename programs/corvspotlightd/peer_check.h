@@ -7,6 +7,7 @@
 
 #include <sys/types.h>
 
+#include <cstdint>
 #include <optional>
 #include <string>
 
@@ -20,9 +21,15 @@ struct TcpConnection {
   int remote_port = 0;
 };
 
-// The owner uid of the peer's socket; nothing when the kernel knows no such
-// socket (the peer is gone, or it is not on this machine) or cannot be asked.
-std::optional<uid_t> PeerSocketOwner(const TcpConnection& connection);
+struct PeerSocket {
+  uid_t owner = 0;      // the user the socket was made as
+  uint64_t inode = 0;   // its inode, to find the processes holding it
+  uint64_t cookie = 0;  // the kernel's id of the socket, never reused while the system runs
+};
+
+// The peer's socket; nothing when the kernel knows no such socket (the peer
+// is gone, or it is not on this machine) or cannot be asked.
+std::optional<PeerSocket> FindPeerSocket(const TcpConnection& connection);
 
 }  // namespace spotlightd
 }  // namespace corvlumex
