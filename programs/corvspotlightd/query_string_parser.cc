@@ -48,15 +48,13 @@ class Parser {
     return true;
   }
 
-  static QueryNode Join(QueryNode::Kind kind, QueryNode left, QueryNode right) {
-    if (left.kind != kind) {
-      QueryNode joined;
-      joined.kind = kind;
-      joined.children.push_back(std::move(left));
-      left = std::move(joined);
-    }
-    left.children.push_back(std::move(right));
-    return left;
+  // One node of `kind` over `children`, or the only child itself.
+  static QueryNode Combine(QueryNode::Kind kind, std::vector<QueryNode> children) {
+    if (children.size() == 1) return std::move(children.front());
+    QueryNode node;
+    node.kind = kind;
+    node.children = std::move(children);
+    return node;
   }
 
   bool StartsClause() {
@@ -66,22 +64,18 @@ class Parser {
 
   QueryNode Expression(int depth) {
     if (depth > kMaxQueryDepth) Fail("nested deeper than " + std::to_string(kMaxQueryDepth) + " levels");
-    QueryNode node = And(depth);
-    while (true) {
-      if (Keyword("OR", "||")) {
-        node = Join(QueryNode::Kind::kOr, std::move(node), And(depth));
-      } else if (StartsClause()) {
-        node = Join(QueryNode::Kind::kOr, std::move(node), And(depth));  // side by side: OR
-      } else {
-        return node;
-      }
-    }
+    std::vector<QueryNode> alternatives;
+    alternatives.push_back(And(depth));
+    // "OR", or two clauses side by side (Lucene's default operator).
+    while (Keyword("OR", "||") || StartsClause()) alternatives.push_back(And(depth));
+    return Combine(QueryNode::Kind::kOr, std::move(alternatives));
   }
 
   QueryNode And(int depth) {
-    QueryNode node = Unary(depth);
-    while (Keyword("AND", "&&")) node = Join(QueryNode::Kind::kAnd, std::move(node), Unary(depth));
-    return node;
+    std::vector<QueryNode> all;
+    all.push_back(Unary(depth));
+    while (Keyword("AND", "&&")) all.push_back(Unary(depth));
+    return Combine(QueryNode::Kind::kAnd, std::move(all));
   }
 
   QueryNode Unary(int depth) {
