@@ -152,13 +152,9 @@ class Translator {
     return MatchAll();
   }
 
-  // Until the search language has a phrase clause, the words of a phrase
-  // must all be there, in any order.
+  // The words next to each other, in this order.
   static Json::Value Phrase(const std::string& field, const std::string& text) {
-    Json::Value match(Json::objectValue);
-    match["query"] = text;
-    match["operator"] = "and";
-    return Clause("match", field, match);
+    return Clause("match_phrase", field, text);
   }
 
   Json::Value Range(const QueryNode& node) const {

@@ -54,7 +54,7 @@ TEST_F(FolderDeleteTest, LastFolderOfAShareTakesItsIndexAndDataAlong) {
 
   FolderDelete(JsonList({"/music"}));
   EXPECT_THAT(sandbox_.SavedPaths(), ElementsAre());
-  EXPECT_THAT(NewServiceRequests(), ElementsAre("restart smbd.service", "--no-block stop corvcontentextractd.service",
+  EXPECT_THAT(NewServiceRequests(), ElementsAre("reload smbd.service", "--no-block stop corvcontentextractd.service",
                                                 "stop pkg-CorvLumex-fileindexd.service"));
 }
 

@@ -274,6 +274,8 @@ TEST_F(SpotlightSambaTest, MdsearchFindsWhatAScanOfTheTreeFinds) {
       {"kMDItemFSContentChangeDate<$time.iso(2020-01-01T00:00:00Z)",
        [cut](const Entry& e) { return e.mtime < cut; }},
       {"kMDItemContentType==\"public.plain-text\"", [](const Entry& e) { return e.mime == "text/plain"; }},
+      {"kMDItemTextContent==\"harbour lights\"",
+       [](const Entry& e) { return e.text.find("harbour lights") != std::string::npos; }},
       {"kMDItemTextContent==\"lighthouse\"&&kMDItemFSContentChangeDate<$time.iso(2020-01-01T00:00:00Z)",
        [cut](const Entry& e) { return HasWordStarting(e.text, "lighthouse") && e.mtime < cut; }},
   };
