@@ -17,8 +17,12 @@ namespace fileindex {
 
 void PrepareServices() {
   const FolderMgr folder_mgr;
-  SetupRelatedServices(!folder_mgr.Folders().empty());
-  UpdateSpotlightShares(folder_mgr);
+  // The share list is written while Spotlight is still off (or once it is
+  // off): samba re-reads its configuration once.
+  const bool enable = !folder_mgr.Folders().empty();
+  if (enable) UpdateSpotlightShares(folder_mgr);
+  SetupRelatedServices(enable);
+  if (!enable) UpdateSpotlightShares(folder_mgr);
 }
 
 void UpdateSpotlightShares(const FolderMgr& folder_mgr) {

@@ -12,9 +12,11 @@
 #include <sys/time.h>
 #include <netinet/in.h>
 #include <arpa/inet.h>
+#include <signal.h>
 #include <unistd.h>
 
 #include <algorithm>
+#include <cstdlib>
 #include <cstdio>
 #include <filesystem>
 #include <fstream>
@@ -116,7 +118,15 @@ class SpotlightSambaTest : public ::testing::Test {
                &client);
       ADD_FAILURE() << "mdsearch:\n" << client << "corvspotlightd:\n" << spotlightd_->Log() << "samba:\n" << samba_logs;
     }
-    if (smbd_) smbd_->Stop(SIGTERM);
+    if (smbd_) {
+      smbd_->Stop(SIGTERM);
+      // samba-dcerpcd and its rpcd workers run in a session of their own and
+      // outlive smbd: they are ended through their process group.
+      for (const char* helper : {"samba-dcerpcd", "smbd"}) {
+        const std::string pid = ReadFileText(sandbox_->root() + "/samba/pid/" + helper + ".pid");
+        if (atoi(pid.c_str()) > 1) kill(-atoi(pid.c_str()), SIGTERM);
+      }
+    }
     spotlightd_.reset();
     sandbox_.reset();
     if (user_made_) RunShell("userdel " + user_);
