@@ -79,7 +79,9 @@ SearchRequest ParseSearchRequest(const std::string& body) {
   std::string errors;
   try {
     if (!reader->parse(body.data(), body.data() + body.size(), &root, &errors)) {
-      Bad("the body is not valid JSON: " + errors.substr(0, errors.find('\n')));
+      std::string first = errors.substr(0, errors.find('\n'));
+      if (first.compare(0, 2, "* ") == 0) first.erase(0, 2);
+      Bad("the body is not valid JSON: " + first);
     }
   } catch (const Json::Exception& error) {  // the depth limit throws
     Bad(std::string("the body is not valid JSON: ") + error.what());

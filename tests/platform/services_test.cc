@@ -86,6 +86,24 @@ TEST_F(ServicesTest, TheConfiguredCommandCarriesTheRequest) {
   EXPECT_NE(LastError().message.find("status 3"), std::string::npos) << LastError().message;
 }
 
+TEST_F(ServicesTest, SambaIsReloadedNeverRestarted) {
+  // With systemd's command (a real host), every smbd process is told to
+  // re-read its configuration; a restart would drop every SMB client.
+  root_.WriteFile("etc/corvlumex/service_command", "/bin/systemctl\n");
+  const std::string smbcontrol = root_.WriteFile("bin/smbcontrol", "#!/bin/sh\necho \"smbcontrol $@\" >> " +
+                                                                       root_.path() + "/asked\n");
+  chmod(smbcontrol.c_str(), 0755);
+  const std::string old_path = getenv("PATH") != nullptr ? getenv("PATH") : "/usr/bin:/bin";
+  setenv("PATH", (root_.path() + "/bin:" + old_path).c_str(), 1);
+  EXPECT_EQ(platform_.ServiceRestart("samba"), 0);
+  setenv("PATH", old_path.c_str(), 1);
+  EXPECT_EQ(ReadAll(root_.path() + "/asked"), "smbcontrol smbd reload-config\n");
+  // Through an administrator's own service command it is a reload too.
+  ScopedEnv command("CORVLUMEX_SERVICE_COMMAND", RecordingCommand(0));
+  EXPECT_EQ(platform_.ServiceRestart("samba"), 0);
+  EXPECT_EQ(ReadAll(root_.path() + "/asked"), "smbcontrol smbd reload-config\nreload smbd.service\n");
+}
+
 TEST_F(ServicesTest, ExecRunsWithoutAShell) {
   const std::string odd_name = root_.path() + "/a b; rm -rf $HOME";
   EXPECT_EQ(platform_.Exec("/usr/bin/touch", {odd_name}, kExecDefault), 0);
