@@ -2,7 +2,7 @@
 
 #include <httplib.h>
 
-#include <regex>
+#include <limits>
 
 #include "common/log.h"
 #include "programs/corvspotlightd/answer_writer.h"
@@ -13,6 +13,13 @@ namespace {
 
 constexpr char kSearchRoute[] = R"(/([^/]+)/_search)";
 constexpr char kJson[] = "application/json";
+
+// "/<index>/_search", the one path served.
+bool IsSearchPath(const std::string& path) {
+  const size_t slash = path.find('/', 1);
+  return path.size() > 1 && path[0] == '/' && slash != std::string::npos && slash > 1 &&
+         path.compare(slash, std::string::npos, "/_search") == 0;
+}
 
 void Answer(httplib::Response& response, int status, const std::string& type, const std::string& reason) {
   response.status = status;
@@ -46,7 +53,7 @@ HttpListener::HttpListener(ListenerOptions options, const SearchHandler& handler
     response.set_content(answer.body, kJson);
   });
   const auto refuse = [](const httplib::Request& request, httplib::Response& response) {
-    if (std::regex_match(request.path, std::regex(kSearchRoute))) {
+    if (IsSearchPath(request.path)) {
       Answer(response, 405, "method_not_allowed", request.method + " " + request.path + ": only POST searches here");
       response.set_header("Allow", "POST");
     } else {
