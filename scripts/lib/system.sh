@@ -8,8 +8,8 @@
 #   CORVLUMEX_ROOT   the sandbox root; the daemons' logs and pid files go
 #                    to $CORVLUMEX_ROOT/var/log/corvlumex and .../var/run
 
-SYSTEM_PROGRAMS=(corvelasticd corvnotifyd fileindexd)
-SYSTEM_TARGETS=(corvelasticd corvnotifyd fileindexd fileindex_cli corvcontentextractd corvvxmnotify)
+SYSTEM_PROGRAMS=(corvelasticd corvnotifyd fileindexd corvspotlightd)
+SYSTEM_TARGETS=(corvelasticd corvnotifyd fileindexd fileindex_cli corvcontentextractd corvvxmnotify corvspotlightd)
 
 system_build() {  # builds only what is needed, reusing an existing build folder
   local build="${FILEINDEX_BUILD:-$FILEINDEX_SRC/build}"
@@ -18,7 +18,7 @@ system_build() {  # builds only what is needed, reusing an existing build folder
   cmake -S "$FILEINDEX_SRC" -B "$build" -DCMAKE_BUILD_TYPE=RelWithDebInfo > "$build.configure.log" 2>&1 ||
     { cat "$build.configure.log"; return 1; }
   cmake --build "$build" -j "$(nproc)" --target "${SYSTEM_TARGETS[@]}" 2>&1 | grep -E 'error|warning:|Built target' || true
-  for target in fileindexd fileindex corvelasticd corvnotifyd corvcontentextractd corvvxmnotify; do
+  for target in fileindexd fileindex corvelasticd corvnotifyd corvcontentextractd corvvxmnotify corvspotlightd; do
     [ -x "$(system_program "$target")" ] || { echo "build failed: $target is missing" >&2; return 1; }
   done
 }
@@ -44,7 +44,7 @@ system_running() {  # program name -> true when its recorded pid is alive
   [ -f "$pid_file" ] && kill -0 "$(cat "$pid_file")" 2>/dev/null
 }
 
-system_start() {  # starts the three daemons in the sandbox root (those not running yet)
+system_start() {  # starts the daemons in the sandbox root (those not running yet)
   local logs; logs="$(system_log_dir)"
   mkdir -p "$logs" "$CORVLUMEX_ROOT/var/run" "$CORVLUMEX_ROOT/etc/corvlumex/monitor.d" "$CORVLUMEX_ROOT/tmp" \
     "$CORVLUMEX_ROOT/var/packages/CorvLumex/etc"
@@ -58,6 +58,9 @@ system_start() {  # starts the three daemons in the sandbox root (those not runn
     system_running "$program" && continue
     case "$program" in
       corvelasticd) args=(--log-stderr) ;;
+      # Samba's Spotlight back end asks it over loopback HTTP; in a sandbox
+      # any free port (the log names it), FILEINDEX_SPOTLIGHT_PORT to choose.
+      corvspotlightd) args=(--log-stderr --port "${FILEINDEX_SPOTLIGHT_PORT:-0}") ;;
       *) args=(--foreground) ;;
     esac
     nohup "$(system_program "$program")" "${args[@]}" >> "$logs/$program.log" 2>&1 < /dev/null &
@@ -69,7 +72,7 @@ system_start() {  # starts the three daemons in the sandbox root (those not runn
 
 system_stop() {  # stops the daemons started by system_start (SIGTERM, then SIGKILL after 10 s)
   local program pid pid_file
-  for program in fileindexd corvnotifyd corvelasticd; do
+  for program in corvspotlightd fileindexd corvnotifyd corvelasticd; do
     pid_file="$(system_pid_file "$program")"
     [ -f "$pid_file" ] || continue
     pid="$(cat "$pid_file")"
