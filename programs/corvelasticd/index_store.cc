@@ -29,6 +29,19 @@ constexpr int kReaderCacheKb = 16384;
 // Full-text rows queued beyond this are handed to the engine before the next request.
 constexpr size_t kMaxPendingIndexBytes = 16u << 20;
 
+WalLimits g_wal_limits;
+std::mutex g_wal_limits_mutex;
+
+WalLimits CurrentWalLimits() {
+  std::lock_guard<std::mutex> guard(g_wal_limits_mutex);
+  return g_wal_limits;
+}
+
+int64_t FileBytes(const std::string& path) {
+  struct stat info;
+  return stat(path.c_str(), &info) == 0 ? static_cast<int64_t>(info.st_size) : 0;
+}
+
 [[noreturn]] void BadDocument(const std::string& what) { throw DaemonError(kCodeBadDocument, "Bad document: " + what); }
 
 // Values of a field: an array's elements, or the value itself.
@@ -56,7 +69,13 @@ std::string JoinTokens(const std::vector<std::string>& tokens) {
 
 std::string IndexStore::DatabasePath(const std::string& directory) { return directory + "/" + kDatabaseName; }
 
-IndexStore::IndexStore(const std::string& path, std::unique_ptr<Database> writer) : path_(path), writer_(std::move(writer)) {}
+void IndexStore::SetWalLimits(const WalLimits& limits) {
+  std::lock_guard<std::mutex> guard(g_wal_limits_mutex);
+  g_wal_limits = limits;
+}
+
+IndexStore::IndexStore(const std::string& path, std::unique_ptr<Database> writer)
+    : path_(path), wal_limits_(CurrentWalLimits()), writer_(std::move(writer)) {}
 
 IndexStore::~IndexStore() {
   try {
@@ -121,6 +140,7 @@ std::unique_ptr<IndexStore> IndexStore::Open(const std::string& directory) {
 
 void IndexStore::LoadSchema() {
   writer_->Exec("PRAGMA cache_size=-16384");
+  LimitWriteAheadLog();
   Statement& stmt = writer_->Cached("SELECT value FROM meta WHERE name = 'mappings'");
   if (!stmt.Step() || !JsonFromString(mappings_, stmt.Text(0))) {
     throw DaemonError(kCodeIndexFailed, "The index database " + path_ + " has no readable mappings");
@@ -315,6 +335,7 @@ void IndexStore::Atomically(Body body) {
     throw;
   }
   Run("RELEASE request");
+  CommitStepIfLogLarge();
 }
 
 // Some failures (a full volume, an I/O error) make SQLite roll the whole
@@ -469,23 +490,50 @@ Json::Value IndexStore::GetByQuery(const Query& query, const std::vector<std::st
   return out;
 }
 
+void IndexStore::LimitWriteAheadLog() {
+  // A restarted log is cut back to keep_bytes (it is only ever reused, never
+  // shrunk, otherwise), and a commit checkpoints a log of more than 1,000
+  // pages without waiting for readers (SQLite's passive auto-checkpoint).
+  writer_->Exec("PRAGMA journal_size_limit=" + std::to_string(wal_limits_.keep_bytes));
+  writer_->Exec("PRAGMA wal_autocheckpoint=1000");
+  // The log grows only when dirty pages leave the cache: they must leave it
+  // before the log could reach step_bytes, or the step would come late.
+  Statement& pages = writer_->Cached("PRAGMA cache_size");
+  Statement& page_size = writer_->Cached("PRAGMA page_size");
+  if (pages.Step() && page_size.Step() && page_size.Int(0) > 0) {
+    // A negative cache size is in KiB.
+    const int64_t cache_pages = pages.Int(0) < 0 ? -pages.Int(0) * 1024 / page_size.Int(0) : pages.Int(0);
+    const int64_t step_pages = std::max<int64_t>(1, wal_limits_.step_bytes / page_size.Int(0));
+    writer_->Exec("PRAGMA cache_spill=" + std::to_string(std::min(cache_pages, step_pages)));
+  }
+  pages.Reset();
+  page_size.Reset();
+}
+
+void IndexStore::CommitTransaction() {
+  keys_.BeginCommit();
+  try {
+    FlushIndexWrites();
+    writer_->Exec("COMMIT");
+  } catch (const std::exception&) {
+    keys_.EndCommit(false, false, key_changes_);
+    NoteLostTransaction();  // a full volume can make SQLite roll the transaction back
+    throw;
+  }
+  in_transaction_ = false;
+  keys_.EndCommit(true, key_changes_complete_, key_changes_);
+  key_changes_.clear();
+  key_changes_complete_ = true;
+}
+
+void IndexStore::CommitStepIfLogLarge() {
+  if (!in_transaction_ || FileBytes(path_ + "-wal") < wal_limits_.step_bytes) return;
+  CommitTransaction();
+}
+
 CommitChanges IndexStore::Commit() {
   CommitChanges changes;
-  if (in_transaction_) {
-    keys_.BeginCommit();
-    try {
-      FlushIndexWrites();
-      writer_->Exec("COMMIT");
-    } catch (const std::exception&) {
-      keys_.EndCommit(false, false, key_changes_);
-      NoteLostTransaction();  // a full volume can make SQLite roll the transaction back
-      throw;
-    }
-    in_transaction_ = false;
-    keys_.EndCommit(true, key_changes_complete_, key_changes_);
-    key_changes_.clear();
-    key_changes_complete_ = true;
-  }
+  if (in_transaction_) CommitTransaction();
   changes.upserted.assign(upserted_.begin(), upserted_.end());
   changes.deleted.assign(deleted_.begin(), deleted_.end());
   changes.truncated = truncated_;
