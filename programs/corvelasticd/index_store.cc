@@ -527,8 +527,15 @@ void IndexStore::CommitTransaction() {
 }
 
 void IndexStore::CommitStepIfLogLarge() {
-  if (!in_transaction_ || FileBytes(path_ + "-wal") < wal_limits_.step_bytes) return;
+  // The full-text rows still queued in memory reach the log at the commit.
+  if (!in_transaction_ ||
+      FileBytes(path_ + "-wal") + static_cast<int64_t>(pending_index_.bytes()) < wal_limits_.step_bytes) {
+    return;
+  }
   CommitTransaction();
+  // SQLite checkpoints by itself only past 1,000 pages; a step smaller than
+  // that would otherwise let the log grow to 4 MB before it restarts.
+  writer_->CheckpointPassive();
 }
 
 CommitChanges IndexStore::Commit() {

@@ -13,7 +13,7 @@ rm -rf "$work"
 mkdir -p "$work"
 out="$work/packages"
 
-FILEINDEX_PACKAGE_STAGING="$work/staging" "$root/scripts/package" "$out"
+"$root/scripts/package" "$out"
 
 failures=0
 fail() { echo "FAIL: $*" >&2; failures=$((failures + 1)); }
