@@ -89,7 +89,8 @@ grep -q '^PrivateTmp=yes' "$extract/lib/systemd/system/pkg-CorvLumex-fileindexd.
 # Maintainer scripts: the service user, the units enabled, state purged.
 control="$work/control"
 dpkg-deb -e "$(deb corvlumex)" "$control"
-grep -q 'adduser --system.* CorvLumex' "$control/postinst" || fail "postinst does not create the service user CorvLumex"
+# (the adduser call spans lines)
+tr -d '\\\n' < "$control/postinst" | grep -q 'adduser --system.* CorvLumex' || fail "postinst does not create the service user CorvLumex"
 grep -q 'deb-systemd-helper .*enable' "$control/postinst" || fail "postinst does not enable the units"
 grep -q 'rm -rf /var/packages/CorvLumex' "$control/postrm" || fail "postrm does not purge the state folder"
 grep -q 'deb-systemd-helper purge' "$control/postrm" || fail "postrm does not purge the units' enablement"
