@@ -37,11 +37,6 @@ WalLimits CurrentWalLimits() {
   return g_wal_limits;
 }
 
-int64_t FileBytes(const std::string& path) {
-  struct stat info;
-  return stat(path.c_str(), &info) == 0 ? static_cast<int64_t>(info.st_size) : 0;
-}
-
 [[noreturn]] void BadDocument(const std::string& what) { throw DaemonError(kCodeBadDocument, "Bad document: " + what); }
 
 // Values of a field: an array's elements, or the value itself.
@@ -335,7 +330,7 @@ void IndexStore::Atomically(Body body) {
     throw;
   }
   Run("RELEASE request");
-  CommitStepIfLogLarge();
+  CommitStepIfLarge();
 }
 
 // Some failures (a full volume, an I/O error) make SQLite roll the whole
@@ -343,6 +338,7 @@ void IndexStore::Atomically(Body body) {
 void IndexStore::NoteLostTransaction() {
   if (!in_transaction_ || sqlite3_get_autocommit(writer_->raw()) == 0) return;
   in_transaction_ = false;
+  transaction_bytes_ = 0;
   pending_index_.Clear();
   key_changes_.clear();
   key_changes_complete_ = true;  // the rows are as last committed, as the directory is
@@ -357,6 +353,7 @@ void IndexStore::FlushIndexWrites() {
   if (pending_index_.empty()) return;
   Begin();
   Run("SAVEPOINT index_writes");
+  transaction_bytes_ += static_cast<int64_t>(pending_index_.bytes());
   try {
     pending_index_.ApplyTo(*writer_);
   } catch (...) {
@@ -391,6 +388,7 @@ void IndexStore::Upsert(const std::string& doc_id, const Json::Value& input) {
       update.Bind(2, row.rowid);
       update.Step();
       update.Reset();
+      transaction_bytes_ += static_cast<int64_t>(stored.size());
       IndexEntries(row.rowid, document, false);
     } else {
       Statement& insert = writer_->Cached("INSERT INTO docs(key, doc) VALUES(?, ?)");
@@ -398,6 +396,7 @@ void IndexStore::Upsert(const std::string& doc_id, const Json::Value& input) {
       insert.BindBlob(2, stored);
       insert.Step();
       insert.Reset();
+      transaction_bytes_ += static_cast<int64_t>(key.size() + stored.size());
       const int64_t rowid = sqlite3_last_insert_rowid(writer_->raw());
       NoteKeyChange(rowid, key);
       IndexEntries(rowid, document, false);
@@ -424,10 +423,12 @@ void IndexStore::SetById(const std::string& doc_id, const Json::Value& changes) 
       NoteDelete(doc_id);
     }
     Statement& update = writer_->Cached("UPDATE docs SET key = ?, doc = ? WHERE rowid = ?");
+    const std::string stored = EncodeDocument(key, document);
     update.BindText(1, key);
-    update.BindBlob(2, EncodeDocument(key, document));
+    update.BindBlob(2, stored);
     update.Bind(3, row.rowid);
     update.Step();
+    transaction_bytes_ += static_cast<int64_t>(key.size() + stored.size());
     update.Reset();
     NoteKeyChange(row.rowid, key);
     IndexEntries(row.rowid, document, false);
@@ -496,18 +497,6 @@ void IndexStore::LimitWriteAheadLog() {
   // pages without waiting for readers (SQLite's passive auto-checkpoint).
   writer_->Exec("PRAGMA journal_size_limit=" + std::to_string(wal_limits_.keep_bytes));
   writer_->Exec("PRAGMA wal_autocheckpoint=1000");
-  // The log grows only when dirty pages leave the cache: they must leave it
-  // before the log could reach step_bytes, or the step would come late.
-  Statement& pages = writer_->Cached("PRAGMA cache_size");
-  Statement& page_size = writer_->Cached("PRAGMA page_size");
-  if (pages.Step() && page_size.Step() && page_size.Int(0) > 0) {
-    // A negative cache size is in KiB.
-    const int64_t cache_pages = pages.Int(0) < 0 ? -pages.Int(0) * 1024 / page_size.Int(0) : pages.Int(0);
-    const int64_t step_pages = std::max<int64_t>(1, wal_limits_.step_bytes / page_size.Int(0));
-    writer_->Exec("PRAGMA cache_spill=" + std::to_string(std::min(cache_pages, step_pages)));
-  }
-  pages.Reset();
-  page_size.Reset();
 }
 
 void IndexStore::CommitTransaction() {
@@ -521,15 +510,18 @@ void IndexStore::CommitTransaction() {
     throw;
   }
   in_transaction_ = false;
+  transaction_bytes_ = 0;
   keys_.EndCommit(true, key_changes_complete_, key_changes_);
   key_changes_.clear();
   key_changes_complete_ = true;
 }
 
-void IndexStore::CommitStepIfLogLarge() {
-  // The full-text rows still queued in memory reach the log at the commit.
-  if (!in_transaction_ ||
-      FileBytes(path_ + "-wal") + static_cast<int64_t>(pending_index_.bytes()) < wal_limits_.step_bytes) {
+void IndexStore::CommitStepIfLarge() {
+  // What a transaction wrote sits in the page cache until the cache is full
+  // and reaches the log at the latest at the commit, so the log's size shows
+  // the transaction too late: the bytes given to SQLite and the full-text
+  // rows still queued are counted instead.
+  if (!in_transaction_ || transaction_bytes_ + static_cast<int64_t>(pending_index_.bytes()) < wal_limits_.step_bytes) {
     return;
   }
   CommitTransaction();

@@ -9,10 +9,11 @@
 //
 // The write-ahead log holds a whole transaction until it is committed, so a
 // folder's first index (one batch, one "commit") would need the index's size
-// twice over on disk. A transaction whose log passes WalLimits::step_bytes is
-// therefore committed in steps: searches may see the first part of such a
-// long batch before its "commit", and the log, checkpointed after each step
-// and cut back to WalLimits::keep_bytes when it restarts, stays small.
+// twice over on disk. A transaction that has written more than
+// WalLimits::step_bytes is therefore committed in steps: searches may see the
+// first part of such a long batch before its "commit", and the log,
+// checkpointed after each step and cut back to WalLimits::keep_bytes when it
+// restarts, stays near the step's size.
 #pragma once
 
 #include <json/json.h>
@@ -71,7 +72,7 @@ struct Suggestion {
 
 // Bounds on the write-ahead log; the defaults suit the daemon, tests make them small.
 struct WalLimits {
-  int64_t step_bytes = 32 << 20;  // a longer transaction is committed in steps
+  int64_t step_bytes = 32 << 20;  // a transaction writing more is committed in steps
   int64_t keep_bytes = 32 << 20;  // the log is cut back to this when it restarts
 };
 
@@ -139,8 +140,8 @@ class IndexStore {
   void NoteLostTransaction();
   // Commits the open transaction; the changed keys stay for the client's commit.
   void CommitTransaction();
-  // Commits a transaction whose write-ahead log has outgrown WalLimits::step_bytes.
-  void CommitStepIfLogLarge();
+  // Commits a transaction that has written more than WalLimits::step_bytes.
+  void CommitStepIfLarge();
   void LimitWriteAheadLog();
   // Runs a statement without parameters that returns no rows, kept prepared.
   void Run(const char* sql);
@@ -158,6 +159,7 @@ class IndexStore {
   WalLimits wal_limits_;
   std::unique_ptr<Database> writer_;
   bool in_transaction_ = false;
+  int64_t transaction_bytes_ = 0;  // document and full-text rows given to SQLite since BEGIN
   Json::Value mappings_;
   IndexSchema schema_;
   std::vector<const FieldSpec*> text_fields_;
