@@ -3,6 +3,9 @@
 // name-substring and word searches through the socket with the access
 // filter of an ordinary user, a prefix delete of 10% of the documents, the
 // daemon's peak memory and the database size against the text indexed.
+// `--commit-every 0` commits once at the end, as the first index of a folder
+// does; the index folder's size is sampled during the ingest, so its peak
+// (database plus write-ahead log) can be set against the final size.
 //
 //   corvelasticd_bench --daemon BUILD/programs/corvelasticd/corvelasticd --docs 1000000 --work DIR
 #include <dirent.h>
@@ -17,6 +20,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <atomic>
 #include <chrono>
 #include <cstring>
 #include <fstream>
@@ -25,6 +29,7 @@
 #include <random>
 #include <sstream>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "common/json_util.h"
@@ -45,6 +50,7 @@ struct Options {
   int queries = 300;
   bool reuse = false;  // the work directory holds a finished ingest: measure searches (and the delete) again
   bool keep = false;   // no delete, so the index can be measured again with --reuse
+  long commit_every = 1000;  // 0: one commit after the whole ingest
 };
 
 std::string g_socket;
@@ -217,6 +223,19 @@ long long FileSize(const std::string& path) {
   return stat(path.c_str(), &info) == 0 ? info.st_size : 0;
 }
 
+// The disk space the files of a folder take (blocks allocated, not lengths).
+long long FolderBytes(const std::string& folder) {
+  long long total = 0;
+  DIR* dir = opendir(folder.c_str());
+  if (dir == nullptr) return 0;
+  while (dirent* entry = readdir(dir)) {
+    struct stat info;
+    if (stat((folder + "/" + entry->d_name).c_str(), &info) == 0 && S_ISREG(info.st_mode)) total += info.st_blocks * 512LL;
+  }
+  closedir(dir);
+  return total;
+}
+
 // Runs `body` as an ordinary user when this is root, so the access filter checks every hit.
 template <typename Body>
 std::vector<double> AsOrdinaryUser(Body body) {
@@ -254,9 +273,10 @@ int main(int argc, char** argv) {
     else if (key == "--queries") options.queries = atoi(argv[i + 1]);
     else if (key == "--reuse") options.reuse = std::string(argv[i + 1]) == "1";
     else if (key == "--keep") options.keep = std::string(argv[i + 1]) == "1";
+    else if (key == "--commit-every") options.commit_every = atol(argv[i + 1]);
   }
   if (options.daemon.empty()) {
-    std::cerr << "usage: corvelasticd_bench --daemon PATH [--docs N] [--work DIR] [--queries N] [--reuse 1] [--keep 1]\n";
+    std::cerr << "usage: corvelasticd_bench --daemon PATH [--docs N] [--work DIR] [--queries N] [--reuse 1] [--keep 1] [--commit-every N]\n";
     return 2;
   }
   signal(SIGPIPE, SIG_IGN);
@@ -298,6 +318,15 @@ int main(int argc, char** argv) {
   long long raw_json = 0, raw_text = 0;
   const auto ingest_start = Clock::now();
   const double client_cpu_start = CpuSeconds(getpid());
+  // The index folder's size every 50 ms: what the volume must hold while indexing.
+  std::atomic<bool> ingesting{true};
+  std::atomic<long long> peak_folder_bytes{0};
+  std::thread folder_sampler([&] {
+    while (ingesting.load()) {
+      peak_folder_bytes = std::max(peak_folder_bytes.load(), FolderBytes(options.work + "/index"));
+      usleep(50000);
+    }
+  });
   for (long i = 0; i < options.docs; ++i) {
     const std::string path = PathOf(share, i);
     std::string text;
@@ -322,9 +351,12 @@ int main(int argc, char** argv) {
     data["data"] = doc;
     if (options.reuse) continue;  // the same documents, already indexed
     Command("document_upsert_by_id", data);
-    if ((i + 1) % 1000 == 0) Command("commit", Json::Value(Json::objectValue));
+    if (options.commit_every > 0 && (i + 1) % options.commit_every == 0) Command("commit", Json::Value(Json::objectValue));
   }
   if (!options.reuse) Command("commit", Json::Value(Json::objectValue));
+  peak_folder_bytes = std::max(peak_folder_bytes.load(), FolderBytes(options.work + "/index"));
+  ingesting = false;
+  folder_sampler.join();
   const double ingest_seconds = std::chrono::duration<double>(Clock::now() - ingest_start).count();
   const double ingest_cpu = CpuSeconds(daemon);
   const double client_cpu = CpuSeconds(getpid()) - client_cpu_start;
@@ -385,6 +417,8 @@ int main(int argc, char** argv) {
     std::cout << "ingest: " << static_cast<long>(options.docs / ingest_seconds) << " documents/s (" << ingest_seconds
               << " s; daemon CPU " << ingest_cpu << " s = " << static_cast<long>(options.docs / std::max(ingest_cpu, 1e-3))
               << " documents per CPU second; the client's CPU " << client_cpu << " s; load average " << ingest_load << ")\n";
+    std::cout << "index folder during the ingest (commit every " << options.commit_every << "): peak "
+              << peak_folder_bytes / 1e6 << " MB, database after the ingest " << db_bytes / 1e6 << " MB\n";
   };
   if (options.keep) {
     StopDaemon(daemon);

@@ -29,6 +29,14 @@ constexpr int kReaderCacheKb = 16384;
 // Full-text rows queued beyond this are handed to the engine before the next request.
 constexpr size_t kMaxPendingIndexBytes = 16u << 20;
 
+WalLimits g_wal_limits;
+std::mutex g_wal_limits_mutex;
+
+WalLimits CurrentWalLimits() {
+  std::lock_guard<std::mutex> guard(g_wal_limits_mutex);
+  return g_wal_limits;
+}
+
 [[noreturn]] void BadDocument(const std::string& what) { throw DaemonError(kCodeBadDocument, "Bad document: " + what); }
 
 // Values of a field: an array's elements, or the value itself.
@@ -56,7 +64,13 @@ std::string JoinTokens(const std::vector<std::string>& tokens) {
 
 std::string IndexStore::DatabasePath(const std::string& directory) { return directory + "/" + kDatabaseName; }
 
-IndexStore::IndexStore(const std::string& path, std::unique_ptr<Database> writer) : path_(path), writer_(std::move(writer)) {}
+void IndexStore::SetWalLimits(const WalLimits& limits) {
+  std::lock_guard<std::mutex> guard(g_wal_limits_mutex);
+  g_wal_limits = limits;
+}
+
+IndexStore::IndexStore(const std::string& path, std::unique_ptr<Database> writer)
+    : path_(path), wal_limits_(CurrentWalLimits()), writer_(std::move(writer)) {}
 
 IndexStore::~IndexStore() {
   try {
@@ -121,6 +135,7 @@ std::unique_ptr<IndexStore> IndexStore::Open(const std::string& directory) {
 
 void IndexStore::LoadSchema() {
   writer_->Exec("PRAGMA cache_size=-16384");
+  LimitWriteAheadLog();
   Statement& stmt = writer_->Cached("SELECT value FROM meta WHERE name = 'mappings'");
   if (!stmt.Step() || !JsonFromString(mappings_, stmt.Text(0))) {
     throw DaemonError(kCodeIndexFailed, "The index database " + path_ + " has no readable mappings");
@@ -315,6 +330,7 @@ void IndexStore::Atomically(Body body) {
     throw;
   }
   Run("RELEASE request");
+  CommitStepIfLarge();
 }
 
 // Some failures (a full volume, an I/O error) make SQLite roll the whole
@@ -322,6 +338,7 @@ void IndexStore::Atomically(Body body) {
 void IndexStore::NoteLostTransaction() {
   if (!in_transaction_ || sqlite3_get_autocommit(writer_->raw()) == 0) return;
   in_transaction_ = false;
+  transaction_bytes_ = 0;
   pending_index_.Clear();
   key_changes_.clear();
   key_changes_complete_ = true;  // the rows are as last committed, as the directory is
@@ -336,6 +353,7 @@ void IndexStore::FlushIndexWrites() {
   if (pending_index_.empty()) return;
   Begin();
   Run("SAVEPOINT index_writes");
+  transaction_bytes_ += static_cast<int64_t>(pending_index_.bytes());
   try {
     pending_index_.ApplyTo(*writer_);
   } catch (...) {
@@ -370,6 +388,7 @@ void IndexStore::Upsert(const std::string& doc_id, const Json::Value& input) {
       update.Bind(2, row.rowid);
       update.Step();
       update.Reset();
+      transaction_bytes_ += static_cast<int64_t>(stored.size());
       IndexEntries(row.rowid, document, false);
     } else {
       Statement& insert = writer_->Cached("INSERT INTO docs(key, doc) VALUES(?, ?)");
@@ -377,6 +396,7 @@ void IndexStore::Upsert(const std::string& doc_id, const Json::Value& input) {
       insert.BindBlob(2, stored);
       insert.Step();
       insert.Reset();
+      transaction_bytes_ += static_cast<int64_t>(key.size() + stored.size());
       const int64_t rowid = sqlite3_last_insert_rowid(writer_->raw());
       NoteKeyChange(rowid, key);
       IndexEntries(rowid, document, false);
@@ -403,10 +423,12 @@ void IndexStore::SetById(const std::string& doc_id, const Json::Value& changes) 
       NoteDelete(doc_id);
     }
     Statement& update = writer_->Cached("UPDATE docs SET key = ?, doc = ? WHERE rowid = ?");
+    const std::string stored = EncodeDocument(key, document);
     update.BindText(1, key);
-    update.BindBlob(2, EncodeDocument(key, document));
+    update.BindBlob(2, stored);
     update.Bind(3, row.rowid);
     update.Step();
+    transaction_bytes_ += static_cast<int64_t>(key.size() + stored.size());
     update.Reset();
     NoteKeyChange(row.rowid, key);
     IndexEntries(row.rowid, document, false);
@@ -469,23 +491,48 @@ Json::Value IndexStore::GetByQuery(const Query& query, const std::vector<std::st
   return out;
 }
 
+void IndexStore::LimitWriteAheadLog() {
+  // A restarted log is cut back to keep_bytes (it is only ever reused, never
+  // shrunk, otherwise), and a commit checkpoints a log of more than 1,000
+  // pages without waiting for readers (SQLite's passive auto-checkpoint).
+  writer_->Exec("PRAGMA journal_size_limit=" + std::to_string(wal_limits_.keep_bytes));
+  writer_->Exec("PRAGMA wal_autocheckpoint=1000");
+}
+
+void IndexStore::CommitTransaction() {
+  keys_.BeginCommit();
+  try {
+    FlushIndexWrites();
+    writer_->Exec("COMMIT");
+  } catch (const std::exception&) {
+    keys_.EndCommit(false, false, key_changes_);
+    NoteLostTransaction();  // a full volume can make SQLite roll the transaction back
+    throw;
+  }
+  in_transaction_ = false;
+  transaction_bytes_ = 0;
+  keys_.EndCommit(true, key_changes_complete_, key_changes_);
+  key_changes_.clear();
+  key_changes_complete_ = true;
+}
+
+void IndexStore::CommitStepIfLarge() {
+  // What a transaction wrote sits in the page cache until the cache is full
+  // and reaches the log at the latest at the commit, so the log's size shows
+  // the transaction too late: the bytes given to SQLite and the full-text
+  // rows still queued are counted instead.
+  if (!in_transaction_ || transaction_bytes_ + static_cast<int64_t>(pending_index_.bytes()) < wal_limits_.step_bytes) {
+    return;
+  }
+  CommitTransaction();
+  // SQLite checkpoints by itself only past 1,000 pages; a step smaller than
+  // that would otherwise let the log grow to 4 MB before it restarts.
+  writer_->CheckpointPassive();
+}
+
 CommitChanges IndexStore::Commit() {
   CommitChanges changes;
-  if (in_transaction_) {
-    keys_.BeginCommit();
-    try {
-      FlushIndexWrites();
-      writer_->Exec("COMMIT");
-    } catch (const std::exception&) {
-      keys_.EndCommit(false, false, key_changes_);
-      NoteLostTransaction();  // a full volume can make SQLite roll the transaction back
-      throw;
-    }
-    in_transaction_ = false;
-    keys_.EndCommit(true, key_changes_complete_, key_changes_);
-    key_changes_.clear();
-    key_changes_complete_ = true;
-  }
+  if (in_transaction_) CommitTransaction();
   changes.upserted.assign(upserted_.begin(), upserted_.end());
   changes.deleted.assign(deleted_.begin(), deleted_.end());
   changes.truncated = truncated_;
