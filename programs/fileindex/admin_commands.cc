@@ -9,7 +9,7 @@
 #include "fileindex/index_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "programs/fileindex/commands.h"
-#include "programs/fileindex/daemon_client.h"
+#include "programs/frontend/status_report.h"
 #include "sdk/share.h"
 
 namespace corvlumex {
@@ -44,31 +44,13 @@ std::string ShareFlags(unsigned int flags) {
 }
 
 void Status(const Output& output) {
-  const fileindex::StatusMgr status;
-  const fileindex::FolderMgr folders;
-  Json::Value daemon;
-  std::string daemon_error;
-  try {
-    daemon = AskDaemon("status", Json::Value(Json::objectValue));
-  } catch (const Error& error) {
-    daemon_error = error.reason;
-  }
-  Json::Value out(Json::objectValue);
-  out["resume_time"] = static_cast<Json::Int64>(status.GetPauseInfo());
-  out["daemon_running"] = daemon_error.empty();
-  if (!daemon_error.empty()) out["daemon_error"] = daemon_error;
-  Json::Value shares(Json::objectValue);
-  for (const std::string& share : folders.GetIndexedShares()) {
-    Json::Value entry = daemon["shares"][share].isObject() ? daemon["shares"][share] : Json::Value(Json::objectValue);
-    entry["flags"] = status.GetShareStatus(share);
-    if (!entry.isMember("state")) entry["state"] = daemon_error.empty() ? "no worker" : "-";
-    shares[share] = entry;
-  }
-  out["shares"] = shares;
+  const Json::Value out = frontend::StatusReport();
+  const Json::Value& shares = out["shares"];
+  const long long resume_time = out["resume_time"].asInt64();
   if (output.json) return PrintJson(out);
 
-  std::cout << "indexing: " << PauseText(status.GetPauseInfo()) << "\n";
-  std::cout << "fileindexd: " << (daemon_error.empty() ? "running" : daemon_error) << "\n";
+  std::cout << "indexing: " << PauseText(resume_time) << "\n";
+  std::cout << "fileindexd: " << (out["daemon_running"].asBool() ? "running" : out["daemon_error"].asString()) << "\n";
   std::vector<std::vector<std::string>> rows;
   for (const std::string& share : shares.getMemberNames()) {
     const Json::Value& entry = shares[share];

@@ -10,6 +10,7 @@
 #include "fileindex/file_type.h"
 #include "platform/platform.h"
 #include "programs/fileindex/commands.h"
+#include "programs/frontend/search_request.h"
 
 namespace corvlumex {
 namespace cli {
@@ -36,39 +37,21 @@ Json::Value MatchClause(const std::string& field, const std::string& text) {
 
 // The request of corvelasticd's "search" command for these arguments.
 Json::Value SearchRequest(const SearchArgs& args) {
-  const std::string field = args.name ? elastic::kFieldSearchFileName : args.content ? "CORVMDTextContent" : "_all";
-  Json::Value qsl = MatchClause(field, args.query);
-  if (!args.type.empty()) {
-    Json::Value extensions(Json::arrayValue);
-    for (const std::string& ext : fileindex::GetExtensionsByCategory(args.type)) extensions.append(ext);
-    Json::Value filtered(Json::objectValue);
-    filtered["bool"]["must"].append(qsl);
-    filtered["bool"]["filter"].append(Json::Value(Json::objectValue));
-    filtered["bool"]["filter"][0]["terms"][elastic::kFieldExtension] = extensions;
-    qsl = filtered;
-  }
-  Json::Value data(Json::objectValue);
-  if (!args.shares.empty()) {
-    for (const std::string& share : args.shares) data["ids"].append(elastic::GetFileIndexID(share));
-  }
-  data["query"]["qsl"] = qsl;
-  data["from"] = args.from;
-  data["size"] = args.size;
-  data["track_total"] = true;
-  for (const char* field_name : {elastic::kFieldPath, "CORVMDIsDir", "CORVMDFSSize", "CORVMDFSContentChangeDate"}) {
-    data["load_field"].append(field_name);
-  }
+  frontend::SearchSpec spec;
+  spec.qsl = MatchClause(args.name ? elastic::kFieldSearchFileName : args.content ? "CORVMDTextContent" : "_all", args.query);
+  spec.shares = args.shares;
+  spec.category = args.type;
+  spec.from = args.from;
+  spec.size = args.size;
   if (!args.name) {
     // Matched words in bold on a terminal, in [brackets] otherwise.
     const bool tty = isatty(STDOUT_FILENO) == 1;
-    data["highlight"]["size"] = 80;
-    data["highlight"]["pre"] = tty ? "\033[1m" : "[";
-    data["highlight"]["post"] = tty ? "\033[0m" : "]";
+    spec.highlight = true;
+    spec.highlight_size = 80;
+    spec.highlight_pre = tty ? "\033[1m" : "[";
+    spec.highlight_post = tty ? "\033[0m" : "]";
   }
-  Json::Value request(Json::objectValue);
-  request["command"] = "search";
-  request["data"] = data;
-  return request;
+  return frontend::SearchRequest(spec);
 }
 
 void PrintHits(const SearchArgs& args, const Json::Value& result) {
@@ -130,7 +113,7 @@ void AddSearchCommands(CLI::App& app, Output& output) {
   suggest_cmd->callback([&output] {
     Json::Value request(Json::objectValue);
     request["command"] = "suggest";
-    for (const std::string& share : suggest.shares) request["data"]["ids"].append(elastic::GetFileIndexID(share));
+    if (!suggest.shares.empty()) request["data"]["ids"] = frontend::IndexIds(suggest.shares);
     request["data"]["field"] = elastic::kFieldSearchFileName;
     request["data"]["text"] = suggest.text;
     request["data"]["size"] = suggest.size;
