@@ -62,6 +62,7 @@ class Parser {
     const std::string field = body.getMemberNames().front();
     const Json::Value& argument = body[field];
     if (kind == "match") return Match(field, argument, negated);
+    if (kind == "match_phrase") return MatchPhrase(field, argument, negated);
     if (kind == "term") return Term(field, argument, negated);
     if (kind == "terms") return Terms(field, argument, negated);
     if (kind == "prefix") return Prefix(field, argument);
@@ -260,6 +261,42 @@ class Parser {
       case FieldKind::kText: return Words(field, text, any, negated);
       default: return NumberIn(field_def, {Number(field_def, argument)});
     }
+  }
+
+  // The words of `text` next to each other and in this order, in one column
+  // (a phrase never spans two fields).
+  QueryNode MatchPhrase(const std::string& field, const Json::Value& argument, bool negated) {
+    std::string text;
+    if (argument.isObject()) {
+      if (!argument["query"].isString()) Bad("\"match_phrase\" on \"" + field + "\" needs a string \"query\"");
+      text = argument["query"].asString();
+    } else {
+      text = ScalarText(field, argument);
+    }
+    if (field != kAllField) {
+      const FieldSpec& field_def = Field(field);
+      if (IsKey(field_def)) return KeyIn({text});
+      switch (field_def.kind) {
+        case FieldKind::kNgram: return Substring(field_def, text);
+        case FieldKind::kKeyword: return KeywordToken(field_def, text);
+        case FieldKind::kText: break;
+        default: Bad("\"match_phrase\" needs a text field, \"" + field + "\" is not one");
+      }
+    }
+    std::vector<std::string> alternatives;
+    for (const auto& group : ColumnsFor(field)) {
+      std::vector<std::string> tokens;
+      Analyze(group.first, text, &tokens);
+      if (!tokens.empty()) alternatives.push_back(ColumnFilter(group.second) + " : " + Phrase(tokens));
+    }
+    QueryNode node;
+    node.type = QueryNode::Type::kNone;  // no word at all: matches nothing, as "match" does
+    if (alternatives.empty()) return node;
+    node.type = QueryNode::Type::kText;
+    for (size_t i = 0; i < alternatives.size(); ++i) node.fts += (i > 0 ? " OR " : "") + alternatives[i];
+    if (alternatives.size() > 1) node.fts = "(" + node.fts + ")";
+    if (!negated) AddHighlight(text);
+    return node;
   }
 
   QueryNode Term(const std::string& field, const Json::Value& argument, bool negated) {

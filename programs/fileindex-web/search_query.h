@@ -1,5 +1,6 @@
-// The words a person typed as corvelasticd's query clause. An empty text
-// searches everything (the filters alone choose).
+// The words a person typed in the search box as corvelasticd's query clause,
+// through the one query syntax of the system (docs/search.md). A syntax
+// error is an ApiError 400 that says where and what.
 #pragma once
 
 #include <json/json.h>

@@ -3,11 +3,13 @@
 #include <unistd.h>
 
 #include <iostream>
+#include <sstream>
 
 #include "common/error.h"
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/elastic/schema.h"
 #include "fileindex/file_type.h"
+#include "fileindex/query/user_query.h"
 #include "platform/platform.h"
 #include "programs/fileindex/commands.h"
 #include "programs/frontend/search_request.h"
@@ -19,7 +21,7 @@ namespace {
 namespace elastic = fileindex::elastic;
 
 struct SearchArgs {
-  std::string query;
+  std::vector<std::string> words;
   bool name = false;
   bool content = false;
   std::vector<std::string> shares;
@@ -28,17 +30,69 @@ struct SearchArgs {
   unsigned size = 20;
 };
 
-Json::Value MatchClause(const std::string& field, const std::string& text) {
-  Json::Value clause(Json::objectValue);
-  clause["match"][field]["query"] = text;
-  clause["match"][field]["operator"] = "and";
+// Points the query's text clauses (those on "_all") at file names only:
+// each word, phrase or prefix becomes a part of the name to find.
+Json::Value NamesOnly(const Json::Value& clause) {
+  if (!clause.isObject() || clause.size() != 1) return clause;
+  const std::string kind = clause.getMemberNames().front();
+  const Json::Value& body = clause[kind];
+  if (kind == "bool") {
+    Json::Value out(Json::objectValue);
+    for (const std::string& list : body.getMemberNames()) {
+      for (const Json::Value& member : body[list]) out["bool"][list].append(NamesOnly(member));
+    }
+    return out;
+  }
+  if ((kind != "match" && kind != "match_phrase" && kind != "prefix") || !body.isMember("_all")) return clause;
+  std::vector<std::string> parts;
+  const std::string text = body["_all"].asString();
+  if (kind == "match") {
+    std::istringstream words(text);
+    for (std::string word; words >> word;) parts.push_back(word);
+  } else {
+    parts.push_back(text);
+  }
+  Json::Value out(Json::objectValue);
+  for (const std::string& part : parts) {
+    Json::Value match(Json::objectValue);
+    match["match"][elastic::kFieldSearchFileName] = part;
+    out["bool"]["must"].append(match);
+  }
+  return out;
+}
+
+// Points the query's text clauses at the content only.
+Json::Value ContentOnly(const Json::Value& clause) {
+  if (clause.isArray() || clause.isObject()) {
+    Json::Value out(clause.type());
+    for (auto member = clause.begin(); member != clause.end(); ++member) {
+      const Json::Value converted = ContentOnly(*member);
+      if (clause.isArray()) {
+        out.append(converted);
+      } else {
+        const std::string key = member.name();
+        out[key == "_all" ? "CORVMDTextContent" : key] = converted;
+      }
+    }
+    return out;
+  }
   return clause;
 }
 
 // The request of corvelasticd's "search" command for these arguments.
 Json::Value SearchRequest(const SearchArgs& args) {
+  // Each argument is a part of the query: `search saffron rice` and
+  // `search 'saffron rice'` mean the same.
+  std::string text;
+  for (const std::string& word : args.words) text += (text.empty() ? "" : " ") + word;
   frontend::SearchSpec spec;
-  spec.qsl = MatchClause(args.name ? elastic::kFieldSearchFileName : args.content ? "CORVMDTextContent" : "_all", args.query);
+  try {
+    spec.qsl = fileindex::UserQueryToSearch(text)["qsl"];
+  } catch (const fileindex::UserQuerySyntaxError& error) {
+    throw Error(kErrorBadArgument, std::string(error.what()) + " (the syntax: docs/search.md)");
+  }
+  if (args.name) spec.qsl = NamesOnly(spec.qsl);
+  if (args.content) spec.qsl = ContentOnly(spec.qsl);
   spec.shares = args.shares;
   spec.category = args.type;
   spec.from = args.from;
@@ -86,12 +140,17 @@ void PrintHits(const SearchArgs& args, const Json::Value& result) {
 void AddSearchCommands(CLI::App& app, Output& output) {
   static SearchArgs search;
   CLI::App* search_cmd = app.add_subcommand("search", "search the index by file name and content");
-  search_cmd->add_option("query", search.query, "the words to look for")->required();
+  search_cmd->add_option("words", search.words,
+                         "what to look for: words, \"a phrase\", prefix*, OR, NOT word, (groups), name:, ext:, "
+                         "type:, in:, size:, modified:, owner: (see docs/search.md); put -- before words "
+                         "that start with -")
+      ->required();
   auto* name = search_cmd->add_flag("--name", search.name, "search file names only");
   search_cmd->add_flag("--content", search.content, "search file content only")->excludes(name);
-  search_cmd->add_option("--share", search.shares, "only in this share (repeatable)");
+  // One value per --share, so the words may follow it: `search --share docs saffron rice`.
+  search_cmd->add_option("--share", search.shares, "only in this share (repeatable)")->allow_extra_args(false);
   search_cmd->add_option("--type", search.type, "only files of this category")
-      ->check(CLI::IsMember({"document", "audio", "video", "image"}));
+      ->check(CLI::IsMember({"document", "audio", "video", "photo"}));
   search_cmd->add_option("--from", search.from, "skip this many results (paging)");
   search_cmd->add_option("--size", search.size, "show at most this many results (1-1000)")->check(CLI::Range(1, 1000));
   search_cmd->callback([&output] {
@@ -108,7 +167,7 @@ void AddSearchCommands(CLI::App& app, Output& output) {
   } suggest;
   CLI::App* suggest_cmd = app.add_subcommand("suggest", "file-name words that begin with TEXT");
   suggest_cmd->add_option("text", suggest.text, "the beginning of a word")->required();
-  suggest_cmd->add_option("--share", suggest.shares, "only in this share (repeatable)");
+  suggest_cmd->add_option("--share", suggest.shares, "only in this share (repeatable)")->allow_extra_args(false);
   suggest_cmd->add_option("--size", suggest.size, "at most this many (1-100)")->check(CLI::Range(1, 100));
   suggest_cmd->callback([&output] {
     Json::Value request(Json::objectValue);

@@ -129,6 +129,15 @@ TEST_F(DaemonInputTest, TheSearchLanguage) {
       {R"({"match": {"CORVMDTextContent": "ac-3"}})", "{}", {code}},
       {R"({"match": {"_all": "東京"}})", "{}", {song}},
       {R"({"match": {"_all": "cafe"}})", "{}", {photo}},
+      // Phrases: the words next to each other, in this order, within one field.
+      {R"({"match_phrase": {"_all": "GREW in the"}})", "{}", {report}},
+      {R"({"match_phrase": {"_all": "in grew"}})", "{}", {}},
+      {R"({"match_phrase": {"_all": "revenue grew north"}})", "{}", {}},
+      {R"({"match_phrase": {"CORVMDTextContent": {"query": "quarterly revenue"}}})", "{}", {summary}},
+      {R"({"match_phrase": {"_all": "東京の"}})", "{}", {song}},
+      {R"({"match_phrase": {"_all": "..."}})", "{}", {}},
+      {R"({"prefix": {"_all": "quarter"}})", R"({"sort": "CORVMDFSName"})", {report, summary}},
+      {R"({"prefix": {"_all": "revenue gr"}})", "{}", {report}},
       // Name substrings match inside names whatever the normalisation.
       {R"({"match": {"CORVMDSearchFileName": "RTERLY rep"}})", "{}", {report}},
       {R"({"match": {"CORVMDSearchFileName": "café"}})", "{}", {photo}},
