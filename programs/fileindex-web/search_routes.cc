@@ -65,11 +65,12 @@ Json::Value HitOut(const Json::Value& hit) {
   const std::string full_path = fields[elastic::kFieldPath].asString();
   Json::Value out(Json::objectValue);
   out["path"] = full_path;
-  std::string share, share_path;
+  // Shown as /share/folder/name: the form people see on their network drives.
+  std::string share, share_dir, share_path = full_path;
   try {
-    fileindex::GetShareNamePathByFullPath(share, share_path, full_path);
+    fileindex::GetShareNamePathByFullPath(share, share_dir, full_path);
+    share_path = "/" + share + full_path.substr(share_dir.size());
   } catch (const Error&) {
-    share_path = full_path;
   }
   const size_t slash = share_path.rfind('/');
   out["name"] = share_path.substr(slash + 1);
