@@ -45,7 +45,8 @@ void AddAuthRoutes(httplib::Server& server, WebContext& context) {
     std::string why;
     const std::optional<Account> account = FindAccount(user);
     if (!account || !PamSignIn(context.options.pam_service, user, password, &why)) {
-      context.throttle.Failed(user, request.remote_addr, now);
+      // Counted from the answer, not the question: PAM itself delays a failure.
+      context.throttle.Failed(user, request.remote_addr, SignInThrottle::Clock::now());
       CORV_LOG("web sign-in of \"%s\" from %s refused: %s", user.c_str(), request.remote_addr.c_str(),
                account ? why.c_str() : "no such user");
       throw ApiError(401, "wrong user name or password", "check both and sign in again");

@@ -2,10 +2,12 @@
 // user of the server (search, as themselves) and its administrators
 // (indexed folders, pause, status). See docs/web.md.
 #include <CLI/CLI.hpp>
+#include <pthread.h>
 #include <signal.h>
 #include <unistd.h>
 
 #include <cstdlib>
+#include <thread>
 #include <iostream>
 
 #include "common/sys.h"
@@ -52,6 +54,14 @@ int main(int argc, char** argv) {
     return 2;
   }
 
+  // A sandbox's daemon writes a fresh one-time link on SIGHUP (`scripts/run
+  // link`): the signal waits for one thread, so every other thread, the
+  // server's pool included, is started with it blocked.
+  sigset_t hangup;
+  sigemptyset(&hangup);
+  sigaddset(&hangup, SIGHUP);
+  pthread_sigmask(SIG_BLOCK, &hangup, nullptr);
+
   corvlumex::web::WebContext context(options);
   std::unique_ptr<httplib::Server> server;
   try {
@@ -69,6 +79,13 @@ int main(int argc, char** argv) {
   running_server = server.get();
   corvlumex::fileindex::OnStopSignals(StopServer);
   corvlumex::web::WriteSignInLink(context);
+  if (!options.sign_in_link_file.empty()) {
+    std::thread([&context, hangup] {
+      for (int signal = 0;;) {
+        if (sigwait(&hangup, &signal) == 0) corvlumex::web::WriteSignInLink(context);
+      }
+    }).detach();
+  }
   std::cerr << "fileindex-web: listening on " << (options.https() ? "https://" : "http://") << options.address << ":"
             << options.port << "\n";
   const bool clean = server->listen_after_bind();

@@ -4,6 +4,7 @@
 #include <cstdlib>
 #include <memory>
 #include <set>
+#include <stdexcept>
 
 #include "programs/fileindex-web/api_error.h"
 
@@ -38,7 +39,13 @@ Json::Value ParseBody(const std::string& text, std::initializer_list<const char*
   Json::Value body;
   std::string errors;
   const std::string input = text.empty() ? "{}" : text;
-  if (!reader->parse(input.data(), input.data() + input.size(), &body, &errors)) {
+  bool parsed = false;
+  try {
+    parsed = reader->parse(input.data(), input.data() + input.size(), &body, &errors);
+  } catch (const std::exception& error) {
+    errors = error.what();  // nesting deeper than the stack limit throws
+  }
+  if (!parsed) {
     throw ApiError(400, "the request body is not valid JSON: " + errors.substr(0, 200), "send a JSON object");
   }
   if (!body.isObject()) throw ApiError(400, "the request body must be a JSON object", "send a JSON object {...}");

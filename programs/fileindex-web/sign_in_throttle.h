@@ -17,7 +17,7 @@ class SignInThrottle {
  public:
   using Clock = std::chrono::steady_clock;
   static constexpr int kFreeFailures = 3;
-  static constexpr std::chrono::seconds kFirstWait{2};
+  static constexpr std::chrono::seconds kFirstWait{4};
   static constexpr std::chrono::seconds kLongestWait{300};
 
   // Seconds to wait before `user` may try again from `address` (0: now).
