@@ -5,7 +5,11 @@
 // for SECONDS; prints the latency percentiles as the clients saw them
 // (loopback HTTP included, so an upper bound of the server's time).
 //
-//   web_bench --build BUILD [--docs 100000] [--users 20] [--seconds 20]
+//   web_bench --build BUILD [--docs 100000] [--users 20] [--seconds 20] [--think-ms 0]
+//
+// Each user waits --think-ms between searches (0: searches back to back, the
+// saturation case). Server time is the daemon's own Server-Timing figure:
+// from the request's arrival in a server thread to its answer being ready.
 //
 // As root the searches are made by a user the bench creates (and removes),
 // signed in through PAM, so every hit passes the per-user access check; as
@@ -42,6 +46,7 @@ struct Options {
   long docs = 100000;
   int users = 20;
   int seconds = 20;
+  int think_ms = 0;
 };
 
 std::vector<std::string> Vocabulary() {
@@ -144,6 +149,7 @@ int main(int argc, char** argv) {
     else if (flag == "--docs") options.docs = std::atol(argv[i + 1]);
     else if (flag == "--users") options.users = std::atoi(argv[i + 1]);
     else if (flag == "--seconds") options.seconds = std::atoi(argv[i + 1]);
+    else if (flag == "--think-ms") options.think_ms = std::atoi(argv[i + 1]);
   }
   if (options.build.empty()) {
     std::cerr << "usage: web_bench --build BUILD [--docs N] [--users N] [--seconds N]\n";
@@ -202,6 +208,7 @@ int main(int argc, char** argv) {
 
     const std::vector<std::string> words = Vocabulary();
     std::vector<std::vector<double>> latencies(static_cast<size_t>(options.users));
+    std::vector<std::vector<double>> server_times(static_cast<size_t>(options.users));
     std::atomic<long> failures{0}, hits{0};
     const auto stop_at = Clock::now() + std::chrono::seconds(options.seconds);
     std::vector<std::thread> clients;
@@ -217,6 +224,12 @@ int main(int argc, char** argv) {
           const auto start = Clock::now();
           const auto result = client.Get(path.c_str(), headers);
           latencies[static_cast<size_t>(u)].push_back(std::chrono::duration<double, std::milli>(Clock::now() - start).count());
+          if (result) {
+            const std::string timing = result->get_header_value("Server-Timing");
+            const size_t at = timing.find("dur=");
+            if (at != std::string::npos) server_times[static_cast<size_t>(u)].push_back(std::atof(timing.c_str() + at + 4));
+          }
+          if (options.think_ms > 0) std::this_thread::sleep_for(std::chrono::milliseconds(options.think_ms));
           if (!result || result->status != 200) {
             ++failures;
           } else if (result->body.find("\"hits\":[]") == std::string::npos) {
@@ -228,10 +241,14 @@ int main(int argc, char** argv) {
     for (std::thread& client : clients) client.join();
     std::vector<double> all;
     for (const auto& list : latencies) all.insert(all.end(), list.begin(), list.end());
-    std::cout << "searches: " << all.size() << " by " << options.users << " users in " << options.seconds << " s ("
+    std::cout << "searches: " << all.size() << " by " << options.users << " users (think time " << options.think_ms << " ms) in " << options.seconds << " s ("
               << static_cast<double>(all.size()) / options.seconds << "/s), " << failures << " failed, " << hits
               << " with hits\n";
-    std::cout << "latency ms: p50 " << Percentile(all, 0.50) << "  p90 " << Percentile(all, 0.90) << "  p99 "
+    std::vector<double> server;
+    for (const auto& list : server_times) server.insert(server.end(), list.begin(), list.end());
+    std::cout << "server time ms: p50 " << Percentile(server, 0.50) << "  p90 " << Percentile(server, 0.90) << "  p99 "
+              << Percentile(server, 0.99) << "  max " << Percentile(server, 1.0) << "\n";
+    std::cout << "client latency ms: p50 " << Percentile(all, 0.50) << "  p90 " << Percentile(all, 0.90) << "  p99 "
               << Percentile(all, 0.99) << "  max " << Percentile(all, 1.0) << "\n";
     std::cout << "search page first load: " << FirstLoadBytes(port) << " bytes (HTML, CSS, scripts; no images or fonts)\n";
     status = failures == 0 ? 0 : 1;

@@ -2,6 +2,7 @@
 
 #include <openssl/crypto.h>
 
+#include <chrono>
 #include <cstring>
 
 #include "common/error.h"
@@ -14,6 +15,12 @@
 namespace corvlumex {
 namespace web {
 namespace {
+
+// When the request in this server thread began (the pre-routing handler and
+// the post-routing handler of one request run on the same thread): sent back
+// as Server-Timing so the time spent in the server can be told from the
+// network's.
+thread_local std::chrono::steady_clock::time_point request_start;
 
 bool StartsWith(const std::string& text, const char* prefix) { return text.compare(0, strlen(prefix), prefix) == 0; }
 
@@ -113,7 +120,10 @@ std::unique_ptr<httplib::Server> MakeServer(WebContext& context) {
   if (!server->set_mount_point("/", context.options.web_root)) {
     throw std::runtime_error("the web folder " + context.options.web_root + " cannot be read (--web-root)");
   }
-  server->set_pre_routing_handler([&context](const httplib::Request& q, httplib::Response& r) { return Gate(q, r, context); });
+  server->set_pre_routing_handler([&context](const httplib::Request& q, httplib::Response& r) {
+    request_start = std::chrono::steady_clock::now();
+    return Gate(q, r, context);
+  });
   server->set_exception_handler(ReplyException);
   server->set_error_handler(httplib::Server::HandlerWithResponse([](const httplib::Request& request, httplib::Response& response) {
     if (!response.body.empty()) return httplib::Server::HandlerResponse::Unhandled;
@@ -133,6 +143,8 @@ std::unique_ptr<httplib::Server> MakeServer(WebContext& context) {
                         "default-src 'self'; img-src 'self' data:; object-src 'none'; base-uri 'none'; "
                         "form-action 'self'; frame-ancestors 'none'");
     if (StartsWith(request.path, "/api/")) response.set_header("Cache-Control", "no-store");
+    const double ms = std::chrono::duration<double, std::milli>(std::chrono::steady_clock::now() - request_start).count();
+    response.set_header("Server-Timing", "app;dur=" + std::to_string(ms));
   });
   AddAuthRoutes(*server, context);
   AddSearchRoutes(*server, context);
