@@ -15,6 +15,7 @@
 #include "common/error.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/util.h"
+#include "platform/linux/extract/worker_protocol.h"
 #include "programs/fileindex-web/api_error.h"
 #include "programs/fileindex-web/path_checks.h"
 #include "sdk/share.h"
@@ -34,32 +35,17 @@ std::string RealPath(const std::string& path) {
   return buffer;
 }
 
-// Runs in the child: becomes the user, opens, sends the descriptor. Only
-// system calls, as after fork() in a threaded process.
+// Runs in the child: becomes the user, opens, sends the descriptor (or
+// exits with the open's errno). Only system calls, as after fork() in a
+// threaded process.
 [[noreturn]] void OpenAsUserChild(int channel, const std::string& path, const Account& account) {
   if (setgroups(account.groups.size(), account.groups.data()) != 0 ||
       setresgid(account.gid, account.gid, account.gid) != 0 || setresuid(account.uid, account.uid, account.uid) != 0) {
-    _exit(2);
+    _exit(EPERM);
   }
   const int fd = open(path.c_str(), O_RDONLY | O_NOCTTY | O_NONBLOCK);
-  int error = fd < 0 ? errno : 0;
-  char control[CMSG_SPACE(sizeof(int))];
-  memset(control, 0, sizeof(control));
-  struct iovec data = {&error, sizeof(error)};
-  struct msghdr message;
-  memset(&message, 0, sizeof(message));
-  message.msg_iov = &data;
-  message.msg_iovlen = 1;
-  if (fd >= 0) {
-    message.msg_control = control;
-    message.msg_controllen = sizeof(control);
-    struct cmsghdr* header = CMSG_FIRSTHDR(&message);
-    header->cmsg_level = SOL_SOCKET;
-    header->cmsg_type = SCM_RIGHTS;
-    header->cmsg_len = CMSG_LEN(sizeof(int));
-    memcpy(CMSG_DATA(header), &fd, sizeof(int));
-  }
-  _exit(sendmsg(channel, &message, MSG_NOSIGNAL) < 0 ? 3 : 0);
+  if (fd < 0) _exit(errno);
+  _exit(platform::extract::SendDescriptor(channel, fd) ? 0 : EIO);
 }
 
 // The descriptor the child opened, or -1 with `error` set to its errno.
@@ -87,26 +73,13 @@ int OpenAsUser(const std::string& path, const Account& account, int* error) {
     close(channel[0]);
     throw Error(kErrorSystem, "fork failed");
   }
-  int child_error = EACCES;
-  char control[CMSG_SPACE(sizeof(int))];
-  struct iovec data = {&child_error, sizeof(child_error)};
-  struct msghdr message;
-  memset(&message, 0, sizeof(message));
-  message.msg_iov = &data;
-  message.msg_iovlen = 1;
-  message.msg_control = control;
-  message.msg_controllen = sizeof(control);
-  int fd = -1;
-  if (recvmsg(channel[0], &message, MSG_CMSG_CLOEXEC) == static_cast<ssize_t>(sizeof(child_error))) {
-    for (struct cmsghdr* header = CMSG_FIRSTHDR(&message); header != nullptr; header = CMSG_NXTHDR(&message, header)) {
-      if (header->cmsg_level == SOL_SOCKET && header->cmsg_type == SCM_RIGHTS) memcpy(&fd, CMSG_DATA(header), sizeof(int));
-    }
-  }
+  const int fd = platform::extract::ReceiveDescriptor(channel[0]);
   close(channel[0]);
-  while (waitpid(child, nullptr, 0) < 0 && errno == EINTR) {
+  int status = 0;
+  while (waitpid(child, &status, 0) < 0 && errno == EINTR) {
   }
   errno = 0;
-  *error = fd >= 0 ? 0 : child_error;
+  *error = fd >= 0 ? 0 : (WIFEXITED(status) && WEXITSTATUS(status) != 0 ? WEXITSTATUS(status) : EACCES);
   return fd;
 }
 

@@ -35,6 +35,23 @@ class DaemonInputTest : public DaemonTest {
 
   // The daemon still answers after whatever the test did.
   void ExpectAlive() { EXPECT_TRUE(Run("index_list")["success"].asBool()); }
+
+  // The folder "share" in the root, open to every user, for files of several owners.
+  std::string OpenShare() {
+    chmod(root_.path().c_str(), 0755);
+    const std::string share = root_.MakeDir("share");
+    chmod(share.c_str(), 0755);
+    return share;
+  }
+  // A file with `mode` on disk and its document holding `text`.
+  void AddFile(const std::string& path, mode_t mode, const std::string& text) {
+    std::ofstream(path) << "x";
+    chmod(path.c_str(), mode);
+    Json::Value data;
+    data["doc_id"] = path;
+    data["data"] = FileDocument(path, text, 1);
+    ASSERT_TRUE(Run("document_upsert_by_id", data)["success"].asBool());
+  }
 };
 
 TEST_F(DaemonInputTest, BadRequestsAreAnsweredWithTheirCode) {
@@ -202,18 +219,9 @@ TEST_F(DaemonInputTest, OrdinaryUsersSeeOnlyFilesTheyCanReadAndCannotChangeIndex
   const struct passwd* nobody = getpwnam("nobody");
   ASSERT_NE(nobody, nullptr);
   const struct passwd user = *nobody;
-  chmod(root_.path().c_str(), 0755);
-  const std::string share = root_.MakeDir("share");
-  chmod(share.c_str(), 0755);
+  const std::string share = OpenShare();
   std::vector<std::string> readable;
-  const auto add = [&](const std::string& path, mode_t mode) {
-    std::ofstream(path) << "x";
-    chmod(path.c_str(), mode);
-    Json::Value data;
-    data["doc_id"] = path;
-    data["data"] = FileDocument(path, "common word", 1);
-    ASSERT_TRUE(Run("document_upsert_by_id", data)["success"].asBool());
-  };
+  const auto add = [&](const std::string& path, mode_t mode) { AddFile(path, mode, "common word"); };
   // Many unreadable hits first in key order, so paging has to look past them.
   for (int i = 0; i < 150; ++i) add(share + "/a-secret-" + std::to_string(1000 + i) + ".txt", 0600);
   for (int i = 0; i < 3; ++i) {
@@ -250,17 +258,8 @@ TEST_F(DaemonInputTest, SearchOnBehalfOfAUserSeesOnlyThatUsersFiles) {
   const struct passwd* nobody = getpwnam("nobody");
   ASSERT_NE(nobody, nullptr);
   const struct passwd user = *nobody;
-  chmod(root_.path().c_str(), 0755);
-  const std::string share = root_.MakeDir("share");
-  chmod(share.c_str(), 0755);
-  const auto add = [&](const std::string& path, mode_t mode) {
-    std::ofstream(path) << "x";
-    chmod(path.c_str(), mode);
-    Json::Value data;
-    data["doc_id"] = path;
-    data["data"] = FileDocument(path, "shared word", 1);
-    ASSERT_TRUE(Run("document_upsert_by_id", data)["success"].asBool());
-  };
+  const std::string share = OpenShare();
+  const auto add = [&](const std::string& path, mode_t mode) { AddFile(path, mode, "shared word"); };
   for (int i = 0; i < 5; ++i) add(share + "/a-private-" + std::to_string(i) + ".txt", 0600);
   add(share + "/b-open.txt", 0644);
   Commit();
