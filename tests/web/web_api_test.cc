@@ -242,6 +242,34 @@ TEST_F(WebApiTest, AnAdministratorCanDoWhatTheCommandLineDoes) {
   EXPECT_FALSE(reply.json["error"]["reason"].asString().empty());
 }
 
+// With a certificate and key the daemon speaks HTTPS only, and its session
+// cookie is marked Secure.
+class WebHttpsTest : public WebApiTest {
+ protected:
+  std::vector<std::string> WebArgs() override {
+    const std::string dir = testing::TempDir() + "/web-tls-" + std::to_string(getpid());
+    fs::create_directories(dir);
+    const std::string make = "openssl req -x509 -newkey rsa:2048 -nodes -subj /CN=127.0.0.1 -days 1 -keyout " + dir +
+                             "/key.pem -out " + dir + "/cert.pem 2>/dev/null";
+    EXPECT_EQ(std::system(make.c_str()), 0);
+    return {"--certificate", dir + "/cert.pem", "--key", dir + "/key.pem"};
+  }
+};
+
+TEST_F(WebHttpsTest, ServesHttpsWithSecureCookies) {
+  const std::string link = sandbox_->SignInLink();
+  ASSERT_EQ(link.compare(0, 8, "https://"), 0) << link;
+  WebClient plain(sandbox_->port());
+  EXPECT_EQ(plain.Get("/api/session").status, 0);  // no answer to plain HTTP
+  WebClient secure(sandbox_->port(), true);
+  const size_t path = link.find("/sign-in");
+  const Reply reply = secure.Get(link.substr(path));
+  EXPECT_EQ(reply.status, 303);
+  EXPECT_NE(reply.header("Set-Cookie").find("; Secure"), std::string::npos) << reply.header("Set-Cookie");
+  EXPECT_NE(reply.header("Set-Cookie").find("HttpOnly; SameSite=Strict"), std::string::npos);
+  EXPECT_EQ(secure.Get("/api/session").status, 200);
+}
+
 // Real accounts: alice administers (a member of the test's admin group),
 // bob does not; each signs in with a password through PAM.
 class WebUsersTest : public WebApiTest {

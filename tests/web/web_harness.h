@@ -42,7 +42,7 @@ struct Reply {
 
 class WebClient {
  public:
-  explicit WebClient(int port) : port_(port) {}
+  explicit WebClient(int port, bool https = false) : port_(port), https_(https) {}
   Reply Get(const std::string& path_and_query);
   // POST of `body` as JSON with the session's CSRF token.
   Reply Post(const std::string& path, const std::string& body);
@@ -56,7 +56,9 @@ class WebClient {
 
  private:
   Reply Finish(const httplib::Result& result);
+  httplib::Client Connect() const;
   int port_;
+  bool https_;
 };
 
 // "a b" -> "a%20b": a query parameter value.
