@@ -23,6 +23,7 @@ import unittest
 try:
     from selenium import webdriver
     from selenium.webdriver.chrome.service import Service
+    from selenium.common.exceptions import NoSuchElementException, StaleElementReferenceException
     from selenium.webdriver.common.by import By
     from selenium.webdriver.common.keys import Keys
     from selenium.webdriver.support.ui import WebDriverWait
@@ -108,7 +109,11 @@ class WebPagesTest(unittest.TestCase):
         shutil.rmtree(cls.work, ignore_errors=True)
 
     def wait(self, condition, what):
-        return WebDriverWait(self.browser, TIMEOUT, poll_frequency=0.2).until(lambda b: condition(), message=what)
+        # The administration page redraws its tables every 2 s: an element
+        # found just before a redraw is stale, and simply looked up again.
+        return WebDriverWait(self.browser, TIMEOUT, poll_frequency=0.2,
+                             ignored_exceptions=[NoSuchElementException, StaleElementReferenceException]).until(
+                                 lambda b: condition(), message=what)
 
     def find(self, css):
         return self.browser.find_element(By.CSS_SELECTOR, css)
@@ -149,6 +154,12 @@ class WebPagesTest(unittest.TestCase):
         self.wait(lambda: self.text("#page-info") == "41–45 of 45", "the last page")
         self.assertTrue(self.find("#next").get_attribute("disabled"))
         self.shot("2-search-page-3")
+        # On a phone-sized screen nothing needs scrolling sideways.
+        self.browser.set_window_size(390, 844)
+        self.wait(lambda: self.browser.execute_script(
+            "return document.documentElement.scrollWidth <= document.documentElement.clientWidth"), "fits a phone")
+        self.shot("2-search-phone")
+        self.browser.set_window_size(1100, 900)
 
     def test_3_download(self):
         box = self.find("#q")
@@ -180,6 +191,11 @@ class WebPagesTest(unittest.TestCase):
         row = "//tbody[@id='folders']/tr[contains(., '/extra/letters')]"
         self.wait(lambda: "finished" in self.browser.find_element(By.XPATH, row).text, "the new folder finishes")
         self.shot("4-folder-finished")
+        self.browser.set_window_size(390, 844)
+        self.wait(lambda: self.browser.execute_script(
+            "return document.documentElement.scrollWidth <= document.documentElement.clientWidth"), "fits a phone")
+        self.shot("4-admin-phone")
+        self.browser.set_window_size(1100, 900)
 
     def test_5_pause_and_resume(self):
         hours = self.find("#pause-hours")
