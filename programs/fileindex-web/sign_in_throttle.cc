@@ -26,8 +26,17 @@ long long SignInThrottle::WaitSeconds(const std::string& user, const std::string
   return wait;
 }
 
+// Names and addresses that no longer have to wait are forgotten once the
+// tables grow, so guessing many names cannot fill the daemon's memory.
+void SignInThrottle::Prune(std::map<std::string, Record>& records, Clock::time_point now) {
+  if (records.size() < kPruneAbove) return;
+  for (auto it = records.begin(); it != records.end();) it = it->second.next_allowed <= now ? records.erase(it) : std::next(it);
+}
+
 void SignInThrottle::Failed(const std::string& user, const std::string& address, Clock::time_point now) {
   std::lock_guard<std::mutex> lock(mutex_);
+  Prune(by_user_, now);
+  Prune(by_address_, now);
   Count(by_user_[user], now, kFreeFailures);
   // An address is allowed more failures: several people may sit behind one.
   Count(by_address_[address], now, kFreeFailures * 3);

@@ -30,7 +30,9 @@ class SignInThrottle {
     int failures = 0;
     Clock::time_point next_allowed{};
   };
+  static constexpr size_t kPruneAbove = 10000;
   static void Count(Record& record, Clock::time_point now, int free_failures);
+  static void Prune(std::map<std::string, Record>& records, Clock::time_point now);
   static long long Left(const Record& record, Clock::time_point now);
 
   mutable std::mutex mutex_;
