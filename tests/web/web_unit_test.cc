@@ -75,7 +75,7 @@ TEST(SignInThrottleTest, FailuresMakeTheNextAttemptWaitLongerEachTime) {
 
 TEST(RequestBodyTest, RefusesWhatACallDoesNotTake) {
   const struct {
-    const char* body;
+    std::string body;
     const char* reason_part;  // nullptr: accepted
   } cases[] = {
       {R"({"path": "/share/a", "document": true})", nullptr},
@@ -85,7 +85,7 @@ TEST(RequestBodyTest, RefusesWhatACallDoesNotTake) {
       {R"(["/share/a"])", "must be a JSON object"},
       {R"({"path": "/share/a", "colour": "red"})", "unknown field \"colour\""},
       {R"({"path": "/share/a", "path": "/share/b"})", "not valid JSON"},
-      {std::string(200, '[').c_str(), "not valid JSON"},
+      {std::string(200, '['), "not valid JSON"},
   };
   for (const auto& c : cases) {
     try {
