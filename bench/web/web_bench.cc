@@ -219,6 +219,9 @@ int main(int argc, char** argv) {
         client.set_keep_alive(true);
         client.set_tcp_nodelay(true);
         const httplib::Headers headers = {{"Cookie", cookies[static_cast<size_t>(u)]}};
+        // People do not all press Enter in the same millisecond: with a think
+        // time, the users' first searches are spread over it.
+        if (options.think_ms > 0) std::this_thread::sleep_for(std::chrono::milliseconds(options.think_ms * u / options.users));
         while (Clock::now() < stop_at) {
           const std::string path = "/api/search?size=20&q=" + words[random() % words.size()];
           const auto start = Clock::now();
