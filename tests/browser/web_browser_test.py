@@ -126,6 +126,14 @@ class WebPagesTest(unittest.TestCase):
         os.makedirs(ARGS.screenshots, exist_ok=True)
         self.browser.save_screenshot(os.path.join(ARGS.screenshots, name + ".png"))
 
+    def fits_phone(self, name):
+        """On a phone-sized screen nothing needs scrolling sideways."""
+        self.browser.set_window_size(390, 844)
+        self.wait(lambda: self.browser.execute_script(
+            "return document.documentElement.scrollWidth <= document.documentElement.clientWidth"), "fits a phone")
+        self.shot(name)
+        self.browser.set_window_size(1100, 900)
+
     def test_1_sign_in(self):
         # A wrong password is refused on the form, with a message.
         self.browser.get(self.base + "/")
@@ -154,12 +162,7 @@ class WebPagesTest(unittest.TestCase):
         self.wait(lambda: self.text("#page-info") == "41–45 of 45", "the last page")
         self.assertTrue(self.find("#next").get_attribute("disabled"))
         self.shot("2-search-page-3")
-        # On a phone-sized screen nothing needs scrolling sideways.
-        self.browser.set_window_size(390, 844)
-        self.wait(lambda: self.browser.execute_script(
-            "return document.documentElement.scrollWidth <= document.documentElement.clientWidth"), "fits a phone")
-        self.shot("2-search-phone")
-        self.browser.set_window_size(1100, 900)
+        self.fits_phone("2-search-phone")
 
     def test_3_download(self):
         box = self.find("#q")
@@ -191,11 +194,7 @@ class WebPagesTest(unittest.TestCase):
         row = "//tbody[@id='folders']/tr[contains(., '/extra/letters')]"
         self.wait(lambda: "finished" in self.browser.find_element(By.XPATH, row).text, "the new folder finishes")
         self.shot("4-folder-finished")
-        self.browser.set_window_size(390, 844)
-        self.wait(lambda: self.browser.execute_script(
-            "return document.documentElement.scrollWidth <= document.documentElement.clientWidth"), "fits a phone")
-        self.shot("4-admin-phone")
-        self.browser.set_window_size(1100, 900)
+        self.fits_phone("4-admin-phone")
 
     def test_5_pause_and_resume(self):
         hours = self.find("#pause-hours")
