@@ -7,11 +7,9 @@
 #include "fileindex/constants.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr.h"
-#include "fileindex/queue_mgr.h"
 #include "fileindex/status_mgr.h"
-#include "platform/linux/notifier_presence.h"
 #include "programs/fileindex/commands.h"
-#include "programs/fileindex/daemon_client.h"
+#include "programs/frontend/status_report.h"
 #include "sdk/share.h"
 
 namespace corvlumex {
@@ -45,57 +43,16 @@ std::string ShareFlags(unsigned int flags) {
   return text.empty() ? "-" : text;
 }
 
-const char* NotifierText(platform::NotifierState state) {
-  switch (state) {
-    case platform::NotifierState::kRunning: return "running";
-    case platform::NotifierState::kNotRunning: return "not running";
-    case platform::NotifierState::kUnknown: break;
-  }
-  return "unknown";
-}
-
-// Whether the share's queue holds a crash marker: its events were lost (the
-// notifier was not running, or could not keep up), so the whole share is
-// checked against the disk. Null when the queue cannot be read.
-Json::Value EventsMissed(const std::string& share) {
-  try {
-    return fileindex::QueueMgr(sdk::SDKShare(share).GetQueuePath()).HasLostEvents();
-  } catch (const Error&) {
-    return Json::Value();
-  }
-}
-
 void Status(const Output& output) {
-  const fileindex::StatusMgr status;
-  const fileindex::FolderMgr folders;
-  Json::Value daemon;
-  std::string daemon_error;
-  try {
-    daemon = AskDaemon("status", Json::Value(Json::objectValue));
-  } catch (const Error& error) {
-    daemon_error = error.reason;
-  }
-  Json::Value out(Json::objectValue);
-  out["resume_time"] = static_cast<Json::Int64>(status.GetPauseInfo());
-  out["daemon_running"] = daemon_error.empty();
-  if (!daemon_error.empty()) out["daemon_error"] = daemon_error;
-  const platform::NotifierState notifier = platform::ProbeNotifier(platform::NotifierConfigDir());
-  out["notifier"] = NotifierText(notifier);
-  Json::Value shares(Json::objectValue);
-  for (const std::string& share : folders.GetIndexedShares()) {
-    Json::Value entry = daemon["shares"][share].isObject() ? daemon["shares"][share] : Json::Value(Json::objectValue);
-    entry["flags"] = status.GetShareStatus(share);
-    if (!entry.isMember("state")) entry["state"] = daemon_error.empty() ? "no worker" : "-";
-    entry["events_missed"] = EventsMissed(share);
-    shares[share] = entry;
-  }
-  out["shares"] = shares;
+  const Json::Value out = frontend::StatusReport();
+  const Json::Value& shares = out["shares"];
+  const long long resume_time = out["resume_time"].asInt64();
   if (output.json) return PrintJson(out);
 
-  std::cout << "indexing: " << PauseText(status.GetPauseInfo()) << "\n";
-  std::cout << "fileindexd: " << (daemon_error.empty() ? "running" : daemon_error) << "\n";
-  std::cout << "corvnotifyd: " << NotifierText(notifier);
-  if (notifier == platform::NotifierState::kNotRunning) {
+  std::cout << "indexing: " << PauseText(resume_time) << "\n";
+  std::cout << "fileindexd: " << (out["daemon_running"].asBool() ? "running" : out["daemon_error"].asString()) << "\n";
+  std::cout << "corvnotifyd: " << out["notifier"].asString();
+  if (out["notifier"].asString() == "not running") {
     std::cout << ": changes on disk are not seen now; when it starts again, every indexed share is checked "
                  "against the disk";
   }

@@ -1,12 +1,14 @@
 #include <json/json.h>
 
 #include <iostream>
+#include <optional>
 
 #include "common/error.h"
 #include "common/file_util.h"
 #include "fileindex/index_mgr.h"
 #include "programs/fileindex/commands.h"
 #include "programs/fileindex/folder_support.h"
+#include "programs/frontend/folder_request.h"
 
 namespace corvlumex {
 namespace cli {
@@ -21,9 +23,19 @@ struct FolderArgs {
   double timeout = 0;
 };
 
-bool OnOff(const std::string& value, bool fallback) {
-  if (value.empty()) return fallback;
+std::optional<bool> OnOff(const std::string& value) {
+  if (value.empty()) return std::nullopt;
   return value == "on" || value == "yes" || value == "true" || value == "1";
+}
+
+frontend::FolderChoice Choice(const FolderArgs& args) {
+  frontend::FolderChoice choice;
+  choice.name = args.name;
+  choice.document = OnOff(args.document);
+  choice.audio = OnOff(args.audio);
+  choice.video = OnOff(args.video);
+  choice.photo = OnOff(args.photo);
+  return choice;
 }
 
 void AddCategoryOptions(CLI::App* command, FolderArgs& args) {
@@ -102,15 +114,8 @@ void AddFolderCommands(CLI::App& app, Output& output) {
   add_cmd->add_option("--timeout", add.timeout, "with --wait: give up after this many seconds (0: never)");
   add_cmd->callback([&output] {
     const std::string path = ToSharePath(add.path);
-    Json::Value folder(Json::objectValue);
-    folder["path"] = path;
-    folder["name"] = add.name.empty() ? Basename(path) : add.name;
-    folder["document"] = OnOff(add.document, true);
-    folder["audio"] = OnOff(add.audio, true);
-    folder["video"] = OnOff(add.video, true);
-    folder["photo"] = OnOff(add.photo, true);
     Json::Value list(Json::arrayValue);
-    list.append(folder);
+    list.append(frontend::NewFolderRecord(path, Choice(add)));
     fileindex::FolderAdd(list, false);
     if (!output.json) std::cout << "added " << path << "\n";
     const bool done = !add.wait || WaitForIndexing({path}, add.timeout, output.json);
@@ -135,13 +140,8 @@ void AddFolderCommands(CLI::App& app, Output& output) {
     const std::string path = ToSharePath(set.path);
     Json::Value current;
     fileindex::FolderGet(current, path);
-    current["name"] = set.name.empty() ? current["name"].asString() : set.name;
-    current["document"] = OnOff(set.document, current["document"].asBool());
-    current["audio"] = OnOff(set.audio, current["audio"].asBool());
-    current["video"] = OnOff(set.video, current["video"].asBool());
-    current["photo"] = OnOff(set.photo, current["photo"].asBool());
     Json::Value list(Json::arrayValue);
-    list.append(current);
+    list.append(frontend::ChangedFolderRecord(current, Choice(set)));
     fileindex::FolderSet(list, false);
     if (!output.json) std::cout << "changed " << path << "\n";
     const bool done = !set.wait || WaitForIndexing({path}, set.timeout, output.json);

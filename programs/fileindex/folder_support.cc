@@ -12,7 +12,7 @@
 #include "fileindex/util.h"
 #include "programs/fileindex/cli_output.h"
 #include "programs/fileindex/folder_support.h"
-#include "programs/fileindex/daemon_client.h"
+#include "programs/frontend/daemon_client.h"
 
 namespace corvlumex {
 namespace cli {
@@ -78,7 +78,7 @@ bool WaitForIndexing(const std::vector<std::string>& share_paths, double timeout
     double eta = -1;
     std::string state = "waiting for fileindexd";
     try {
-      const Json::Value status = AskDaemon("status", Json::Value(Json::objectValue));
+      const Json::Value status = frontend::AskDaemon("status", Json::Value(Json::objectValue));
       state = "queued";
       for (const std::string& share : shares) {
         const Json::Value& entry = status["shares"][share];

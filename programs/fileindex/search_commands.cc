@@ -12,6 +12,7 @@
 #include "fileindex/query/user_query.h"
 #include "platform/platform.h"
 #include "programs/fileindex/commands.h"
+#include "programs/frontend/search_request.h"
 
 namespace corvlumex {
 namespace cli {
@@ -84,45 +85,27 @@ Json::Value SearchRequest(const SearchArgs& args) {
   // `search 'saffron rice'` mean the same.
   std::string text;
   for (const std::string& word : args.words) text += (text.empty() ? "" : " ") + word;
-  Json::Value qsl;
+  frontend::SearchSpec spec;
   try {
-    qsl = fileindex::UserQueryToSearch(text)["qsl"];
+    spec.qsl = fileindex::UserQueryToSearch(text)["qsl"];
   } catch (const fileindex::UserQuerySyntaxError& error) {
     throw Error(kErrorBadArgument, std::string(error.what()) + " (the syntax: docs/search.md)");
   }
-  if (args.name) qsl = NamesOnly(qsl);
-  if (args.content) qsl = ContentOnly(qsl);
-  if (!args.type.empty()) {
-    Json::Value extensions(Json::arrayValue);
-    for (const std::string& ext : fileindex::GetExtensionsByCategory(args.type)) extensions.append(ext);
-    Json::Value filtered(Json::objectValue);
-    filtered["bool"]["must"].append(qsl);
-    filtered["bool"]["filter"].append(Json::Value(Json::objectValue));
-    filtered["bool"]["filter"][0]["terms"][elastic::kFieldExtension] = extensions;
-    qsl = filtered;
-  }
-  Json::Value data(Json::objectValue);
-  if (!args.shares.empty()) {
-    for (const std::string& share : args.shares) data["ids"].append(elastic::GetFileIndexID(share));
-  }
-  data["query"]["qsl"] = qsl;
-  data["from"] = args.from;
-  data["size"] = args.size;
-  data["track_total"] = true;
-  for (const char* field_name : {elastic::kFieldPath, "CORVMDIsDir", "CORVMDFSSize", "CORVMDFSContentChangeDate"}) {
-    data["load_field"].append(field_name);
-  }
+  if (args.name) spec.qsl = NamesOnly(spec.qsl);
+  if (args.content) spec.qsl = ContentOnly(spec.qsl);
+  spec.shares = args.shares;
+  spec.category = args.type;
+  spec.from = args.from;
+  spec.size = args.size;
   if (!args.name) {
     // Matched words in bold on a terminal, in [brackets] otherwise.
     const bool tty = isatty(STDOUT_FILENO) == 1;
-    data["highlight"]["size"] = 80;
-    data["highlight"]["pre"] = tty ? "\033[1m" : "[";
-    data["highlight"]["post"] = tty ? "\033[0m" : "]";
+    spec.highlight = true;
+    spec.highlight_size = 80;
+    spec.highlight_pre = tty ? "\033[1m" : "[";
+    spec.highlight_post = tty ? "\033[0m" : "]";
   }
-  Json::Value request(Json::objectValue);
-  request["command"] = "search";
-  request["data"] = data;
-  return request;
+  return frontend::SearchRequest(spec);
 }
 
 void PrintHits(const SearchArgs& args, const Json::Value& result) {
@@ -189,7 +172,7 @@ void AddSearchCommands(CLI::App& app, Output& output) {
   suggest_cmd->callback([&output] {
     Json::Value request(Json::objectValue);
     request["command"] = "suggest";
-    for (const std::string& share : suggest.shares) request["data"]["ids"].append(elastic::GetFileIndexID(share));
+    if (!suggest.shares.empty()) request["data"]["ids"] = frontend::IndexIds(suggest.shares);
     request["data"]["field"] = elastic::kFieldSearchFileName;
     request["data"]["text"] = suggest.text;
     request["data"]["size"] = suggest.size;

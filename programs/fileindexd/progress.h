@@ -6,6 +6,7 @@
 #include <json/json.h>
 
 #include <chrono>
+#include <deque>
 #include <map>
 #include <mutex>
 #include <string>
@@ -31,7 +32,10 @@ class ProgressBoard {
   // More files to do in this batch (a folder walk found them).
   void AddTodo(const std::string& share, uint64_t count);
   void Done(const std::string& share, uint64_t count = 1);
-  void Failed(const std::string& share);
+  // A file that could not be indexed; the latest kKeptFailures of each
+  // share are kept (path, reason, when) for the administrators' list.
+  void Failed(const std::string& share, const std::string& path = "", const std::string& reason = "");
+  static constexpr size_t kKeptFailures = 100;
   // One file was extracted and stored (a full upsert or an attribute update).
   void Extracted(const std::string& share);
   void EndBatch(const std::string& share);
@@ -40,7 +44,7 @@ class ProgressBoard {
 
   // {"<share>": {"state", "detail", "done", "todo", "rate", "eta_seconds",
   //  "total_done", "total_failed", "total_extracted", "deferred",
-  //  "last_commit_age_seconds"}}.
+  //  "last_commit_age_seconds", "failed_files": [{"path", "reason", "time"}]}}.
   Json::Value Snapshot() const;
 
  private:
@@ -53,6 +57,11 @@ class ProgressBoard {
     Clock::time_point batch_start{};
     Clock::time_point last_commit{};
     bool committed = false;
+    struct Failure {
+      std::string path, reason;
+      long long time = 0;  // seconds since 1970
+    };
+    std::deque<Failure> failures;  // oldest first
   };
   mutable std::mutex mutex_;
   std::map<std::string, Share> shares_;

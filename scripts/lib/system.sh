@@ -9,7 +9,7 @@
 #                    to $CORVLUMEX_ROOT/var/log/corvlumex and .../var/run
 
 SYSTEM_PROGRAMS=(corvelasticd corvnotifyd fileindexd corvspotlightd)
-SYSTEM_TARGETS=(corvelasticd corvnotifyd fileindexd fileindex_cli corvcontentextractd corvvxmnotify corvspotlightd)
+SYSTEM_TARGETS=(corvelasticd corvnotifyd fileindexd fileindex_cli corvcontentextractd corvvxmnotify corvspotlightd fileindex-web)
 
 system_build() {  # builds only what is needed, reusing an existing build folder
   local build="${FILEINDEX_BUILD:-$FILEINDEX_SRC/build}"
@@ -18,7 +18,7 @@ system_build() {  # builds only what is needed, reusing an existing build folder
   cmake -S "$FILEINDEX_SRC" -B "$build" -DCMAKE_BUILD_TYPE=RelWithDebInfo > "$build.configure.log" 2>&1 ||
     { cat "$build.configure.log"; return 1; }
   cmake --build "$build" -j "$(nproc)" --target "${SYSTEM_TARGETS[@]}" 2>&1 | grep -E 'error|warning:|Built target' || true
-  for target in fileindexd fileindex corvelasticd corvnotifyd corvcontentextractd corvvxmnotify corvspotlightd; do
+  for target in fileindexd fileindex corvelasticd corvnotifyd corvcontentextractd corvvxmnotify corvspotlightd fileindex-web; do
     [ -x "$(system_program "$target")" ] || { echo "build failed: $target is missing" >&2; return 1; }
   done
 }
@@ -72,7 +72,7 @@ system_start() {  # starts the daemons in the sandbox root (those not running ye
 
 system_stop() {  # stops the daemons started by system_start (SIGTERM, then SIGKILL after 10 s)
   local program pid pid_file
-  for program in corvspotlightd fileindexd corvnotifyd corvelasticd; do
+  for program in fileindex-web corvspotlightd fileindexd corvnotifyd corvelasticd; do
     pid_file="$(system_pid_file "$program")"
     [ -f "$pid_file" ] || continue
     pid="$(cat "$pid_file")"
@@ -89,4 +89,21 @@ system_stop() {  # stops the daemons started by system_start (SIGTERM, then SIGK
 system_write_share() {  # name, directory: writes a one-share registry
   mkdir -p "$CORVLUMEX_ROOT/etc/corvlumex"
   printf '[{"name": "%s", "path": "%s"}]\n' "$1" "$2" > "$CORVLUMEX_ROOT/etc/corvlumex/shares.json"
+}
+
+system_web_link_file() { echo "$CORVLUMEX_ROOT/var/run/fileindex-web.sign-in"; }
+
+system_web_start() {  # port: starts the web daemon (pages from the source tree) and waits for its sign-in link
+  local logs link; logs="$(system_log_dir)"; link="$(system_web_link_file)"
+  system_running fileindex-web && return 0
+  rm -f "$link"
+  nohup "$(system_program fileindex-web)" --port "$1" --web-root "$FILEINDEX_SRC/web" \
+    --sign-in-link-file "$link" >> "$logs/fileindex-web.log" 2>&1 < /dev/null &
+  echo $! > "$(system_pid_file fileindex-web)"
+  local deadline=$((SECONDS + 20))
+  while [ ! -s "$link" ]; do
+    system_running fileindex-web || { tail -3 "$logs/fileindex-web.log" >&2; return 1; }
+    [ $SECONDS -lt $deadline ] || { echo "timed out waiting for fileindex-web" >&2; return 1; }
+    sleep 0.1
+  done
 }

@@ -35,6 +35,23 @@ class DaemonInputTest : public DaemonTest {
 
   // The daemon still answers after whatever the test did.
   void ExpectAlive() { EXPECT_TRUE(Run("index_list")["success"].asBool()); }
+
+  // The folder "share" in the root, open to every user, for files of several owners.
+  std::string OpenShare() {
+    chmod(root_.path().c_str(), 0755);
+    const std::string share = root_.MakeDir("share");
+    chmod(share.c_str(), 0755);
+    return share;
+  }
+  // A file with `mode` on disk and its document holding `text`.
+  void AddFile(const std::string& path, mode_t mode, const std::string& text) {
+    std::ofstream(path) << "x";
+    chmod(path.c_str(), mode);
+    Json::Value data;
+    data["doc_id"] = path;
+    data["data"] = FileDocument(path, text, 1);
+    ASSERT_TRUE(Run("document_upsert_by_id", data)["success"].asBool());
+  }
 };
 
 TEST_F(DaemonInputTest, BadRequestsAreAnsweredWithTheirCode) {
@@ -270,18 +287,9 @@ TEST_F(DaemonInputTest, OrdinaryUsersSeeOnlyFilesTheyCanReadAndCannotChangeIndex
   const struct passwd* nobody = getpwnam("nobody");
   ASSERT_NE(nobody, nullptr);
   const struct passwd user = *nobody;
-  chmod(root_.path().c_str(), 0755);
-  const std::string share = root_.MakeDir("share");
-  chmod(share.c_str(), 0755);
+  const std::string share = OpenShare();
   std::vector<std::string> readable;
-  const auto add = [&](const std::string& path, mode_t mode) {
-    std::ofstream(path) << "x";
-    chmod(path.c_str(), mode);
-    Json::Value data;
-    data["doc_id"] = path;
-    data["data"] = FileDocument(path, "common word", 1);
-    ASSERT_TRUE(Run("document_upsert_by_id", data)["success"].asBool());
-  };
+  const auto add = [&](const std::string& path, mode_t mode) { AddFile(path, mode, "common word"); };
   // Many unreadable hits first in key order, so paging has to look past them.
   for (int i = 0; i < 150; ++i) add(share + "/a-secret-" + std::to_string(1000 + i) + ".txt", 0600);
   for (int i = 0; i < 3; ++i) {
@@ -308,6 +316,61 @@ TEST_F(DaemonInputTest, OrdinaryUsersSeeOnlyFilesTheyCanReadAndCannotChangeIndex
   EXPECT_EQ(answer["error"]["code"].asInt(), 2004);
   // Root sees everything.
   EXPECT_EQ(Search(R"({"match": {"_all": "common"}})")["data"]["total"].asInt(), 153);
+}
+
+// A front end running as root searches on behalf of a signed-in user: the
+// daemon filters with that user's ids and groups, before paging; an ordinary
+// user cannot borrow another identity.
+TEST_F(DaemonInputTest, SearchOnBehalfOfAUserSeesOnlyThatUsersFiles) {
+  if (geteuid() != 0) GTEST_SKIP() << "needs root to ask on behalf of another user";
+  const struct passwd* nobody = getpwnam("nobody");
+  ASSERT_NE(nobody, nullptr);
+  const struct passwd user = *nobody;
+  const std::string share = OpenShare();
+  const auto add = [&](const std::string& path, mode_t mode) { AddFile(path, mode, "shared word"); };
+  for (int i = 0; i < 5; ++i) add(share + "/a-private-" + std::to_string(i) + ".txt", 0600);
+  add(share + "/b-open.txt", 0644);
+  Commit();
+  const char* query = R"({"query": {"qsl": {"match": {"_all": "shared"}}}, "size": 1, "sort": "_key", "track_total": true})";
+  const struct {
+    const char* as_user;
+    int code;     // 0: answered
+    int total;
+  } cases[] = {
+      {"nobody", 0, 1},
+      {"root", 0, 6},
+      {"no-such-user-here", 2002, 0},
+  };
+  for (const auto& c : cases) {
+    Json::Value data = Data(query);
+    data["as_user"] = c.as_user;
+    const Json::Value answer = Run("search", data);
+    if (c.code != 0) {
+      EXPECT_EQ(answer["error"]["code"].asInt(), c.code) << c.as_user;
+      continue;
+    }
+    ASSERT_TRUE(answer["success"].asBool()) << c.as_user << ": " << answer;
+    EXPECT_EQ(answer["data"]["total"].asInt(), c.total) << c.as_user;
+  }
+  Json::Value as_nobody = Data(query);
+  as_nobody["as_user"] = "nobody";
+  EXPECT_EQ(HitIds(Run("search", as_nobody)), Names({share + "/b-open.txt"}));
+  Json::Value suggest = Data(R"({"field": "CORVMDSearchFileName", "text": "a-pri"})");
+  suggest["as_user"] = "nobody";
+  const Json::Value suggested = Run("suggest", suggest);
+  EXPECT_TRUE(suggested["success"].asBool()) << suggested;
+  EXPECT_EQ(suggested["data"]["suggestions"].size(), 0u) << suggested;
+  // An ordinary user may not search as root.
+  const std::string socket = daemon_->socket_path();
+  const std::string refused = AsUser(user, [&] {
+    Json::Value data = Data(query);
+    data["id"] = kIndex;
+    data["as_user"] = "root";
+    return JsonToString(Command(socket, "search", data));
+  });
+  Json::Value answer;
+  ASSERT_TRUE(JsonFromString(answer, refused)) << refused;
+  EXPECT_EQ(answer["error"]["code"].asInt(), 2004);
 }
 
 }  // namespace

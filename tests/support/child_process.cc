@@ -64,6 +64,10 @@ ChildProcess::ChildProcess(const std::string& program, const std::vector<std::st
 
 ChildProcess::~ChildProcess() { Stop(SIGKILL); }
 
+void ChildProcess::Signal(int signal) {
+  if (pid_ > 0) kill(pid_, signal);
+}
+
 int ChildProcess::Stop(int signal) {
   if (pid_ <= 0) return -1;
   kill(pid_, signal);

@@ -40,6 +40,8 @@ class ChildProcess {
   // Sends `signal` and waits: the exit status, or 128 + the signal that
   // ended it (-1 when it was already waited for).
   int Stop(int signal);
+  // Sends `signal` and returns at once (a program that reacts and goes on).
+  void Signal(int signal);
   // Waits for the program to end on its own.
   int Wait();
   // False once the program has ended (and then it is waited for).

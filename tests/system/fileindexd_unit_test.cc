@@ -351,6 +351,18 @@ TEST(BatchMarkTest, ACountHoldsForItsOwnBatchFileOnly) {
   mark.Clear();
   EXPECT_EQ(mark.Load(), 0u);
   EXPECT_FALSE(IsFileExist(batch + ".applied"));
+// The administrators' list of files that could not be indexed keeps the
+// latest ones only, so a share full of broken files cannot grow the daemon.
+TEST(ProgressBoardTest, KeepsTheLatestFailedFilesWithTheirReasons) {
+  ProgressBoard board;
+  for (size_t i = 0; i < ProgressBoard::kKeptFailures + 5; ++i) {
+    board.Failed("music", "/volume1/music/" + std::to_string(i) + ".mp3", "upsert: damaged");
+  }
+  const Json::Value snapshot = board.Snapshot()["music"];
+  EXPECT_EQ(snapshot["total_failed"].asUInt64(), ProgressBoard::kKeptFailures + 5);
+  ASSERT_EQ(snapshot["failed_files"].size(), ProgressBoard::kKeptFailures);
+  EXPECT_EQ(snapshot["failed_files"][0]["path"].asString(), "/volume1/music/5.mp3");
+  EXPECT_EQ(snapshot["failed_files"][static_cast<int>(ProgressBoard::kKeptFailures) - 1]["reason"].asString(), "upsert: damaged");
 }
 
 TEST(ProgressBoardTest, CountsPerShareAndResetsAtTheEndOfABatch) {

@@ -7,11 +7,11 @@
 #include <string>
 
 namespace corvlumex {
-namespace cli {
+namespace frontend {
 
 // Throws Error 502 when the daemon cannot be reached, or the daemon's own
 // code and message when it refuses the command.
 Json::Value AskDaemon(const std::string& type, const Json::Value& data);
 
-}  // namespace cli
+}  // namespace frontend
 }  // namespace corvlumex

@@ -1,4 +1,4 @@
-#include "programs/fileindex/daemon_client.h"
+#include "programs/frontend/daemon_client.h"
 
 #include <sys/socket.h>
 #include <sys/un.h>
@@ -14,7 +14,7 @@
 #include "fileindex/constants.h"
 
 namespace corvlumex {
-namespace cli {
+namespace frontend {
 
 Json::Value AskDaemon(const std::string& type, const Json::Value& data) {
   const std::string path = SysPath(fileindex::kFileIndexDaemonSocketPath);
@@ -51,5 +51,5 @@ Json::Value AskDaemon(const std::string& type, const Json::Value& data) {
   return answer["data"];
 }
 
-}  // namespace cli
+}  // namespace frontend
 }  // namespace corvlumex
