@@ -151,6 +151,16 @@ class Parser {
     return groups;
   }
 
+  // The word columns of the file names searched by the catch-all field.
+  std::vector<std::string> NameWordColumns(const std::string& field) const {
+    std::vector<std::string> columns;
+    if (field != kAllField) return columns;
+    for (const FieldSpec* field_def : schema_.TextFields()) {
+      if (field_def->in_all && field_def->kind == FieldKind::kNgram) columns.push_back(field_def->Column());
+    }
+    return columns;
+  }
+
   // Every word (or, with "or", any word) must be found in one of the columns.
   QueryNode Words(const std::string& field, const std::string& text, bool any, bool negated) {
     const auto groups = ColumnsFor(field);
@@ -158,6 +168,8 @@ class Parser {
     // Words are split on blanks first so each word is analyzed per column kind.
     std::vector<std::string> raw_words;
     ForEachBlankSeparated(text, &raw_words);
+    const std::vector<std::string> name_columns = NameWordColumns(field);
+    std::vector<std::string> name_expressions, exact_tokens;
     for (const std::string& word : raw_words) {
       std::vector<std::string> alternatives;
       for (const auto& group : groups) {
@@ -166,6 +178,12 @@ class Parser {
         }
       }
       if (alternatives.empty()) continue;
+      if (!name_columns.empty()) {
+        std::vector<std::string> tokens;
+        Analyze(Analyzer::kStandard, word, &tokens);
+        if (!tokens.empty()) name_expressions.push_back(ColumnFilter(name_columns) + " : " + Phrase(tokens));
+        exact_tokens.insert(exact_tokens.end(), tokens.begin(), tokens.end());
+      }
       std::string expression = alternatives.size() == 1 ? alternatives[0] : "(";
       if (alternatives.size() > 1) {
         for (size_t i = 0; i < alternatives.size(); ++i) expression += (i > 0 ? " OR " : "") + alternatives[i];
@@ -182,6 +200,10 @@ class Parser {
     for (size_t i = 0; i < word_expressions.size(); ++i) {
       node.fts += (i > 0 ? (any ? " OR " : " AND ") : "") + word_expressions[i];
     }
+    for (size_t i = 0; i < name_expressions.size(); ++i) {
+      node.name_fts += (i > 0 ? (any ? " OR " : " AND ") : "") + name_expressions[i];
+    }
+    if (!any) node.exact_name_tokens = std::move(exact_tokens);
     if (!negated) AddHighlight(text);
     return node;
   }
@@ -295,6 +317,13 @@ class Parser {
     node.type = QueryNode::Type::kText;
     for (size_t i = 0; i < alternatives.size(); ++i) node.fts += (i > 0 ? " OR " : "") + alternatives[i];
     if (alternatives.size() > 1) node.fts = "(" + node.fts + ")";
+    const std::vector<std::string> name_columns = NameWordColumns(field);
+    std::vector<std::string> tokens;
+    Analyze(Analyzer::kStandard, text, &tokens);
+    if (!name_columns.empty() && !tokens.empty()) {
+      node.name_fts = ColumnFilter(name_columns) + " : " + Phrase(tokens);
+      node.exact_name_tokens = tokens;
+    }
     if (!negated) AddHighlight(text);
     return node;
   }
@@ -363,6 +392,8 @@ class Parser {
     QueryNode node;
     node.type = columns.empty() ? QueryNode::Type::kNone : QueryNode::Type::kText;
     node.fts = ColumnFilter(columns) + " : " + Phrase(tokens) + " *";
+    const std::vector<std::string> name_columns = NameWordColumns(field);
+    if (!name_columns.empty()) node.name_fts = ColumnFilter(name_columns) + " : " + Phrase(tokens) + " *";
     return node;
   }
 
