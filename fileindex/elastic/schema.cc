@@ -198,6 +198,14 @@ const char kFileIndexMappingsText[] = R"json({
 		"CORVMDSpotlightBoost": {
 			"type": "text",
 			"analyzer": "white space"
+		},
+		"CORVMDExtractionFailed": {
+			"type": "bool",
+			"_all": false
+		},
+		"CORVMDExtractionError": {
+			"analyzer": "keyword",
+			"_all": false
 		}
 	}
 })json";

@@ -79,7 +79,7 @@ void OpApplier::Guard(const std::string& what, const std::string& path, const st
     step();
   } catch (const Error& error) {
     if (IsBatchError(error)) throw;
-    progress_.Failed(share_);
+    progress_.Failed(share_, path);
     CORV_LOG("%s of %s skipped: code=%d, reason=%s", what.c_str(), path.c_str(), error.code, error.reason.c_str());
   }
 }

@@ -32,9 +32,9 @@ void ProgressBoard::Done(const std::string& share, uint64_t count) {
   if (entry.todo < entry.done) entry.todo = entry.done;
 }
 
-void ProgressBoard::Failed(const std::string& share) {
+void ProgressBoard::Failed(const std::string& share, const std::string& path) {
   std::lock_guard<std::mutex> lock(mutex_);
-  ++shares_[share].total_failed;
+  shares_[share].failed.insert(path);
 }
 
 void ProgressBoard::Extracted(const std::string& share) {
@@ -73,7 +73,7 @@ Json::Value ProgressBoard::Snapshot() const {
     share["done"] = static_cast<Json::UInt64>(entry.done);
     share["todo"] = static_cast<Json::UInt64>(entry.todo);
     share["total_done"] = static_cast<Json::UInt64>(entry.total_done);
-    share["total_failed"] = static_cast<Json::UInt64>(entry.total_failed);
+    share["total_failed"] = static_cast<Json::UInt64>(entry.failed.size());
     share["total_extracted"] = static_cast<Json::UInt64>(entry.total_extracted);
     share["deferred"] = static_cast<Json::UInt64>(entry.deferred);
     double rate = 0;

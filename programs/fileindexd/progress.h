@@ -8,6 +8,7 @@
 #include <chrono>
 #include <map>
 #include <mutex>
+#include <set>
 #include <string>
 
 namespace corvlumex {
@@ -31,7 +32,9 @@ class ProgressBoard {
   // More files to do in this batch (a folder walk found them).
   void AddTodo(const std::string& share, uint64_t count);
   void Done(const std::string& share, uint64_t count = 1);
-  void Failed(const std::string& share);
+  // Indexing `path` failed. "total_failed" counts files, not attempts: a
+  // file that fails again on every retry counts once.
+  void Failed(const std::string& share, const std::string& path);
   // One file was extracted and stored (a full upsert or an attribute update).
   void Extracted(const std::string& share);
   void EndBatch(const std::string& share);
@@ -48,7 +51,8 @@ class ProgressBoard {
     std::string state = kStateIdle;
     std::string detail;
     uint64_t done = 0, todo = 0;
-    uint64_t total_done = 0, total_failed = 0, total_extracted = 0;
+    uint64_t total_done = 0, total_extracted = 0;
+    std::set<std::string> failed;
     size_t deferred = 0;
     Clock::time_point batch_start{};
     Clock::time_point last_commit{};

@@ -205,7 +205,8 @@ TEST(ProgressBoardTest, CountsPerShareAndResetsAtTheEndOfABatch) {
   board.StartBatch("music", 10);
   board.Done("music", 4);
   board.AddTodo("music", 5);
-  board.Failed("music");
+  board.Failed("music", "/v/music/a.mp3");
+  board.Failed("music", "/v/music/a.mp3");  // a retry of the same file
   board.Extracted("music");
   Json::Value snapshot = board.Snapshot();
   EXPECT_EQ(snapshot["music"]["state"].asString(), "indexing");
