@@ -19,6 +19,7 @@
 #include "platform/linux/extract/parsers/extract_content.h"
 #include "platform/linux/extract/parsers/file_bytes.h"
 #include "platform/linux/extract/parsers/formats.h"
+#include "platform/linux/extract/parsers/text_sink.h"
 #include "platform/linux/extract/worker_protocol.h"
 
 namespace corvlumex {
@@ -85,11 +86,19 @@ void RunTestHook(const WorkerLimits& limits) {
   }
 }
 
+// The text cap the request asks for; the default when it names none, and
+// never more than the largest setting (the reply must fit a frame).
+size_t TextCap(const Json::Value& request) {
+  const Json::Value& cap = request["text_cap"];
+  if (!cap.isUInt64() || cap.asUInt64() == 0) return kTextContentCap;
+  return static_cast<size_t>(std::min<Json::UInt64>(cap.asUInt64(), static_cast<Json::UInt64>(kMaxTextCapMb) << 20));
+}
+
 Json::Value Answer(int fd, const Json::Value& request, const WorkerLimits& limits) {
   Json::Value reply(Json::objectValue);
   try {
     RunTestHook(limits);
-    reply["fields"] = ExtractContent(fd, request["name"].asString(), request["need_meta"].asBool());
+    reply["fields"] = ExtractContent(fd, request["name"].asString(), request["need_meta"].asBool(), TextCap(request));
     reply["ok"] = true;
   } catch (const std::bad_alloc&) {
     reply["ok"] = false;
