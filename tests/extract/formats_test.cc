@@ -22,6 +22,7 @@ using testing_support::MakePdf;
 using testing_support::RunTool;
 using testing_support::SandboxRoot;
 using testing_support::WriteBytes;
+using testing_support::WriteCompressed;
 
 class FormatsTest : public ::testing::Test {
  protected:
@@ -117,6 +118,34 @@ TEST_F(FormatsTest, HtmlKeepsNoscriptAndTextAfterTheEnd) {
   for (const char* words : {"inside", "enable scripts", "after the end", "tail"}) {
     EXPECT_NE(text.find(words), std::string::npos) << words << " in " << text;
   }
+}
+
+TEST_F(FormatsTest, SingleCompressedFilesAndManPagesGiveTheirText) {
+  const std::string page =
+      ".\\\" a comment\n.TH LS 1 \"2024\"\n.SH NAME\nls \\- list directory contents\n.SH DESCRIPTION\n"
+      "List information about the \\fBFILEs\\fR (the current \\fIdirectory\\fP by default).\n.TP\n.B \\-a\n"
+      "do not ignore entries starting with .\n.sp 2\n";
+  const char* page_words = "list directory contents";
+  WriteBytes(PathOf("ls.1"), page);
+  for (const char* suffix : {"gz", "bz2", "xz", "zst"}) {
+    SCOPED_TRACE(suffix);
+    WriteCompressed(PathOf(std::string("notes.txt.") + suffix), suffix, "saffron rice, caf\xC3\xA9 cr\xC3\xA8me");
+    EXPECT_EQ("saffron rice, caf\xC3\xA9 cr\xC3\xA8me", Extract(std::string("notes.txt.") + suffix)[kFieldTextContent].asString());
+    WriteCompressed(PathOf(std::string("ls.1.") + suffix), suffix, page);
+    const std::string text = Extract(std::string("ls.1.") + suffix)[kFieldTextContent].asString();
+    EXPECT_NE(text.find(page_words), std::string::npos) << text;
+    EXPECT_NE(text.find("FILEs (the current directory by default)"), std::string::npos) << text;
+    EXPECT_EQ(text.find(".TH"), std::string::npos) << text;
+    EXPECT_EQ(text.find("fB"), std::string::npos) << text;
+    EXPECT_EQ(text.find("a comment"), std::string::npos) << text;
+  }
+  EXPECT_EQ(Extract("ls.1")[kFieldTextContent].asString(), Extract("ls.1.gz")[kFieldTextContent].asString());
+  // An archive inside (.tar.gz) is no text: only the name and status are kept.
+  WriteCompressed(PathOf("bundle.tar.gz"), "gz", std::string("ustar\0\0\0binary", 14));
+  EXPECT_FALSE(Extract("bundle.tar.gz").isMember(kFieldTextContent));
+  // Garbage under a compressed name fails as any broken file does.
+  WriteBytes(PathOf("broken.gz"), "not gzip at all");
+  EXPECT_THROW(Extract("broken.gz"), std::exception);
 }
 
 TEST_F(FormatsTest, XmlKeepsValuesApartAndNeverFetchesEntities) {

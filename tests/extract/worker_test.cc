@@ -29,6 +29,7 @@ using testing_support::RunTool;
 using testing_support::SandboxRoot;
 using testing_support::Truncate;
 using testing_support::WriteBytes;
+using testing_support::WriteCompressed;
 
 class WorkerTest : public ::testing::Test {
  protected:
@@ -226,6 +227,23 @@ TEST_F(WorkerTest, AMemoryHungryParserHitsTheLimit) {
   const std::string reason = FailureOf("a.txt");
   unsetenv("CORVLUMEX_EXTRACT_MEMORY_MB");
   EXPECT_NE(std::string::npos, reason.find("out of memory (the worker may use 256 MiB)")) << reason;
+}
+
+TEST_F(WorkerTest, ACompressionBombIsCutNotFollowed) {
+#if defined(__SANITIZE_ADDRESS__)
+  GTEST_SKIP() << "the sanitizer build runs the worker without an address-space limit";
+#endif
+  // 512 MiB of text in a worker that may use 256 MiB: unpacking it whole
+  // would kill the worker; cut at the text limit, the text comes through.
+  WriteCompressed(PathOf("bomb.txt.zst"), "zst", std::string(512u << 20, 'x'));
+  setenv("CORVLUMEX_EXTRACT_MEMORY_MB", "256", 1);
+  setenv("CORVLUMEX_EXTRACT_TEXT_MB", "1", 1);
+  StopIdleExtractWorkers();
+  const Json::Value document = Parse("bomb.txt.zst");
+  unsetenv("CORVLUMEX_EXTRACT_MEMORY_MB");
+  unsetenv("CORVLUMEX_EXTRACT_TEXT_MB");
+  EXPECT_FALSE(document.isMember(kFieldExtractionFailed)) << document[kFieldExtractionError].asString();
+  EXPECT_EQ(1u << 20, document[kFieldTextContent].asString().size());
 }
 
 TEST_F(WorkerTest, TheWorkerIsConfined) {

@@ -11,13 +11,14 @@
 #include "platform/linux/extract/parsers/file_bytes.h"
 #include "platform/linux/extract/parsers/formats.h"
 #include "platform/linux/extract/parsers/text_sink.h"
+#include "platform/linux/extract/parsers/troff_text.h"
 
 namespace corvlumex {
 namespace platform {
 namespace extract {
 namespace {
 
-enum class Family { kText, kHtml, kXml, kPdf, kOffice, kAudio, kPhoto, kVideo };
+enum class Family { kText, kHtml, kXml, kPdf, kOffice, kAudio, kPhoto, kVideo, kManPage, kCompressed };
 
 struct Format {
   Family family;
@@ -45,6 +46,8 @@ const std::map<std::string, Format>& FormatsByExtension() {
     }
     for (const char* ext : {"html", "htm", "xhtml", "shtml"}) (*table)[ext] = {Family::kHtml, OfficeFormat::kDocx};
     for (const char* ext : {"xml", "svg", "rss", "atom", "plist"}) (*table)[ext] = {Family::kXml, OfficeFormat::kDocx};
+    for (const char* ext : {"gz", "bz2", "xz", "zst"}) (*table)[ext] = {Family::kCompressed, OfficeFormat::kDocx};
+    for (const char* ext : {"man", "roff", "troff", "mdoc"}) (*table)[ext] = {Family::kManPage, OfficeFormat::kDocx};
     (*table)["pdf"] = {Family::kPdf, OfficeFormat::kDocx};
     (*table)["docx"] = {Family::kOffice, OfficeFormat::kDocx};
     (*table)["docm"] = {Family::kOffice, OfficeFormat::kDocx};
@@ -120,6 +123,10 @@ bool FamilyByContent(int fd, const std::string& type, Format* format) {
     return true;
   }
   if (!StartsWith(type, "text/") && !IsProgramText(type)) return false;
+  if (type == "text/troff") {
+    *format = {Family::kManPage, OfficeFormat::kDocx};
+    return true;
+  }
   const std::string signature = Signature(fd);
   if (StartsWith(signature, "<!doctype html") || StartsWith(signature, "<html")) {
     *format = {Family::kHtml, OfficeFormat::kDocx};
@@ -158,6 +165,8 @@ Json::Value ExtractContent(int fd, const std::string& name, bool need_meta, size
   const auto known = FormatsByExtension().find(GetFileExtension(name, true));
   if (known != FormatsByExtension().end()) {
     format = known->second;
+  } else if (IsManPageName(name)) {
+    format = {Family::kManPage, OfficeFormat::kDocx};
   } else if (!FamilyByContent(fd, media_type, &format)) {
     return fields;  // a file we have nothing to read from: its name and status suffice
   }
@@ -172,6 +181,13 @@ Json::Value ExtractContent(int fd, const std::string& name, bool need_meta, size
       break;
     case Family::kXml:
       ExtractXml(fd, text);
+      break;
+    case Family::kManPage:
+      ExtractManPage(fd, text);
+      break;
+    case Family::kCompressed:
+      lseek(fd, 0, SEEK_SET);
+      ExtractCompressed(fd, name.substr(0, name.rfind('.')), text);
       break;
     case Family::kPdf:
       ExtractPdf(fd, text, fields);

@@ -11,6 +11,7 @@
 #include "platform/linux/extract/parsers/file_bytes.h"
 #include "platform/linux/extract/parsers/formats.h"
 #include "platform/linux/extract/parsers/text_sink.h"
+#include "platform/linux/extract/parsers/troff_text.h"
 #include "platform/linux/extract/parsers/xml_text.h"
 
 namespace corvlumex {
@@ -64,6 +65,8 @@ void SetIfPresent(Json::Value& fields, const char* field, const std::string& val
 }  // namespace
 
 void ExtractPlainText(int fd, TextSink& text) { text.Append(ReadAsUtf8(fd, TextInputCap(text))); }
+
+void ExtractManPage(int fd, TextSink& text) { AppendTroffText(ReadAsUtf8(fd, TextInputCap(text)), text); }
 
 void ExtractHtml(int fd, TextSink& text, Json::Value& fields) {
   const std::string utf8 = ReadAsUtf8(fd, MarkupInputCap(text));
