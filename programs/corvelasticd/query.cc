@@ -19,19 +19,6 @@ constexpr const char* kAllField = "_all";
 
 [[noreturn]] void Bad(const std::string& what) { throw DaemonError(kCodeBadQuery, "Bad query: " + what); }
 
-// One token or phrase in the index's expression syntax: quotes doubled.
-std::string Phrase(const std::vector<std::string>& tokens) {
-  std::string out = "\"";
-  for (size_t i = 0; i < tokens.size(); ++i) {
-    if (i > 0) out += ' ';
-    for (const char c : tokens[i]) {
-      out += c;
-      if (c == '"') out += '"';
-    }
-  }
-  return out + "\"";
-}
-
 std::string ColumnFilter(const std::vector<std::string>& columns) {
   std::string out = "{";
   for (size_t i = 0; i < columns.size(); ++i) out += (i > 0 ? " " : "") + columns[i];
@@ -174,14 +161,14 @@ class Parser {
       std::vector<std::string> alternatives;
       for (const auto& group : groups) {
         for (const auto& tokens : AnalyzeQuery(group.first, word)) {
-          alternatives.push_back(ColumnFilter(group.second) + " : " + Phrase(tokens));
+          alternatives.push_back(ColumnFilter(group.second) + " : " + FtsPhrase(tokens));
         }
       }
       if (alternatives.empty()) continue;
       if (!name_columns.empty()) {
         std::vector<std::string> tokens;
         Analyze(Analyzer::kStandard, word, &tokens);
-        if (!tokens.empty()) name_expressions.push_back(ColumnFilter(name_columns) + " : " + Phrase(tokens));
+        if (!tokens.empty()) name_expressions.push_back(ColumnFilter(name_columns) + " : " + FtsPhrase(tokens));
         exact_tokens.insert(exact_tokens.end(), tokens.begin(), tokens.end());
       }
       std::string expression = alternatives.size() == 1 ? alternatives[0] : "(";
@@ -227,7 +214,7 @@ class Parser {
     const std::string folded = Fold(text, FoldMode::kSearch);
     if (folded.empty()) return QueryNode{};  // every name holds the empty text
     if (CodePointCount(folded) >= 3) {
-      node.fts = "{" + field_def.NameColumn() + "} : " + Phrase({folded});
+      node.fts = "{" + field_def.NameColumn() + "} : " + FtsPhrase({folded});
     } else {
       node.substring = folded;
     }
@@ -258,7 +245,7 @@ class Parser {
       return node;
     }
     node.type = QueryNode::Type::kText;
-    node.fts = "{" + field_def.Column() + "} : " + Phrase(tokens);
+    node.fts = "{" + field_def.Column() + "} : " + FtsPhrase(tokens);
     return node;
   }
 
@@ -309,7 +296,7 @@ class Parser {
     for (const auto& group : ColumnsFor(field)) {
       std::vector<std::string> tokens;
       Analyze(group.first, text, &tokens);
-      if (!tokens.empty()) alternatives.push_back(ColumnFilter(group.second) + " : " + Phrase(tokens));
+      if (!tokens.empty()) alternatives.push_back(ColumnFilter(group.second) + " : " + FtsPhrase(tokens));
     }
     QueryNode node;
     node.type = QueryNode::Type::kNone;  // no word at all: matches nothing, as "match" does
@@ -321,7 +308,7 @@ class Parser {
     std::vector<std::string> tokens;
     Analyze(Analyzer::kStandard, text, &tokens);
     if (!name_columns.empty() && !tokens.empty()) {
-      node.name_fts = ColumnFilter(name_columns) + " : " + Phrase(tokens);
+      node.name_fts = ColumnFilter(name_columns) + " : " + FtsPhrase(tokens);
       node.exact_name_tokens = tokens;
     }
     if (!negated) AddHighlight(text);
@@ -391,9 +378,9 @@ class Parser {
     if (tokens.empty()) return QueryNode{};  // every value starts with ""
     QueryNode node;
     node.type = columns.empty() ? QueryNode::Type::kNone : QueryNode::Type::kText;
-    node.fts = ColumnFilter(columns) + " : " + Phrase(tokens) + " *";
+    node.fts = ColumnFilter(columns) + " : " + FtsPhrase(tokens) + " *";
     const std::vector<std::string> name_columns = NameWordColumns(field);
-    if (!name_columns.empty()) node.name_fts = ColumnFilter(name_columns) + " : " + Phrase(tokens) + " *";
+    if (!name_columns.empty()) node.name_fts = ColumnFilter(name_columns) + " : " + FtsPhrase(tokens) + " *";
     return node;
   }
 
@@ -464,6 +451,18 @@ const QueryNode* FindRanked(const QueryNode& node) {
 std::string JsonField(int code) { return "corv_field(d.key, d.doc, " + std::to_string(code) + ")"; }
 
 }  // namespace
+
+std::string FtsPhrase(const std::vector<std::string>& tokens) {
+  std::string out = "\"";
+  for (size_t i = 0; i < tokens.size(); ++i) {
+    if (i > 0) out += ' ';
+    for (const char c : tokens[i]) {
+      out += c;
+      if (c == '"') out += '"';
+    }
+  }
+  return out + "\"";
+}
 
 std::string PrefixUpperBound(const std::string& prefix) {
   std::string bound = prefix;

@@ -70,6 +70,9 @@ class Query {
   std::set<std::string> highlight_;
 };
 
+// One token or phrase in the full-text index's expression syntax, quotes doubled.
+std::string FtsPhrase(const std::vector<std::string>& tokens);
+
 // The exclusive upper bound of keys that start with `prefix` (empty when
 // there is none: the prefix is all 0xFF bytes).
 std::string PrefixUpperBound(const std::string& prefix);

@@ -30,18 +30,6 @@ bool IsExactName(const std::string& name, const std::vector<std::string>& words)
          std::equal(words.begin(), words.end(), tokens.begin());
 }
 
-std::string Quoted(const std::vector<std::string>& tokens) {
-  std::string out = "\"";
-  for (size_t i = 0; i < tokens.size(); ++i) {
-    if (i > 0) out += ' ';
-    for (const char c : tokens[i]) {
-      out += c;
-      if (c == '"') out += '"';
-    }
-  }
-  return out + "\"";
-}
-
 }  // namespace
 
 NameTiers NameTiers::Find(Database& reader, const Query& query, const IndexSchema& schema) {
@@ -63,7 +51,7 @@ NameTiers NameTiers::Find(Database& reader, const Query& query, const IndexSchem
     auto begins = reader.Prepare("SELECT d.rowid, corv_field(d.key, d.doc, " + std::to_string(field->code) +
                                  ") FROM docs d WHERE d.rowid IN (SELECT rowid FROM fts_text WHERE fts_text MATCH ?) LIMIT " +
                                  std::to_string(kMaxExactChecks));
-    begins->BindText(1, "{" + field->Column() + "} : ^ " + Quoted(words));
+    begins->BindText(1, "{" + field->Column() + "} : ^ " + FtsPhrase(words));
     while (begins->Step()) {
       if (IsExactName(begins->Text(1), words)) tiers.exact_.insert(begins->Int(0));
     }

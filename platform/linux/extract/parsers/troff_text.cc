@@ -21,6 +21,19 @@ bool CarriesText(const std::string& macro) {
   return false;
 }
 
+// Moves `i` (at the letter after the backslash) past the escape's name:
+// "(xx" (two letters), "[name]" or one letter.
+void SkipEscapeName(const std::string& line, size_t* i) {
+  if (*i + 1 < line.size() && line[*i + 1] == '(') {
+    *i += 3;
+  } else if (*i + 1 < line.size() && line[*i + 1] == '[') {
+    const size_t close = line.find(']', *i + 1);
+    *i = close == std::string::npos ? line.size() : close;
+  } else {
+    *i += 1;
+  }
+}
+
 // A line's text with the escapes resolved: font changes vanish, \- and
 // \(xx become their characters' nearest plain forms, a comment ends it.
 std::string Unescape(const std::string& line) {
@@ -38,14 +51,8 @@ std::string Unescape(const std::string& line) {
       case '&': case '%': case '|': case '^': case ':': case 'c': break;
       case ' ': case '~': case '0': out += ' '; break;
       case 'f':  // \fB, \f(CW, \f[BI]
-        if (i + 1 < line.size() && line[i + 1] == '(') {
-          i += 3;
-        } else if (i + 1 < line.size() && line[i + 1] == '[') {
-          const size_t close = line.find(']', i + 1);
-          i = close == std::string::npos ? line.size() : close;
-        } else {
-          i += 1;
-        }
+      case '*':  // a string: \*(xx, \*[name], \*x
+        SkipEscapeName(line, &i);
         break;
       case '(':  // \(em, \(co: a special character, read as a blank
         i += 2;
@@ -57,16 +64,6 @@ std::string Unescape(const std::string& line) {
         out += ' ';
         break;
       }
-      case '*':  // a string: \*(xx, \*[name], \*x
-        if (i + 1 < line.size() && line[i + 1] == '(') {
-          i += 3;
-        } else if (i + 1 < line.size() && line[i + 1] == '[') {
-          const size_t close = line.find(']', i + 1);
-          i = close == std::string::npos ? line.size() : close;
-        } else {
-          i += 1;
-        }
-        break;
       case 's':  // \s+2, \s-1, \s0: size changes
         if (i + 1 < line.size() && (line[i + 1] == '+' || line[i + 1] == '-')) ++i;
         while (i + 1 < line.size() && isdigit(static_cast<unsigned char>(line[i + 1]))) ++i;
