@@ -2,6 +2,7 @@
 
 #include <utf8proc.h>
 
+#include <algorithm>
 #include <cstdint>
 
 namespace corvlumex {
@@ -106,11 +107,12 @@ bool IsAsciiLowerOrDigit(char c) { return (c >= 'a' && c <= 'z') || (c >= '0' &&
 }  // namespace
 
 void AddWordParts(std::string_view word, std::vector<std::string>* tokens) {
-  std::vector<std::string_view> parts;
+  std::vector<std::string_view> parts;  // allocated only for a word that has parts
+  bool split = false;
   size_t start = 0;
-  for (size_t i = 0; i <= word.size(); ++i) {
+  for (size_t i = 0; i < word.size(); ++i) {
     bool cut_before = false, skip = false;
-    if (i == word.size() || word[i] == '_') {
+    if (word[i] == '_') {
       skip = true;
     } else if (i > start && IsAsciiUpper(word[i])) {
       // "readFile": a capital after a small letter or digit starts a part;
@@ -124,11 +126,13 @@ void AddWordParts(std::string_view word, std::vector<std::string>* tokens) {
       }
     }
     if (skip || cut_before) {
+      split = true;
       if (i > start) parts.push_back(word.substr(start, i - start));
       start = skip ? i + 1 : i;
     }
   }
-  if (parts.empty() || (parts.size() == 1 && parts[0].size() == word.size())) return;  // a plain word
+  if (!split) return;  // a plain word
+  if (start < word.size()) parts.push_back(word.substr(start));
   for (const std::string_view part : parts) tokens->push_back(Fold(part, FoldMode::kSearch));
 }
 
@@ -171,6 +175,15 @@ void Analyze(Analyzer analyzer, std::string_view text, std::vector<std::string>*
     const std::string folded = Fold(text, FoldMode::kSearch);
     const std::string_view view(folded);
     SplitRuns(view, WhitespaceKind, [&](size_t begin, size_t end) { tokens->emplace_back(view.substr(begin, end - begin)); });
+    return;
+  }
+  if (text.find('_') == std::string_view::npos &&
+      std::none_of(text.begin(), text.end(), [](char c) { return IsAsciiUpper(c); })) {
+    // No word can have parts: fold once and split, which costs less than
+    // folding word by word and gives the same words.
+    const std::string folded = Fold(text, FoldMode::kSearch);
+    const std::string_view view(folded);
+    SplitRuns(view, StandardKind, [&](size_t begin, size_t end) { tokens->emplace_back(view.substr(begin, end - begin)); });
     return;
   }
   // Words are found before folding: the case of the letters marks where a
