@@ -1,7 +1,7 @@
 // End-to-end figures of corvelasticd on a private socket: ingest through the
 // library's path (one connection per request, a commit per 1,000 documents),
-// name-substring and word searches through the socket with the access
-// filter of an ordinary user, a prefix delete of 10% of the documents, the
+// name-substring, word, phrase, prefix and filtered searches through the
+// socket with the access filter of an ordinary user, a prefix delete of 10% of the documents, the
 // daemon's peak memory and the database size against the text indexed.
 // `--commit-every 0` commits once at the end, as the first index of a folder
 // does; the index folder's size is sampled during the ingest, so its peak
@@ -24,6 +24,7 @@
 #include <chrono>
 #include <cstring>
 #include <fstream>
+#include <functional>
 #include <iostream>
 #include <iterator>
 #include <random>
@@ -314,7 +315,7 @@ int main(int argc, char** argv) {
   if (!options.reuse) Command("index_create", create);
 
   Words words;
-  std::vector<std::string> names;
+  std::vector<std::string> names, phrases;
   long long raw_json = 0, raw_text = 0;
   const auto ingest_start = Clock::now();
   const double client_cpu_start = CpuSeconds(getpid());
@@ -345,7 +346,10 @@ int main(int argc, char** argv) {
     doc["CORVMDTextContent"] = text;
     raw_json += static_cast<long long>(JsonToString(doc).size());
     raw_text += static_cast<long long>(path.size() * 2 + name.size() * 2 + 3 + text.size());
-    if (i % 997 == 0) names.push_back(name);
+    if (i % 997 == 0) {
+      names.push_back(name);
+      phrases.push_back(text.substr(0, text.find(' ', text.find(' ') + 1)));  // the first two words
+    }
     Json::Value data;
     data["doc_id"] = path;
     data["data"] = doc;
@@ -377,18 +381,24 @@ int main(int argc, char** argv) {
   const double restart_seconds = std::chrono::duration<double>(Clock::now() - restart_start).count();
 
   // Queries: substrings from the middle of names, and words of middling frequency.
-  std::vector<std::string> substrings, terms;
+  std::vector<std::string> substrings, terms, prefixes;
   for (int q = 0; q < options.queries; ++q) {
     const std::string& name = names[static_cast<size_t>(q) % names.size()];
     substrings.push_back(name.substr(2, 5));
     terms.push_back(words.list[1000 + static_cast<size_t>(q) * 37 % 20000]);
+    prefixes.push_back(terms.back().substr(0, 4));
   }
-  auto timed = [&](const std::vector<std::string>& texts, const char* field) {
+  const auto clause = [](const char* kind, const char* field, const std::string& text) {
+    Json::Value qsl;
+    qsl[kind][field] = text;
+    return qsl;
+  };
+  auto timed = [&](const std::vector<std::string>& texts, const std::function<Json::Value(const std::string&)>& qsl) {
     return AsOrdinaryUser([&] {
       std::vector<double> ms;
       for (const std::string& text : texts) {
         Json::Value data;
-        data["query"]["qsl"]["match"][field] = text;
+        data["query"]["qsl"] = qsl(text);
         data["size"] = 20;
         data["load_field"].append("CORVMDFSName");
         Json::Value request;
@@ -407,10 +417,31 @@ int main(int argc, char** argv) {
       return ms;
     });
   };
-  std::vector<double> name_raw = timed(substrings, "CORVMDSearchFileName");
-  std::vector<double> word_raw = timed(terms, "_all");
+  std::vector<double> name_raw = timed(substrings, [&](const std::string& t) { return clause("match", "CORVMDSearchFileName", t); });
+  std::vector<double> word_raw = timed(terms, [&](const std::string& t) { return clause("match", "_all", t); });
+  std::vector<double> phrase_raw = timed(phrases, [&](const std::string& t) { return clause("match_phrase", "_all", t); });
+  std::vector<double> prefix_raw = timed(prefixes, [&](const std::string& t) { return clause("prefix", "_all", t); });
+  // A word with the filters people add: a size and a date range.
+  std::vector<double> filtered_raw = timed(terms, [&](const std::string& t) {
+    Json::Value qsl;
+    qsl["bool"]["must"].append(clause("match", "_all", t));
+    Json::Value size, date;
+    size["range"]["CORVMDFSSize"]["lt"] = 500000;
+    date["range"]["CORVMDFSContentChangeDate"]["gte"] = 1600000000 + options.docs / 2;
+    qsl["bool"]["filter"].append(size);
+    qsl["bool"]["filter"].append(date);
+    return qsl;
+  });
   const double search_load = LoadAverage();
-  QueryFigures names_found = Split(name_raw), words_found = Split(word_raw);
+  QueryFigures names_found = Split(name_raw), words_found = Split(word_raw), phrases_found = Split(phrase_raw),
+               prefixes_found = Split(prefix_raw), filtered_found = Split(filtered_raw);
+  const auto print_searches = [&] {
+    names_found.Print("name substring search");
+    words_found.Print("word search");
+    phrases_found.Print("phrase search (two words)");
+    prefixes_found.Print("prefix search (4 letters)");
+    filtered_found.Print("word search with size and date filters");
+  };
 
   const auto print_ingest = [&] {
     if (options.reuse) return;  // nothing was ingested
@@ -424,8 +455,7 @@ int main(int argc, char** argv) {
     StopDaemon(daemon);
     std::cout << "documents: " << options.docs << "\n";
     print_ingest();
-    names_found.Print("name substring search");
-    words_found.Print("word search");
+    print_searches();
     std::cout << "load average after the searches: " << search_load << "\n";
     return 0;
   }
@@ -442,8 +472,7 @@ int main(int argc, char** argv) {
   std::cout << "documents: " << options.docs << "\n";
   print_ingest();
   std::cout << "reopening the index after a restart: " << restart_seconds << " s\n";
-  names_found.Print("name substring search");
-  words_found.Print("word search");
+  print_searches();
   std::cout << "load average after the searches: " << search_load << "\n";
   std::cout << "prefix delete of " << deleted["data"]["deleted"].asInt64() << " documents: " << delete_seconds << " s\n";
   std::cout << "peak memory of the daemon: " << peak_kb / 1024 << " MB\n";

@@ -202,6 +202,14 @@ const char kFileIndexMappingsText[] = R"json({
 		"CORVMDFSFileID": {
 			"analyzer": "keyword",
 			"_all": false
+		},
+		"CORVMDExtractionFailed": {
+			"type": "bool",
+			"_all": false
+		},
+		"CORVMDExtractionError": {
+			"analyzer": "keyword",
+			"_all": false
 		}
 	}
 })json";

@@ -12,6 +12,7 @@
 #include "programs/corvelasticd/document_codec.h"
 #include "programs/corvelasticd/index_files.h"
 #include "programs/corvelasticd/search_candidates.h"
+#include "programs/corvelasticd/search_ranking.h"
 #include "programs/corvelasticd/text_analysis.h"
 
 namespace corvlumex {
@@ -658,10 +659,14 @@ SearchResult IndexStore::Search(const Query& query, const SortSpec& sort, size_t
   std::vector<SqlValue> values;
   if (ranked) values.push_back(query.RankedExpression());
   query.Compile(ranked, &condition, &values);
-  const std::string from = ranked ? "(SELECT rowid, rank FROM fts_text WHERE fts_text MATCH ?) s JOIN docs d ON d.rowid = s.rowid"
+  const std::string rank_expression = WeightedRank(schema_);
+  const int recency_code = RecencyCode(schema_);
+  const std::string from = ranked ? "(SELECT rowid, " + rank_expression +
+                                        " AS rank FROM fts_text WHERE fts_text MATCH ?) s JOIN docs d ON d.rowid = s.rowid"
                                   : "docs d";
   std::string sort_expression = "NULL";
   std::string order = "d.key";
+  std::vector<SqlValue> select_values = values;
   if (ranked) {
     order = "s.rank, d.key";
   } else if (sort.by == SortSpec::By::kKey) {
@@ -671,9 +676,6 @@ SearchResult IndexStore::Search(const Query& query, const SortSpec& sort, size_t
     if (sort.text) sort_expression = "corv_fold(" + sort_expression + ")";
     order = sort_expression + (sort.descending ? " DESC" : "") + ", d.key";
   }
-  const std::string sql = "SELECT d.rowid, d.key, " + std::string(ranked ? "s.rank" : "0") + ", " + sort_expression +
-                          " FROM " + from + " WHERE " + condition + " ORDER BY " + order;
-
   std::unique_ptr<Database> reader = TakeReader();
   const bool ranked_alone = ranked && condition == "1";
   if (ranked_alone && !keys_.ready()) BuildKeyDirectory(*reader);
@@ -682,17 +684,34 @@ SearchResult IndexStore::Search(const Query& query, const SortSpec& sort, size_t
   // One read transaction: the hits, their documents and the count come from one snapshot.
   reader->Exec("BEGIN");
   try {
+    // The snapshot is taken by the first read, here: the key directory
+    // serves it when no commit began before that.
+    const NameTiers tiers = ranked ? NameTiers::Find(*reader, query, schema_) : NameTiers();
     // A word query alone (the usual search) is ordered from the full-text
     // index's scores; anything else by SQL.
     std::unique_ptr<SearchCandidates> candidates;
     if (ranked_alone) {
-      // The snapshot is taken by the first read, in the constructor: the
-      // directory serves it when no commit began before that.
-      candidates = std::make_unique<RankedMatchCandidates>(*reader, query.RankedExpression(), &keys_, keys_at);
+      candidates = std::make_unique<RankedMatchCandidates>(*reader, query.RankedExpression(), rank_expression, tiers,
+                                                           recency_code, &keys_, keys_at);
     } else {
+      if (ranked) {
+        // Exact names, then names holding the words, then the rest; newest first on ties.
+        std::string tier = "2";
+        if (!tiers.name_expression().empty()) {
+          std::string exact = "-1";
+          for (const int64_t rowid : tiers.exact()) exact += ", " + std::to_string(rowid);
+          tier = "CASE WHEN d.rowid IN (" + exact +
+                 ") THEN 0 WHEN d.rowid IN (SELECT rowid FROM fts_text WHERE fts_text MATCH ?) THEN 1 ELSE 2 END";
+          select_values.push_back(tiers.name_expression());
+        }
+        const std::string recency = recency_code >= 0 ? "corv_field(d.key, d.doc, " + std::to_string(recency_code) + ") DESC, " : "";
+        order = tier + ", s.rank, " + recency + "d.key";
+      }
+      const std::string sql = "SELECT d.rowid, d.key, " + std::string(ranked ? "s.rank" : "0") + ", " + sort_expression +
+                              " FROM " + from + " WHERE " + condition + " ORDER BY " + order;
       auto select = reader->Prepare(sql);
-      select->BindAll(values);
-      candidates = std::make_unique<StatementCandidates>(std::move(select), ranked);
+      select->BindAll(select_values);
+      candidates = std::make_unique<StatementCandidates>(std::move(select), ranked, &tiers);
     }
     std::vector<Hit> batch;
     std::vector<int64_t> rowids;

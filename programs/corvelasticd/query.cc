@@ -28,19 +28,6 @@ constexpr const char* kAllField = "_all";
 
 [[noreturn]] void Bad(const std::string& what) { throw DaemonError(kCodeBadQuery, "Bad query: " + what); }
 
-// One token or phrase in the index's expression syntax: quotes doubled.
-std::string Phrase(const std::vector<std::string>& tokens) {
-  std::string out = "\"";
-  for (size_t i = 0; i < tokens.size(); ++i) {
-    if (i > 0) out += ' ';
-    for (const char c : tokens[i]) {
-      out += c;
-      if (c == '"') out += '"';
-    }
-  }
-  return out + "\"";
-}
-
 std::string ColumnFilter(const std::vector<std::string>& columns) {
   std::string out = "{";
   for (size_t i = 0; i < columns.size(); ++i) out += (i > 0 ? " " : "") + columns[i];
@@ -180,6 +167,16 @@ class Parser {
     return groups;
   }
 
+  // The word columns of the file names searched by the catch-all field.
+  std::vector<std::string> NameWordColumns(const std::string& field) const {
+    std::vector<std::string> columns;
+    if (field != kAllField) return columns;
+    for (const FieldSpec* field_def : schema_.TextFields()) {
+      if (field_def->in_all && field_def->kind == FieldKind::kNgram) columns.push_back(field_def->Column());
+    }
+    return columns;
+  }
+
   // Every word (or, with "or", any word) must be found in one of the columns.
   QueryNode Words(const std::string& field, const std::string& text, bool any, bool negated) {
     const auto groups = ColumnsFor(field);
@@ -188,6 +185,8 @@ class Parser {
     std::vector<std::string> raw_words;
     ForEachBlankSeparated(CountText(text), &raw_words);
     size_t clause_words = 0;
+    const std::vector<std::string> name_columns = NameWordColumns(field);
+    std::vector<std::string> name_expressions, exact_tokens;
     for (const std::string& word : raw_words) {
       std::vector<std::string> alternatives;
       // A word is as many words as it analyzes to ("ac-3" is two): each is a look-up.
@@ -195,13 +194,19 @@ class Parser {
       for (const auto& group : groups) {
         size_t group_tokens = 0;
         for (const auto& tokens : AnalyzeQuery(group.first, word)) {
-          alternatives.push_back(ColumnFilter(group.second) + " : " + Phrase(tokens));
+          alternatives.push_back(ColumnFilter(group.second) + " : " + FtsPhrase(tokens));
           group_tokens += tokens.size();
         }
         most_tokens = std::max(most_tokens, group_tokens);
       }
       for (size_t i = 0; i < most_tokens; ++i) CountWords(++clause_words);
       if (alternatives.empty()) continue;
+      if (!name_columns.empty()) {
+        std::vector<std::string> tokens;
+        Analyze(Analyzer::kStandard, word, &tokens);
+        if (!tokens.empty()) name_expressions.push_back(ColumnFilter(name_columns) + " : " + FtsPhrase(tokens));
+        exact_tokens.insert(exact_tokens.end(), tokens.begin(), tokens.end());
+      }
       std::string expression = alternatives.size() == 1 ? alternatives[0] : "(";
       if (alternatives.size() > 1) {
         for (size_t i = 0; i < alternatives.size(); ++i) expression += (i > 0 ? " OR " : "") + alternatives[i];
@@ -218,6 +223,10 @@ class Parser {
     for (size_t i = 0; i < word_expressions.size(); ++i) {
       node.fts += (i > 0 ? (any ? " OR " : " AND ") : "") + word_expressions[i];
     }
+    for (size_t i = 0; i < name_expressions.size(); ++i) {
+      node.name_fts += (i > 0 ? (any ? " OR " : " AND ") : "") + name_expressions[i];
+    }
+    if (!any) node.exact_name_tokens = std::move(exact_tokens);
     if (!negated) AddHighlight(text);
     return node;
   }
@@ -244,7 +253,7 @@ class Parser {
     const std::string folded = Fold(text, FoldMode::kSearch);
     if (folded.empty()) return QueryNode{};  // every name holds the empty text
     if (CodePointCount(folded) >= 3) {
-      node.fts = "{" + field_def.NameColumn() + "} : " + Phrase({folded});
+      node.fts = "{" + field_def.NameColumn() + "} : " + FtsPhrase({folded});
     } else {
       node.substring = folded;
     }
@@ -276,7 +285,7 @@ class Parser {
       return node;
     }
     node.type = QueryNode::Type::kText;
-    node.fts = "{" + field_def.Column() + "} : " + Phrase(tokens);
+    node.fts = "{" + field_def.Column() + "} : " + FtsPhrase(tokens);
     return node;
   }
 
@@ -315,6 +324,7 @@ class Parser {
     } else {
       text = ScalarText(field, argument);
     }
+    CountText(text);
     if (field != kAllField) {
       const FieldSpec& field_def = Field(field);
       if (IsKey(field_def)) return KeyIn({text});
@@ -326,17 +336,28 @@ class Parser {
       }
     }
     std::vector<std::string> alternatives;
+    size_t most_tokens = 0;
     for (const auto& group : ColumnsFor(field)) {
       std::vector<std::string> tokens;
       Analyze(group.first, text, &tokens);
-      if (!tokens.empty()) alternatives.push_back(ColumnFilter(group.second) + " : " + Phrase(tokens));
+      most_tokens = std::max(most_tokens, tokens.size());
+      if (!tokens.empty()) alternatives.push_back(ColumnFilter(group.second) + " : " + FtsPhrase(tokens));
     }
+    // A phrase of n words is n look-ups, bounded like the words of "match".
+    for (size_t i = 0; i < most_tokens; ++i) CountWords(i + 1);
     QueryNode node;
     node.type = QueryNode::Type::kNone;  // no word at all: matches nothing, as "match" does
     if (alternatives.empty()) return node;
     node.type = QueryNode::Type::kText;
     for (size_t i = 0; i < alternatives.size(); ++i) node.fts += (i > 0 ? " OR " : "") + alternatives[i];
     if (alternatives.size() > 1) node.fts = "(" + node.fts + ")";
+    const std::vector<std::string> name_columns = NameWordColumns(field);
+    std::vector<std::string> tokens;
+    Analyze(Analyzer::kStandard, text, &tokens);
+    if (!name_columns.empty() && !tokens.empty()) {
+      node.name_fts = ColumnFilter(name_columns) + " : " + FtsPhrase(tokens);
+      node.exact_name_tokens = tokens;
+    }
     if (!negated) AddHighlight(text);
     return node;
   }
@@ -415,7 +436,9 @@ class Parser {
     for (size_t i = 1; i <= tokens.size(); ++i) CountWords(i);
     QueryNode node;
     node.type = columns.empty() ? QueryNode::Type::kNone : QueryNode::Type::kText;
-    node.fts = ColumnFilter(columns) + " : " + Phrase(tokens) + " *";
+    node.fts = ColumnFilter(columns) + " : " + FtsPhrase(tokens) + " *";
+    const std::vector<std::string> name_columns = NameWordColumns(field);
+    if (!name_columns.empty()) node.name_fts = ColumnFilter(name_columns) + " : " + FtsPhrase(tokens) + " *";
     return node;
   }
 
@@ -488,6 +511,18 @@ const QueryNode* FindRanked(const QueryNode& node) {
 std::string JsonField(int code) { return "corv_field(d.key, d.doc, " + std::to_string(code) + ")"; }
 
 }  // namespace
+
+std::string FtsPhrase(const std::vector<std::string>& tokens) {
+  std::string out = "\"";
+  for (size_t i = 0; i < tokens.size(); ++i) {
+    if (i > 0) out += ' ';
+    for (const char c : tokens[i]) {
+      out += c;
+      if (c == '"') out += '"';
+    }
+  }
+  return out + "\"";
+}
 
 std::string PrefixUpperBound(const std::string& prefix) {
   std::string bound = prefix;

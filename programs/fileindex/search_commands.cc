@@ -185,6 +185,39 @@ void AddSearchCommands(CLI::App& app, Output& output) {
   });
 
   static struct {
+    std::vector<std::string> shares;
+    unsigned from = 0;
+    unsigned size = 100;
+  } failed;
+  CLI::App* failed_cmd = app.add_subcommand(
+      "failed", "files whose content could not be read, with the reason (they are still found by name and path)");
+  failed_cmd->add_option("--share", failed.shares, "only in this share (repeatable)")->allow_extra_args(false);
+  failed_cmd->add_option("--from", failed.from, "skip this many files (paging)");
+  failed_cmd->add_option("--size", failed.size, "show at most this many files (1-1000)")->check(CLI::Range(1, 1000));
+  failed_cmd->callback([&output] {
+    Json::Value data(Json::objectValue);
+    for (const std::string& share : failed.shares) data["ids"].append(elastic::GetFileIndexID(share));
+    data["query"]["qsl"]["term"][elastic::kFieldExtractionFailed] = true;
+    data["from"] = failed.from;
+    data["size"] = failed.size;
+    data["track_total"] = true;
+    data["load_field"].append(elastic::kFieldPath);
+    data["load_field"].append(elastic::kFieldExtractionError);
+    Json::Value request(Json::objectValue);
+    request["command"] = "search";
+    request["data"] = data;
+    Json::Value answer;
+    elastic::SendRequestWithRetry(answer, request);
+    if (output.json) return PrintJson(answer["data"]);
+    std::vector<std::vector<std::string>> rows;
+    for (const Json::Value& hit : answer["data"]["hits"]) {
+      rows.push_back({hit["fields"][elastic::kFieldPath].asString(), hit["fields"][elastic::kFieldExtractionError].asString()});
+    }
+    if (!rows.empty()) PrintTable({"PATH", "REASON"}, rows);
+    std::cout << answer["data"]["total"].asInt64() << " file(s) whose content could not be read\n";
+  });
+
+  static struct {
     std::string file;
     bool meta = false;
   } extract;

@@ -37,8 +37,7 @@ void ProgressBoard::Done(const std::string& share, uint64_t count) {
 void ProgressBoard::Failed(const std::string& share, const std::string& path, const std::string& reason) {
   std::lock_guard<std::mutex> lock(mutex_);
   Share& entry = shares_[share];
-  ++entry.total_failed;
-  if (path.empty()) return;
+  entry.failed.insert(path);
   entry.failures.push_back({path, reason, static_cast<long long>(time(nullptr))});
   if (entry.failures.size() > kKeptFailures) entry.failures.pop_front();
 }
@@ -79,7 +78,7 @@ Json::Value ProgressBoard::Snapshot() const {
     share["done"] = static_cast<Json::UInt64>(entry.done);
     share["todo"] = static_cast<Json::UInt64>(entry.todo);
     share["total_done"] = static_cast<Json::UInt64>(entry.total_done);
-    share["total_failed"] = static_cast<Json::UInt64>(entry.total_failed);
+    share["total_failed"] = static_cast<Json::UInt64>(entry.failed.size());
     share["total_extracted"] = static_cast<Json::UInt64>(entry.total_extracted);
     share["deferred"] = static_cast<Json::UInt64>(entry.deferred);
     double rate = 0;

@@ -9,6 +9,7 @@
 #include <deque>
 #include <map>
 #include <mutex>
+#include <set>
 #include <string>
 
 namespace corvlumex {
@@ -32,9 +33,11 @@ class ProgressBoard {
   // More files to do in this batch (a folder walk found them).
   void AddTodo(const std::string& share, uint64_t count);
   void Done(const std::string& share, uint64_t count = 1);
-  // A file that could not be indexed; the latest kKeptFailures of each
-  // share are kept (path, reason, when) for the administrators' list.
-  void Failed(const std::string& share, const std::string& path = "", const std::string& reason = "");
+  // Indexing `path` failed. "total_failed" counts files, not attempts: a
+  // file that fails again on every retry counts once. The latest
+  // kKeptFailures of each share are kept (path, reason, when) for the
+  // administrators' list.
+  void Failed(const std::string& share, const std::string& path, const std::string& reason = "");
   static constexpr size_t kKeptFailures = 100;
   // One file was extracted and stored (a full upsert or an attribute update).
   void Extracted(const std::string& share);
@@ -52,7 +55,8 @@ class ProgressBoard {
     std::string state = kStateIdle;
     std::string detail;
     uint64_t done = 0, todo = 0;
-    uint64_t total_done = 0, total_failed = 0, total_extracted = 0;
+    uint64_t total_done = 0, total_extracted = 0;
+    std::set<std::string> failed;
     size_t deferred = 0;
     Clock::time_point batch_start{};
     Clock::time_point last_commit{};

@@ -12,6 +12,7 @@
 #include "fileindex/custom_event.h"
 #include "fileindex/elastic/comm.h"
 #include "fileindex/elastic/elastic_control.h"
+#include "fileindex/elastic/schema.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/optree.h"
@@ -37,7 +38,8 @@ long long Now() { return static_cast<long long>(time(nullptr)); }
 }  // namespace
 
 ShareWorker::ShareWorker(const std::string& share, WorkerOptions options, PauseState& pause, ProgressBoard& progress)
-    : share_(share), options_(options), pause_(pause), progress_(progress) {
+    : share_(share), options_(options), pause_(pause), progress_(progress),
+      suggestions_(options.suggestion_interval) {
   // An unknown share throws here (Error 800): no worker for it.
   queue_path_ = sdk::SDKShare(share).GetQueuePath();
   watch_ = std::make_unique<QueueWatch>(queue_path_, options_.fallback_poll);
@@ -104,7 +106,11 @@ void ShareWorker::Run() {
       OnFailure(Error(kErrorUnexpected, error.what()), backoff);
       continue;
     }
-    if (worked) continue;
+    if (worked) {
+      if (suggestions_.DueAfterWork(SuggestionSchedule::Clock::now())) RebuildSuggestions();
+      continue;
+    }
+    if (suggestions_.DueAtRest()) RebuildSuggestions();
     progress_.SetState(share_, kStateIdle);
     progress_.SetDeferred(share_, settle_->DeferredCount());
     const auto now = SettleTracker::Clock::now();
@@ -118,6 +124,18 @@ void ShareWorker::Run() {
     watch_->Wait(timeout);
   }
   progress_.SetState(share_, kStateStopped);
+}
+
+void ShareWorker::RebuildSuggestions() {
+  try {
+    fileindex::elastic::UpdateTermSuggestion(sdk::SDKShare(share_).GetDBName(),
+                                             {fileindex::elastic::kFieldSearchFileName});
+  } catch (const Error& error) {
+    // Suggestions are a convenience: the next round tries again.
+    CORV_LOG("suggestions of share %s not rebuilt: code=%d, reason=%s", share_.c_str(), error.code,
+             error.reason.c_str());
+  }
+  suggestions_.Rebuilt(SuggestionSchedule::Clock::now());
 }
 
 bool ShareWorker::IsVolumeFull(const Error& error) const {

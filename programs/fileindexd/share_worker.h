@@ -23,6 +23,7 @@
 #include "programs/fileindexd/progress.h"
 #include "programs/fileindexd/queue_watch.h"
 #include "programs/fileindexd/settle_tracker.h"
+#include "programs/fileindexd/suggestion_schedule.h"
 
 namespace corvlumex {
 namespace fileindexd {
@@ -39,6 +40,7 @@ struct WorkerOptions {
   FreshLaneOptions fresh;
   SettleOptions settle;
   unsigned walk_threads = 2;  // threads storing the files a folder walk finds
+  std::chrono::milliseconds suggestion_interval{std::chrono::minutes(5)};  // see suggestion_schedule.h
 };
 
 class ShareWorker {
@@ -77,6 +79,8 @@ class ShareWorker {
   // A failure because the share's volume is full (the share is then marked
   // for a full reindex).
   bool IsVolumeFull(const Error& error) const;
+  // Rebuilds the share's name suggestions; a failure is logged, not fatal.
+  void RebuildSuggestions();
 
   std::string share_;
   WorkerOptions options_;
@@ -85,6 +89,7 @@ class ShareWorker {
   std::string queue_path_;
   std::unique_ptr<QueueWatch> watch_;
   std::unique_ptr<SettleTracker> settle_;
+  SuggestionSchedule suggestions_;
   std::atomic<bool> stopping_{false};
   std::atomic<bool> finished_{false};
   // A taken-over queue was left by an earlier run (a crash or a stop in the

@@ -261,6 +261,49 @@ TEST_F(DaemonInputTest, TheSearchLanguage) {
   EXPECT_NE(ranked["data"]["hits"][0]["highlight"].asString().find("evenue]"), std::string::npos);
 }
 
+TEST_F(DaemonInputTest, WordSearchesRankNamesFirstThenContentThenNewer) {
+  const auto add = [&](const std::string& path, const std::string& text, long long date, bool dir) {
+    Json::Value data;
+    data["doc_id"] = path;
+    data["data"] = FileDocument(path, text, 100);
+    data["data"]["CORVMDFSContentChangeDate"] = static_cast<Json::Int64>(date);
+    data["data"]["CORVMDIsDir"] = dir;
+    ASSERT_TRUE(Run("document_upsert_by_id", data)["success"].asBool());
+  };
+  // Keys in reverse of the expected order, so key order cannot pass for ranking.
+  add("/v/s/a/recipes/pilaf.txt", "saffron rice with saffron and more saffron", 1000, false);
+  add("/v/s/b/old copy.txt", "a pinch of saffron in warm milk", 1000, false);
+  add("/v/s/c/new copy.txt", "a pinch of saffron in warm milk", 2000, false);
+  add("/v/s/d/Saffron Rice Notes.md", "notes", 500, false);
+  add("/v/s/e/saffron.txt", "", 10, false);
+  add("/v/s/f/Saffron", "", 5, true);  // a folder counts as a result
+  Commit();
+  const std::vector<std::string> expected = {"/v/s/f/Saffron",           "/v/s/e/saffron.txt",   "/v/s/d/Saffron Rice Notes.md",
+                                             "/v/s/a/recipes/pilaf.txt", "/v/s/c/new copy.txt", "/v/s/b/old copy.txt"};
+  // Alone (ordered from the full-text scores) and with a filter (ordered by SQL): one order.
+  for (const char* qsl : {R"({"match": {"_all": "saffron"}})",
+                          R"({"bool": {"must": [{"match": {"_all": "saffron"}}], "filter": [{"prefix": {"CORVMDPath": "/v/s/"}}]}})"}) {
+    const Json::Value answer = Search(qsl);
+    std::vector<std::string> order;
+    for (const Json::Value& hit : answer["data"]["hits"]) order.push_back(hit["doc_id"].asString());
+    EXPECT_EQ(order, expected) << qsl;
+  }
+  // An exact name beats a shorter name that merely holds the words.
+  add("/v/s/g/rice saffron", "", 1, false);
+  add("/v/s/h/saffron rice.txt", "", 1, false);
+  Commit();
+  const Json::Value exact = Search(R"({"match": {"_all": "saffron rice"}})");
+  ASSERT_GE(exact["data"]["hits"].size(), 2u);
+  EXPECT_EQ(exact["data"]["hits"][0]["doc_id"].asString(), "/v/s/h/saffron rice.txt");
+  // A phrase and a prefix rank the same way: names first.
+  for (const char* qsl : {R"({"match_phrase": {"_all": "saffron rice"}})", R"({"prefix": {"_all": "saffr"}})"}) {
+    const Json::Value answer = Search(qsl);
+    ASSERT_GE(answer["data"]["hits"].size(), 2u) << qsl;
+    const std::string first = answer["data"]["hits"][0]["doc_id"].asString();
+    EXPECT_NE(first.substr(first.rfind('/')).find("affron"), std::string::npos) << qsl << ": " << first;
+  }
+}
+
 // Runs `body` in a child that has become `user`; returns what it printed.
 std::string AsUser(const struct passwd& user, const std::function<std::string()>& body) {
   int pipe_fds[2];

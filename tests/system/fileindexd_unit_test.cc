@@ -27,6 +27,7 @@
 #include "fileindex/frame_reader.h"
 #include "tests/support/child_process.h"
 #include "tests/support/frame_client.h"
+#include "programs/fileindexd/suggestion_schedule.h"
 #include "tests/support/log_capture.h"
 
 namespace corvlumex {
@@ -370,7 +371,8 @@ TEST(ProgressBoardTest, CountsPerShareAndResetsAtTheEndOfABatch) {
   board.StartBatch("music", 10);
   board.Done("music", 4);
   board.AddTodo("music", 5);
-  board.Failed("music");
+  board.Failed("music", "/v/music/a.mp3");
+  board.Failed("music", "/v/music/a.mp3");  // a retry of the same file
   board.Extracted("music");
   Json::Value snapshot = board.Snapshot();
   EXPECT_EQ(snapshot["music"]["state"].asString(), "indexing");
@@ -387,6 +389,30 @@ TEST(ProgressBoardTest, CountsPerShareAndResetsAtTheEndOfABatch) {
   EXPECT_EQ(snapshot["music"]["eta_seconds"].asDouble(), -1.0);
   board.Remove("music");
   EXPECT_FALSE(board.Snapshot().isMember("music"));
+}
+
+
+TEST(SuggestionScheduleTest, AtMostOncePerIntervalWhileWorkingAndOnceAtRest) {
+  using Clock = SuggestionSchedule::Clock;
+  using std::chrono::minutes;
+  SuggestionSchedule schedule(minutes(5));
+  const Clock::time_point t0 = Clock::now();
+  EXPECT_FALSE(schedule.DueAtRest());  // nothing indexed yet
+  // A long round: commits every minute; a rebuild after 5 minutes, not before.
+  const struct {
+    int minute;
+    bool due;
+  } commits[] = {{0, false}, {1, false}, {4, false}, {5, true}, {6, false}, {9, false}, {10, true}};
+  for (const auto& commit : commits) {
+    const bool due = schedule.DueAfterWork(t0 + minutes(commit.minute));
+    EXPECT_EQ(due, commit.due) << "minute " << commit.minute;
+    if (due) schedule.Rebuilt(t0 + minutes(commit.minute));
+  }
+  EXPECT_FALSE(schedule.DueAtRest());  // the last commit's rebuild covers it
+  EXPECT_FALSE(schedule.DueAfterWork(t0 + minutes(11)));
+  EXPECT_TRUE(schedule.DueAtRest());  // the end of the round brings the last files in
+  schedule.Rebuilt(t0 + minutes(11));
+  EXPECT_FALSE(schedule.DueAtRest());  // and only once
 }
 
 }  // namespace

@@ -20,6 +20,7 @@
 #include "platform/linux/extract/parsers/extract_content.h"
 #include "platform/linux/extract/parsers/file_bytes.h"
 #include "platform/linux/extract/parsers/formats.h"
+#include "platform/linux/extract/parsers/text_sink.h"
 #include "platform/linux/extract/worker_protocol.h"
 
 namespace corvlumex {
@@ -98,6 +99,14 @@ Json::Value Failure(const std::string& reason) {
   return reply;
 }
 
+// The text cap the request asks for; the default when it names none, and
+// never more than the largest setting (the reply must fit a frame).
+size_t TextCap(const Json::Value& request) {
+  const Json::Value& cap = request["text_cap"];
+  if (!cap.isUInt64() || cap.asUInt64() == 0) return kTextContentCap;
+  return static_cast<size_t>(std::min<Json::UInt64>(cap.asUInt64(), static_cast<Json::UInt64>(kMaxTextCapMb) << 20));
+}
+
 Json::Value Answer(int fd, const Json::Value& request, const WorkerLimits& limits) {
   if (fd < 0) return Failure("the request carried no file descriptor");
   if (!request.isObject() || !request["name"].isString() || !(request["need_meta"].isNull() || request["need_meta"].isBool())) {
@@ -106,7 +115,7 @@ Json::Value Answer(int fd, const Json::Value& request, const WorkerLimits& limit
   Json::Value reply(Json::objectValue);
   try {
     RunTestHook(limits);
-    reply["fields"] = ExtractContent(fd, request["name"].asString(), request["need_meta"].asBool());
+    reply["fields"] = ExtractContent(fd, request["name"].asString(), request["need_meta"].asBool(), TextCap(request));
     reply["ok"] = true;
   } catch (const std::bad_alloc&) {
     reply = Failure("out of memory (the worker may use " + std::to_string(limits.memory_mb) + " MiB)");
