@@ -1,9 +1,13 @@
 #include "common/log.h"
 
+#include <sys/stat.h>
 #include <syslog.h>
 
 #include <cstdarg>
+#include <cstdio>
+#include <cstdlib>
 #include <cstring>
+#include <ctime>
 #include <mutex>
 
 namespace corvlumex {
@@ -49,7 +53,46 @@ void WriteWithErrno(std::string line, int saved_errno) {
   errno = 0;
 }
 
+// systemd names the journal stream it connected to standard error as
+// "<device>:<inode>" in JOURNAL_STREAM; the journal stamps lines itself.
+bool StderrIsJournal() {
+  const char* stream = getenv("JOURNAL_STREAM");
+  if (stream == nullptr) return false;
+  unsigned long long device = 0, inode = 0;
+  struct stat st;
+  if (sscanf(stream, "%llu:%llu", &device, &inode) != 2 || fstat(STDERR_FILENO, &st) != 0) return false;
+  return st.st_dev == device && st.st_ino == inode;
+}
+
 }  // namespace
+
+std::string IsoTimeStamp(std::chrono::system_clock::time_point when) {
+  const auto since_epoch = when.time_since_epoch();
+  const time_t seconds = static_cast<time_t>(std::chrono::duration_cast<std::chrono::seconds>(since_epoch).count());
+  const int millis =
+      static_cast<int>(std::chrono::duration_cast<std::chrono::milliseconds>(since_epoch).count() % 1000);
+  struct tm local;
+  localtime_r(&seconds, &local);
+  char date[32];
+  char offset[8];
+  strftime(date, sizeof(date), "%Y-%m-%dT%H:%M:%S", &local);
+  strftime(offset, sizeof(offset), "%z", &local);  // "+0100": ISO 8601 wants "+01:00"
+  return StringPrintf("%s.%03d%.3s:%s", date, millis < 0 ? 0 : millis, offset, offset + 3);
+}
+
+void LogToStderr(const std::string& program) {
+  const bool stamped = !StderrIsJournal();
+  SetLogSink([program, stamped](int, const std::string& line) {
+    const std::string text = (stamped ? IsoTimeStamp(std::chrono::system_clock::now()) + " " : std::string()) +
+                             program + ": " + line + "\n";
+    // One write per line, so lines of several threads never interleave.
+    const int saved_errno = errno;
+    if (write(STDERR_FILENO, text.data(), text.size()) < 0) {
+      // Nowhere left to say that a log line could not be written.
+    }
+    errno = saved_errno;
+  });
+}
 
 void SetLogSink(std::function<void(int, const std::string&)> sink) {
   std::lock_guard<std::mutex> guard(SinkMutex());

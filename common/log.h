@@ -5,6 +5,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <chrono>
 #include <functional>
 #include <string>
 
@@ -19,6 +20,17 @@ extern int log_level;
 
 // Receives every log line, already formatted; an empty function restores syslog.
 void SetLogSink(std::function<void(int priority, const std::string& line)> sink);
+
+// Sends every log line to standard error as "<time> <program>: <line>", the
+// time in ISO 8601 (IsoTimeStamp): a daemon run in the foreground, or with
+// its standard error in a file, must say when each thing happened; syslog
+// stamps its lines itself. Under systemd's journal, which stamps each line
+// too, the time is left out.
+void LogToStderr(const std::string& program);
+
+// The local time `when` in ISO 8601 to the millisecond, with the offset
+// from UTC: "2026-11-23T22:10:05.123+01:00".
+std::string IsoTimeStamp(std::chrono::system_clock::time_point when);
 
 // Writes one finished line to the sink (or syslog).
 void WriteLogLine(int priority, const std::string& line);

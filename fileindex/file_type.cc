@@ -41,7 +41,7 @@ const std::vector<Category>& Categories() {
       {kFileTypeVideo, "video",
        {"mp4", "m4v", "mkv", "avi", "mov", "qt", "wmv", "asf", "flv", "f4v", "webm", "mpg", "mpeg", "mpe", "m2v",
         "m2ts", "mts", "ts", "tp", "trp", "vob", "3gp", "3g2", "ogv", "rm", "rmvb", "divx", "dv", "mxf", "wtv"}},
-      {kFileTypeImage, "image",
+      {kFileTypeImage, "photo",
        {"jpg", "jpeg", "jpe", "jfif", "png", "gif", "bmp", "dib", "tif", "tiff", "webp", "heic", "heif", "hif",
         "avif", "jxl", "jp2", "j2k", "ico", "svg", "psd", "xcf", "tga", "pcx", "ppm", "pgm", "pbm", "pnm", "eps",
         // Camera RAW

@@ -23,10 +23,10 @@ FileType GetFileTypeByExtension(const std::string& extension);
 // Type of a path by its file name's extension, in any letter case.
 FileType GetFileTypeByFullPath(const std::string& full_path);
 
-// The category names "document", "audio", "video", "image" and "unknown".
+// The category names "document", "audio", "video", "photo" and "unknown".
 const char* FileTypeName(FileType type);
 
-// The type of a category name ("document", "audio", "video", "image");
+// The type of a category name ("document", "audio", "video", "photo");
 // false for any other name.
 bool GetFileTypeByCategory(const std::string& category, FileType* type);
 

@@ -75,6 +75,9 @@ void FolderUpsert(const Json::Value& folder_list, bool create, bool updater_mode
     reindex_list.push_back(folder_reindex);
   }
 
+  // The shares first, so that switching Spotlight on makes samba read
+  // them with the same reload.
+  UpdateSpotlightShares(folder_mgr);
   SetupRelatedServices(true);
   for (const std::string& share_name : touched_shares) {
     if (create && !folder_mgr_before.IsShareIndexed(share_name)) elastic::ShareIndexCreate(share_name);

@@ -113,6 +113,11 @@ bool QueueMgr::IsFullPathHasReindex(const std::string& full_path) {
   return FindQueue(covers, queue_path_) || FindQueue(covers, queue_path_tmp_);
 }
 
+bool QueueMgr::HasLostEvents() {
+  const auto lost = [](std::shared_ptr<Event> event) { return (event->event & kEventQueueCrash) != 0; };
+  return FindQueue(lost, queue_path_) || FindQueue(lost, queue_path_tmp_);
+}
+
 namespace {
 
 // Appends `lines` in one write; the caller holds the queue's lock. On failure

@@ -49,6 +49,11 @@ class QueueMgr {
   // itself or one of its ancestors.
   bool IsFullPathHasReindex(const std::string& full_path);
 
+  // A pending crash marker (live or temporary queue): events of the share
+  // were lost, and the whole share is (or is about to be) checked against
+  // the disk. Errors as for the scans above.
+  bool HasLostEvents();
+
   const std::string& GetQueuePath() const { return queue_path_; }
   const std::string& GetQueuePathTmp() const { return queue_path_tmp_; }
 

@@ -2,6 +2,9 @@
 
 #include <json/json.h>
 
+#include <set>
+#include <vector>
+
 #include "common/log.h"
 #include "fileindex/communication.h"
 #include "fileindex/folder_mgr.h"
@@ -14,13 +17,30 @@ namespace fileindex {
 
 void PrepareServices() {
   const FolderMgr folder_mgr;
-  SetupRelatedServices(!folder_mgr.Folders().empty());
+  // The share list is written while Spotlight is still off (or once it is
+  // off): samba re-reads its configuration once.
+  const bool enable = !folder_mgr.Folders().empty();
+  if (enable) UpdateSpotlightShares(folder_mgr);
+  SetupRelatedServices(enable);
+  if (!enable) UpdateSpotlightShares(folder_mgr);
+}
+
+void UpdateSpotlightShares(const FolderMgr& folder_mgr) {
+  const std::shared_ptr<platform::Platform> platform = platform::Current();
+  const std::set<std::string> indexed = folder_mgr.GetIndexedShares();
+  const int changed = platform->SMBSetSpotlightShares(std::vector<std::string>(indexed.begin(), indexed.end()));
+  if (changed < 0) {
+    CORV_LOG_PLATFORM_ERROR("CORVSMBSetSpotlightShares failed");
+  } else if (changed > 0 && platform->SMBIsEnableSpotlight() > 0 && 0 > platform->ServiceRestart(kSambaService)) {
+    CORV_LOG_PLATFORM_ERROR("KLIBServiceRestart failed");
+  }
 }
 
 void SetupRelatedServices(bool enable) {
   const std::shared_ptr<platform::Platform> platform = platform::Current();
-  // Spotlight follows whether anything is indexed; samba reads the switch
-  // only when it starts, so it is restarted after a change, and only then.
+  // Spotlight follows whether anything is indexed; samba re-reads its
+  // configuration after a change (the platform reloads it, never dropping
+  // connected clients), and only then.
   const int spotlight = platform->SMBIsEnableSpotlight();
   if (enable ? spotlight == 0 : spotlight > 0) {
     if (0 > platform->SMBSetSpotlight(enable)) {

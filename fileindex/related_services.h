@@ -29,6 +29,11 @@ void PrepareServices();
 // fileindexd's job. Never throws: each failed step is logged and the next runs.
 void SetupRelatedServices(bool enable);
 
+// Names the shares of `folder_mgr`'s folders as the ones whose Spotlight
+// searches Samba sends to our responder, and makes samba re-read its
+// configuration when that changed while Spotlight is on. Never throws.
+void UpdateSpotlightShares(const FolderMgr& folder_mgr);
+
 // Writes the share's monitor-queue configuration from the folders of
 // `folder_mgr` in that share ("config" null when there are none). Error 800
 // for an unknown share, 502 when the platform refuses it.

@@ -175,6 +175,10 @@ constexpr size_t kShareNameMax = 492;
 constexpr size_t kPathBufferSize = 4096;
 constexpr size_t kIndexIdBufferSize = 1024;
 
+// The loopback port of corvspotlightd, the responder behind Samba's Spotlight
+// back end (not Elasticsearch's 9200, so both can run on one server).
+constexpr int kSpotlightResponderPort = 9210;
+
 class Platform {
  public:
   virtual ~Platform() = default;
@@ -254,6 +258,8 @@ class Platform {
   // 0 on success, negative on failure.
   virtual int ServiceStart(const std::string& name, bool wait) = 0;
   virtual int ServiceStop(const std::string& name, bool wait) = 0;
+  // "samba" is never restarted (that would drop every connected SMB
+  // client): its restart re-reads the configuration (a reload).
   virtual int ServiceRestart(const std::string& name) = 0;
   // Start/stop a package job (ServicectlType).
   virtual int ServicectlStart(const std::string& job, int type) = 0;
@@ -262,10 +268,15 @@ class Platform {
   // the program's exit status (0..255), else 0 once started; negative when
   // it cannot be started or ends by a signal.
   virtual int Exec(const std::string& program, const std::vector<std::string>& args, int flags) = 0;
-  // SMB Spotlight search: 1 on, 0 off, negative on failure.
+  // SMB Spotlight search: 1 on, 0 off, negative on failure. When on, Samba
+  // sends each search to corvspotlightd on 127.0.0.1:kSpotlightResponderPort.
   virtual int SMBIsEnableSpotlight() = 0;
   // 0 on success, negative on failure.
   virtual int SMBSetSpotlight(bool enable) = 0;
+  // The shares whose Spotlight searches are answered from their index (the
+  // indexed ones): 1 when the SMB configuration changed, 0 when it already
+  // said so, negative on failure.
+  virtual int SMBSetSpotlightShares(const std::vector<std::string>& share_names) = 0;
 
   // --- Notification daemon's queue configuration ---
   // Writes or replaces the configuration of `queue["queue"]` for `app`.

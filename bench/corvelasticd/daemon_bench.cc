@@ -1,8 +1,11 @@
 // End-to-end figures of corvelasticd on a private socket: ingest through the
 // library's path (one connection per request, a commit per 1,000 documents),
-// name-substring and word searches through the socket with the access
-// filter of an ordinary user, a prefix delete of 10% of the documents, the
+// name-substring, word, phrase, prefix and filtered searches through the
+// socket with the access filter of an ordinary user, a prefix delete of 10% of the documents, the
 // daemon's peak memory and the database size against the text indexed.
+// `--commit-every 0` commits once at the end, as the first index of a folder
+// does; the index folder's size is sampled during the ingest, so its peak
+// (database plus write-ahead log) can be set against the final size.
 //
 //   corvelasticd_bench --daemon BUILD/programs/corvelasticd/corvelasticd --docs 1000000 --work DIR
 #include <dirent.h>
@@ -17,19 +20,23 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <atomic>
 #include <chrono>
 #include <cstring>
 #include <fstream>
+#include <functional>
 #include <iostream>
 #include <iterator>
 #include <random>
 #include <sstream>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "common/json_util.h"
 #include "fileindex/communication.h"
-#include "programs/corvelasticd/request_frame.h"
+#include "fileindex/frame_reader.h"
+#include "tests/support/frame_client.h"
 
 namespace {
 
@@ -44,29 +51,19 @@ struct Options {
   int queries = 300;
   bool reuse = false;  // the work directory holds a finished ingest: measure searches (and the delete) again
   bool keep = false;   // no delete, so the index can be measured again with --reuse
+  long commit_every = 1000;  // 0: one commit after the whole ingest
 };
 
 std::string g_socket;
 
-int Connect() {
-  const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  sockaddr_un address;
-  memset(&address, 0, sizeof(address));
-  address.sun_family = AF_UNIX;
-  strncpy(address.sun_path, g_socket.c_str(), sizeof(address.sun_path) - 1);
-  if (connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)) != 0) {
-    close(fd);
-    return -1;
-  }
-  return fd;
-}
+int Connect() { return corvlumex::testing_support::ConnectTo(g_socket); }
 
 Json::Value Request(const Json::Value& request) {
   const int fd = Connect();
   if (fd < 0) throw std::runtime_error("connect failed");
   corvlumex::fileindex::WriteFrame(fd, JsonToString(request));
   std::string text;
-  corvlumex::elasticd::ReadRequestFrame(fd, 1u << 30, 600000, 600000, &text);
+  corvlumex::fileindex::ReadFrameBounded(fd, 1u << 30, 600000, 600000, &text);
   close(fd);
   Json::Value answer;
   JsonFromString(answer, text);
@@ -227,6 +224,19 @@ long long FileSize(const std::string& path) {
   return stat(path.c_str(), &info) == 0 ? info.st_size : 0;
 }
 
+// The disk space the files of a folder take (blocks allocated, not lengths).
+long long FolderBytes(const std::string& folder) {
+  long long total = 0;
+  DIR* dir = opendir(folder.c_str());
+  if (dir == nullptr) return 0;
+  while (dirent* entry = readdir(dir)) {
+    struct stat info;
+    if (stat((folder + "/" + entry->d_name).c_str(), &info) == 0 && S_ISREG(info.st_mode)) total += info.st_blocks * 512LL;
+  }
+  closedir(dir);
+  return total;
+}
+
 // Runs `body` as an ordinary user when this is root, so the access filter checks every hit.
 template <typename Body>
 std::vector<double> AsOrdinaryUser(Body body) {
@@ -264,9 +274,10 @@ int main(int argc, char** argv) {
     else if (key == "--queries") options.queries = atoi(argv[i + 1]);
     else if (key == "--reuse") options.reuse = std::string(argv[i + 1]) == "1";
     else if (key == "--keep") options.keep = std::string(argv[i + 1]) == "1";
+    else if (key == "--commit-every") options.commit_every = atol(argv[i + 1]);
   }
   if (options.daemon.empty()) {
-    std::cerr << "usage: corvelasticd_bench --daemon PATH [--docs N] [--work DIR] [--queries N] [--reuse 1] [--keep 1]\n";
+    std::cerr << "usage: corvelasticd_bench --daemon PATH [--docs N] [--work DIR] [--queries N] [--reuse 1] [--keep 1] [--commit-every N]\n";
     return 2;
   }
   signal(SIGPIPE, SIG_IGN);
@@ -304,10 +315,19 @@ int main(int argc, char** argv) {
   if (!options.reuse) Command("index_create", create);
 
   Words words;
-  std::vector<std::string> names;
+  std::vector<std::string> names, phrases;
   long long raw_json = 0, raw_text = 0;
   const auto ingest_start = Clock::now();
   const double client_cpu_start = CpuSeconds(getpid());
+  // The index folder's size every 50 ms: what the volume must hold while indexing.
+  std::atomic<bool> ingesting{true};
+  std::atomic<long long> peak_folder_bytes{0};
+  std::thread folder_sampler([&] {
+    while (ingesting.load()) {
+      peak_folder_bytes = std::max(peak_folder_bytes.load(), FolderBytes(options.work + "/index"));
+      usleep(50000);
+    }
+  });
   for (long i = 0; i < options.docs; ++i) {
     const std::string path = PathOf(share, i);
     std::string text;
@@ -326,15 +346,21 @@ int main(int argc, char** argv) {
     doc["CORVMDTextContent"] = text;
     raw_json += static_cast<long long>(JsonToString(doc).size());
     raw_text += static_cast<long long>(path.size() * 2 + name.size() * 2 + 3 + text.size());
-    if (i % 997 == 0) names.push_back(name);
+    if (i % 997 == 0) {
+      names.push_back(name);
+      phrases.push_back(text.substr(0, text.find(' ', text.find(' ') + 1)));  // the first two words
+    }
     Json::Value data;
     data["doc_id"] = path;
     data["data"] = doc;
     if (options.reuse) continue;  // the same documents, already indexed
     Command("document_upsert_by_id", data);
-    if ((i + 1) % 1000 == 0) Command("commit", Json::Value(Json::objectValue));
+    if (options.commit_every > 0 && (i + 1) % options.commit_every == 0) Command("commit", Json::Value(Json::objectValue));
   }
   if (!options.reuse) Command("commit", Json::Value(Json::objectValue));
+  peak_folder_bytes = std::max(peak_folder_bytes.load(), FolderBytes(options.work + "/index"));
+  ingesting = false;
+  folder_sampler.join();
   const double ingest_seconds = std::chrono::duration<double>(Clock::now() - ingest_start).count();
   const double ingest_cpu = CpuSeconds(daemon);
   const double client_cpu = CpuSeconds(getpid()) - client_cpu_start;
@@ -355,18 +381,24 @@ int main(int argc, char** argv) {
   const double restart_seconds = std::chrono::duration<double>(Clock::now() - restart_start).count();
 
   // Queries: substrings from the middle of names, and words of middling frequency.
-  std::vector<std::string> substrings, terms;
+  std::vector<std::string> substrings, terms, prefixes;
   for (int q = 0; q < options.queries; ++q) {
     const std::string& name = names[static_cast<size_t>(q) % names.size()];
     substrings.push_back(name.substr(2, 5));
     terms.push_back(words.list[1000 + static_cast<size_t>(q) * 37 % 20000]);
+    prefixes.push_back(terms.back().substr(0, 4));
   }
-  auto timed = [&](const std::vector<std::string>& texts, const char* field) {
+  const auto clause = [](const char* kind, const char* field, const std::string& text) {
+    Json::Value qsl;
+    qsl[kind][field] = text;
+    return qsl;
+  };
+  auto timed = [&](const std::vector<std::string>& texts, const std::function<Json::Value(const std::string&)>& qsl) {
     return AsOrdinaryUser([&] {
       std::vector<double> ms;
       for (const std::string& text : texts) {
         Json::Value data;
-        data["query"]["qsl"]["match"][field] = text;
+        data["query"]["qsl"] = qsl(text);
         data["size"] = 20;
         data["load_field"].append("CORVMDFSName");
         Json::Value request;
@@ -385,23 +417,45 @@ int main(int argc, char** argv) {
       return ms;
     });
   };
-  std::vector<double> name_raw = timed(substrings, "CORVMDSearchFileName");
-  std::vector<double> word_raw = timed(terms, "_all");
+  std::vector<double> name_raw = timed(substrings, [&](const std::string& t) { return clause("match", "CORVMDSearchFileName", t); });
+  std::vector<double> word_raw = timed(terms, [&](const std::string& t) { return clause("match", "_all", t); });
+  std::vector<double> phrase_raw = timed(phrases, [&](const std::string& t) { return clause("match_phrase", "_all", t); });
+  std::vector<double> prefix_raw = timed(prefixes, [&](const std::string& t) { return clause("prefix", "_all", t); });
+  // A word with the filters people add: a size and a date range.
+  std::vector<double> filtered_raw = timed(terms, [&](const std::string& t) {
+    Json::Value qsl;
+    qsl["bool"]["must"].append(clause("match", "_all", t));
+    Json::Value size, date;
+    size["range"]["CORVMDFSSize"]["lt"] = 500000;
+    date["range"]["CORVMDFSContentChangeDate"]["gte"] = 1600000000 + options.docs / 2;
+    qsl["bool"]["filter"].append(size);
+    qsl["bool"]["filter"].append(date);
+    return qsl;
+  });
   const double search_load = LoadAverage();
-  QueryFigures names_found = Split(name_raw), words_found = Split(word_raw);
+  QueryFigures names_found = Split(name_raw), words_found = Split(word_raw), phrases_found = Split(phrase_raw),
+               prefixes_found = Split(prefix_raw), filtered_found = Split(filtered_raw);
+  const auto print_searches = [&] {
+    names_found.Print("name substring search");
+    words_found.Print("word search");
+    phrases_found.Print("phrase search (two words)");
+    prefixes_found.Print("prefix search (4 letters)");
+    filtered_found.Print("word search with size and date filters");
+  };
 
   const auto print_ingest = [&] {
     if (options.reuse) return;  // nothing was ingested
     std::cout << "ingest: " << static_cast<long>(options.docs / ingest_seconds) << " documents/s (" << ingest_seconds
               << " s; daemon CPU " << ingest_cpu << " s = " << static_cast<long>(options.docs / std::max(ingest_cpu, 1e-3))
               << " documents per CPU second; the client's CPU " << client_cpu << " s; load average " << ingest_load << ")\n";
+    std::cout << "index folder during the ingest (commit every " << options.commit_every << "): peak "
+              << peak_folder_bytes / 1e6 << " MB, database after the ingest " << db_bytes / 1e6 << " MB\n";
   };
   if (options.keep) {
     StopDaemon(daemon);
     std::cout << "documents: " << options.docs << "\n";
     print_ingest();
-    names_found.Print("name substring search");
-    words_found.Print("word search");
+    print_searches();
     std::cout << "load average after the searches: " << search_load << "\n";
     return 0;
   }
@@ -418,8 +472,7 @@ int main(int argc, char** argv) {
   std::cout << "documents: " << options.docs << "\n";
   print_ingest();
   std::cout << "reopening the index after a restart: " << restart_seconds << " s\n";
-  names_found.Print("name substring search");
-  words_found.Print("word search");
+  print_searches();
   std::cout << "load average after the searches: " << search_load << "\n";
   std::cout << "prefix delete of " << deleted["data"]["deleted"].asInt64() << " documents: " << delete_seconds << " s\n";
   std::cout << "peak memory of the daemon: " << peak_kb / 1024 << " MB\n";

@@ -15,6 +15,7 @@
 
 #include "platform/linux/extract/parsers/extract_content.h"
 #include "platform/linux/extract/parsers/formats.h"
+#include "platform/linux/extract/parsers/text_sink.h"
 #include "platform/linux/extract/worker_client.h"
 #include "platform/linux/linux_platform.h"
 #include "tests/extract/samples.h"
@@ -73,7 +74,7 @@ void MakeSamples() {
 void BM_Parse(benchmark::State& state, Sample sample) {
   const std::string path = Folder() + "/" + sample.name;
   const int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC);
-  for (auto _ : state) benchmark::DoNotOptimize(platform::extract::ExtractContent(fd, sample.name, sample.need_meta));
+  for (auto _ : state) benchmark::DoNotOptimize(platform::extract::ExtractContent(fd, sample.name, sample.need_meta, platform::extract::kTextContentCap));
   close(fd);
   state.SetItemsProcessed(state.iterations());
 }

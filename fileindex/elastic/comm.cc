@@ -4,6 +4,7 @@
 #include <sys/un.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <cerrno>
 #include <chrono>
 #include <cstring>
@@ -59,7 +60,12 @@ int SubAnswerCode(const Json::Value& sub_answer) {
   return code.isConvertibleTo(Json::intValue) ? code.asInt() : 0;
 }
 
+// Set after each answer; read by callers that check for a restart.
+std::atomic<pid_t> last_daemon_pid{0};
+
 }  // namespace
+
+pid_t LastSearchDaemonPid() { return last_daemon_pid.load(); }
 
 bool IsElasticBusyCode(int code) { return code == kElasticBusy || code == kElasticNotReady; }
 
@@ -89,6 +95,7 @@ void SendRequestImpl(Json::Value& res, const Json::Value& req) {
                         "!conn.Recv(resp_raw) || !res.fromString(resp_raw) || !res.isMember(\"success\") || "
                         "!res[\"success\"].isBool()",
                         kErrorSearchRequest, "Recv failed, res=" + resp_raw);
+  last_daemon_pid = conn.PeerPid();
 
   const Json::Value& answer = res;
   if (!answer["success"].asBool()) {
@@ -146,6 +153,16 @@ bool SockConnection::Recv(std::string& text) {
 }
 
 DomainSockConnection::DomainSockConnection(const std::string& path) : path_(path) {}
+
+pid_t DomainSockConnection::PeerPid() const {
+  struct ucred peer;
+  socklen_t size = sizeof(peer);
+  if (fd_ < 0 || getsockopt(fd_, SOL_SOCKET, SO_PEERCRED, &peer, &size) != 0) {
+    errno = 0;
+    return 0;
+  }
+  return peer.pid;
+}
 
 bool DomainSockConnection::Connect() {
   struct sockaddr_un address;

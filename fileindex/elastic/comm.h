@@ -4,6 +4,7 @@
 #pragma once
 
 #include <json/json.h>
+#include <sys/types.h>
 
 #include <string>
 
@@ -17,6 +18,12 @@ bool IsElasticBusyCode(int code);
 
 // corvelasticd's socket, relocated by the system root.
 std::string ElasticSocketPath();
+
+// The process id of the search daemon that answered the last request of this
+// process (0 before the first). Writes a daemon has not committed die with
+// it, so a caller that sees this change between its writes and its commit
+// knows that some of them were lost and does them again.
+pid_t LastSearchDaemonPid();
 
 // Waits until a frame starts to arrive on `fd`. False when the peer hung up
 // first (or the socket failed): the frame reader keeps asking on end of file,
@@ -51,6 +58,8 @@ class DomainSockConnection : public SockConnection {
  public:
   explicit DomainSockConnection(const std::string& path);
   bool Connect();
+  // The process at the other end of the connected socket; 0 when unknown.
+  pid_t PeerPid() const;
 
  private:
   std::string path_;

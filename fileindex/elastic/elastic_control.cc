@@ -1,5 +1,8 @@
 #include "fileindex/elastic/elastic_control.h"
 
+#include <sys/stat.h>
+
+#include <cerrno>
 #include <chrono>
 #include <cstdlib>
 
@@ -72,6 +75,11 @@ Json::Value ExtractDocument(const std::string& path, bool need_meta) {
   CORV_CHECK_THROW(!document.isObject(), kErrorParseDocument, "Parse failed, path=" + path);
   // Name search runs on its own field, analysed for matches inside names.
   document[kFieldSearchFileName] = document[kFieldFSName];
+  // The names of one file find each other by it, so that a change through
+  // one of its hard links reaches them all.
+  struct stat st;
+  if (lstat(path.c_str(), &st) == 0 && !S_ISDIR(st.st_mode)) document[kFieldFileID] = FileIdentity(st.st_dev, st.st_ino);
+  errno = 0;
   return document;
 }
 
@@ -112,6 +120,24 @@ void SendRequestWithRetry(Json::Value& res, const Json::Value& req) {
 void SendRequestNoResult(const Json::Value& req) {
   Json::Value res;
   SendRequestWithRetry(res, req);
+}
+
+bool IsIndexReady(const std::string& share) {
+  Json::Value req(Json::objectValue);
+  req["command"] = "index_list";
+  Json::Value res;
+  try {
+    SendRequestImpl(res, req);
+  } catch (const Error& error) {
+    // Not running, or not taking requests yet. Any other answer is for the
+    // real requests to meet and report.
+    return error.code != kErrorSearchRequest && !IsElasticBusyCode(error.code);
+  }
+  const std::string id = GetFileIndexID(share);
+  for (const Json::Value& index : res["data"]) {
+    if (index.isObject() && index["id"] == id) return index["state"] != "opening";
+  }
+  return true;  // no such index: its requests fail at once, not busy
 }
 
 void ShareIndexCreate(const std::string& share) {
@@ -221,6 +247,25 @@ void IndexGetByPrefixPath(const std::string& share, const std::string& prefix, s
     GetJsonValue(path, doc, kFieldPath, true);
     paths.push_back(path);
   }
+}
+
+std::string FileIdentity(dev_t device, ino_t inode) {
+  return std::to_string(static_cast<unsigned long long>(device)) + ":" +
+         std::to_string(static_cast<unsigned long long>(inode));
+}
+
+std::vector<std::string> IndexPathsOfFile(const std::string& share, dev_t device, ino_t inode) {
+  Json::Value req = MakeRequest("document_get_by_query", share);
+  const std::string identity = FileIdentity(device, inode);
+  req["data"]["query"]["qsl"]["term"][kFieldFileID] = identity;
+  req["data"]["query"]["load_field"] = LoadFields({kFieldPath});
+  Json::Value res;
+  SendRequestWithRetry(res, req);
+  std::vector<std::string> paths;
+  for (const Json::Value& doc : QueryDocuments(res, identity)) {
+    if (doc[kFieldPath].isString()) paths.push_back(doc[kFieldPath].asString());
+  }
+  return paths;
 }
 
 void IndexCommit(const std::string& share) {

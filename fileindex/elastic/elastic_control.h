@@ -4,6 +4,7 @@
 #pragma once
 
 #include <json/json.h>
+#include <sys/types.h>
 
 #include <string>
 #include <vector>
@@ -21,6 +22,12 @@ std::string GetFileIndexID(const std::string& share_name);
 void SendRequestWithRetry(Json::Value& res, const Json::Value& req);
 // The same, for commands whose answer is not needed.
 void SendRequestNoResult(const Json::Value& req);
+
+// False while the search daemon cannot take the share's requests at once:
+// it does not run, or it is still opening the share's index after a start
+// (a request would then be answered busy, which the busy retry waits out for
+// a quarter of an hour). One request, without the busy retry.
+bool IsIndexReady(const std::string& share);
 
 // Share indexes.
 void ShareIndexCreate(const std::string& share);
@@ -47,6 +54,11 @@ void IndexRename(const std::string& share, const std::string& path_from, const s
 // Appends the paths of the documents below `prefix` to `paths`, in the
 // daemon's order; Error 916 when the answer carries no list.
 void IndexGetByPrefixPath(const std::string& share, const std::string& prefix, std::vector<std::string>& paths);
+// The paths of the documents of one file, by its device and inode (every
+// name of a file with hard links that the index holds).
+std::vector<std::string> IndexPathsOfFile(const std::string& share, dev_t device, ino_t inode);
+// "<device>:<inode>", the value of the file-identity field.
+std::string FileIdentity(dev_t device, ino_t inode);
 // Makes the share's changes durable. When that fails on a volume short of
 // space, the share is marked for reindexing and Error 1003 is thrown.
 void IndexCommit(const std::string& share);

@@ -198,6 +198,18 @@ const char kFileIndexMappingsText[] = R"json({
 		"CORVMDSpotlightBoost": {
 			"type": "text",
 			"analyzer": "white space"
+		},
+		"CORVMDFSFileID": {
+			"analyzer": "keyword",
+			"_all": false
+		},
+		"CORVMDExtractionFailed": {
+			"type": "bool",
+			"_all": false
+		},
+		"CORVMDExtractionError": {
+			"analyzer": "keyword",
+			"_all": false
 		}
 	}
 })json";

@@ -17,6 +17,12 @@ inline constexpr char kFieldSearchFileName[] = "CORVMDSearchFileName";
 inline constexpr char kFieldDisplayName[] = "CORVMDDisplayName";
 inline constexpr char kFieldKind[] = "CORVMDKind";
 inline constexpr char kFieldExtension[] = "CORVMDExtension";
+// "<device>:<inode>" of a file: the names of one file (hard links) share it.
+inline constexpr char kFieldFileID[] = "CORVMDFSFileID";
+// Set by content extraction when the content could not be read (with the
+// reason); the document then holds the file-system fields only.
+inline constexpr char kFieldExtractionFailed[] = "CORVMDExtractionFailed";
+inline constexpr char kFieldExtractionError[] = "CORVMDExtractionError";
 // Content-extraction option: also extract the file's metadata.
 inline constexpr char kOptionNeedMeta[] = "need_meta";
 

@@ -176,7 +176,9 @@ void FolderDelete(const Json::Value& path_list) {
     }
     for (const std::string& full_path : share.to_reindex) QueueReindex(full_path);
   }
+  // Switched off first: samba then need not re-read the share list as well.
   if (folder_mgr.Folders().empty()) SetupRelatedServices(false);
+  UpdateSpotlightShares(folder_mgr);
 }
 
 void UpdateTermSuggestion() {

@@ -54,6 +54,7 @@ class LinuxPlatform : public Platform {
   int Exec(const std::string& program, const std::vector<std::string>& args, int flags) override;
   int SMBIsEnableSpotlight() override;
   int SMBSetSpotlight(bool enable) override;
+  int SMBSetSpotlightShares(const std::vector<std::string>& share_names) override;
 
   bool MonitorQueueUpsert(const Json::Value& queue, const std::string& app, int type) override;
   bool MonitorQueueDelete(const std::string& queue_path, const std::string& app, int type) override;

@@ -1,5 +1,5 @@
 // The notifier's queue configuration on the Linux platform: one JSON file
-// per (application, queue) under SysPath("/etc/corvlumex/monitor.d/"),
+// per (application, queue) under NotifierConfigDir() + "/",
 // replaced atomically, which corvnotifyd reads.
 #include <unistd.h>
 
@@ -11,6 +11,7 @@
 #include "common/sys.h"
 #include "platform/linux/config_files.h"
 #include "platform/linux/linux_platform.h"
+#include "platform/linux/notifier_presence.h"
 
 namespace corvlumex {
 namespace platform {
@@ -83,14 +84,14 @@ bool LinuxPlatform::MonitorQueueUpsert(const Json::Value& queue, const std::stri
   record["application"] = app;
   record["type"] = type;
   const std::string path =
-      SysPath("/etc/corvlumex/monitor.d/") + ConfigFileName(app, queue["queue"].asString());
+      NotifierConfigDir() + "/" + ConfigFileName(app, queue["queue"].asString());
   return WriteConfigFile(path, JsonToString(record) + "\n", 0644);
 }
 
 bool LinuxPlatform::MonitorQueueDelete(const std::string& queue_path, const std::string& app, int type) {
   if (!CheckApp(app, type)) return false;
   if (queue_path.empty() || queue_path[0] != '/') return BadConfig("not an absolute queue path: " + queue_path);
-  const std::string path = SysPath("/etc/corvlumex/monitor.d/") + ConfigFileName(app, queue_path);
+  const std::string path = NotifierConfigDir() + "/" + ConfigFileName(app, queue_path);
   if (!Unlink(path)) {
     CORV_PLATFORM_ERROR(kPlatformErrConfig, "cannot remove " + path + ": " + strerror(errno));
     return false;

@@ -1,4 +1,4 @@
-// Services and the SMB Spotlight switch of the Linux platform.
+// Services of the Linux platform.
 //
 // Every service request is one run of the service command with the
 // arguments [--no-block] <start|stop|restart> <unit>. The command is, first
@@ -9,6 +9,8 @@
 #include <cstdlib>
 #include <fstream>
 #include <map>
+#include <string>
+#include <vector>
 
 #include "common/file_util.h"
 #include "common/sys.h"
@@ -20,7 +22,7 @@ namespace platform {
 namespace {
 
 constexpr char kSystemctl[] = "/bin/systemctl";
-constexpr char kSpotlightInclude[] = "/etc/samba/corvlumex-spotlight.conf";
+constexpr char kSambaUnit[] = "smbd.service";
 
 std::string Trim(const std::string& text) {
   const size_t begin = text.find_first_not_of(" \t\r\n");
@@ -46,6 +48,14 @@ std::string UnitName(const std::string& name) {
   return unit.find('.') == std::string::npos ? unit + ".service" : unit;
 }
 
+// 0 for a service command that exited 0; else the failure recorded.
+int ServiceResult(int status, const std::string& what) {
+  if (status == 0) return 0;
+  CORV_PLATFORM_ERROR(kPlatformErrService,
+                      what + " failed (" + (status < 0 ? LastError().message : "status " + std::to_string(status)) + ")");
+  return -1;
+}
+
 int RequestService(LinuxPlatform* platform, const std::string& action, const std::string& name, bool wait) {
   if (name.empty() || name.find('/') != std::string::npos) {
     CORV_PLATFORM_ERROR(kPlatformErrBadArgument, "not a service name: \"" + name + "\"");
@@ -63,13 +73,7 @@ int RequestService(LinuxPlatform* platform, const std::string& action, const std
     return 0;
   }
   const int status = platform->Exec(command, args, kExecWait | kExecNullStdin | kExecCloseFds);
-  if (status != 0) {
-    CORV_PLATFORM_ERROR(kPlatformErrService, command + " " + action + " " + UnitName(name) + " failed (" +
-                                                 (status < 0 ? LastError().message : "status " + std::to_string(status)) +
-                                                 ")");
-    return -1;
-  }
-  return 0;
+  return ServiceResult(status, command + " " + action + " " + UnitName(name));
 }
 
 int CheckJobType(int type) {
@@ -84,7 +88,15 @@ int LinuxPlatform::ServiceStart(const std::string& name, bool wait) { return Req
 
 int LinuxPlatform::ServiceStop(const std::string& name, bool wait) { return RequestService(this, "stop", name, wait); }
 
-int LinuxPlatform::ServiceRestart(const std::string& name) { return RequestService(this, "restart", name, true); }
+// Samba reads a changed configuration on a reload; a restart would drop
+// every connected SMB client. systemd's reload of smbd only signals the
+// parent process, so on a plain host smbcontrol tells every smbd process.
+int LinuxPlatform::ServiceRestart(const std::string& name) {
+  if (UnitName(name) != kSambaUnit) return RequestService(this, "restart", name, true);
+  if (ServiceCommand() != kSystemctl) return RequestService(this, "reload", name, true);
+  return ServiceResult(Exec("smbcontrol", {"smbd", "reload-config"}, kExecDefault | kExecSearchPath),
+                       "smbcontrol smbd reload-config");
+}
 
 int LinuxPlatform::ServicectlStart(const std::string& job, int type) {
   return CheckJobType(type) < 0 ? -1 : RequestService(this, "start", job, true);
@@ -92,40 +104,6 @@ int LinuxPlatform::ServicectlStart(const std::string& job, int type) {
 
 int LinuxPlatform::ServicectlStop(const std::string& job, int type) {
   return CheckJobType(type) < 0 ? -1 : RequestService(this, "stop", job, true);
-}
-
-// The switch is a samba include file; smb.conf includes it at its end:
-//   include = /etc/samba/corvlumex-spotlight.conf
-int LinuxPlatform::SMBIsEnableSpotlight() {
-  const std::string path = SysPath(kSpotlightInclude);
-  if (!IsFileExist(path)) return 0;
-  std::ifstream file(path);
-  if (!file) {
-    CORV_PLATFORM_ERROR(kPlatformErrConfig, "cannot read " + path);
-    return -1;
-  }
-  std::string line;
-  int enabled = 0;
-  while (std::getline(file, line)) {
-    std::string text;
-    for (char c : line) {
-      if (c != ' ' && c != '\t') text.push_back(static_cast<char>(tolower(static_cast<unsigned char>(c))));
-    }
-    if (text.compare(0, 10, "spotlight=") != 0) continue;
-    const std::string value = text.substr(10);
-    enabled = (value == "yes" || value == "true" || value == "on" || value == "1") ? 1 : 0;
-  }
-  return enabled;
-}
-
-int LinuxPlatform::SMBSetSpotlight(bool enable) {
-  const std::string content = std::string(
-                                  "# Written by CorvLumex: Spotlight search for SMB clients follows whether\n"
-                                  "# anything is indexed. Include this file at the end of smb.conf.\n"
-                                  "[global]\n"
-                                  "\tspotlight = ") +
-                              (enable ? "yes" : "no") + "\n";
-  return WriteConfigFile(SysPath(kSpotlightInclude), content, 0644) ? 0 : -1;
 }
 
 }  // namespace platform

@@ -58,19 +58,23 @@ class ThreadFsIdentity {
   std::vector<gid_t> saved_groups_;
 };
 
+std::vector<gid_t> GroupsOfName(const char* name, gid_t gid) {
+  int count = 64;
+  std::vector<gid_t> groups(static_cast<size_t>(count));
+  if (getgrouplist(name, gid, groups.data(), &count) < 0) {
+    groups.resize(static_cast<size_t>(count));
+    if (getgrouplist(name, gid, groups.data(), &count) < 0) return {};
+  }
+  groups.resize(static_cast<size_t>(count));
+  return groups;
+}
+
 std::vector<gid_t> GroupsOfUser(uid_t uid, gid_t gid) {
   struct passwd entry;
   struct passwd* found = nullptr;
   std::vector<char> buffer(16384);
   if (getpwuid_r(uid, &entry, buffer.data(), buffer.size(), &found) != 0 || found == nullptr) return {};
-  int count = 64;
-  std::vector<gid_t> groups(static_cast<size_t>(count));
-  if (getgrouplist(entry.pw_name, gid, groups.data(), &count) < 0) {
-    groups.resize(static_cast<size_t>(count));
-    if (getgrouplist(entry.pw_name, gid, groups.data(), &count) < 0) return {};
-  }
-  groups.resize(static_cast<size_t>(count));
-  return groups;
+  return GroupsOfName(entry.pw_name, gid);
 }
 
 }  // namespace
@@ -96,6 +100,21 @@ PeerIdentity ReadPeerIdentity(int fd) {
     peer.groups = GroupsOfUser(peer.uid, peer.gid);
   }
   return peer;
+}
+
+bool IdentityOfUser(const std::string& name, PeerIdentity* identity) {
+  struct passwd entry;
+  struct passwd* found = nullptr;
+  std::vector<char> buffer(16384);
+  if (name.empty() || getpwnam_r(name.c_str(), &entry, buffer.data(), buffer.size(), &found) != 0 || found == nullptr) {
+    errno = 0;
+    return false;
+  }
+  identity->uid = entry.pw_uid;
+  identity->gid = entry.pw_gid;
+  identity->pid = 0;
+  identity->groups = GroupsOfName(entry.pw_name, entry.pw_gid);
+  return true;
 }
 
 std::vector<bool> AccessFilter::Readable(const std::vector<std::string>& paths) const {

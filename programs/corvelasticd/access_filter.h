@@ -24,6 +24,12 @@ struct PeerIdentity {
 // identity that cannot be read is left as uid -1, which may read nothing.
 PeerIdentity ReadPeerIdentity(int fd);
 
+// The identity of the user `name` as the system's account database gives it:
+// uid, primary gid and every group the user belongs to (getgrouplist), so a
+// search on the user's behalf sees what a login of that user would. Returns
+// false for an unknown user.
+bool IdentityOfUser(const std::string& name, PeerIdentity* identity);
+
 class AccessFilter {
  public:
   explicit AccessFilter(const PeerIdentity& peer) : peer_(peer) {}

@@ -14,6 +14,8 @@ namespace corvlumex {
 namespace elasticd {
 namespace {
 
+constexpr Json::ArrayIndex kMaxUserCompound = 64;
+
 Json::Value Success(Json::Value data) {
   Json::Value answer(Json::objectValue);
   answer["success"] = true;
@@ -48,6 +50,9 @@ struct CommandInfo {
   // Index-changing commands, and reads that bypass the access filter: root
   // and the service user only.
   bool changes_indexes;
+  // Reads filtered by the asker's access, which root and the service user
+  // may ask on behalf of another user ("as_user").
+  bool acts_for_user = false;
 };
 
 Json::Value Empty() { return Json::Value(Json::objectValue); }
@@ -55,8 +60,8 @@ Json::Value Empty() { return Json::Value(Json::objectValue); }
 // Built once: every request looks its command up here.
 const std::unordered_map<std::string, CommandInfo>& Commands() {
   static const auto* const commands = new std::unordered_map<std::string, CommandInfo>{
-      {"search", {[](const Request& r) { return RunSearch(r.registry, r.data, AccessFilter(r.peer)); }, false}},
-      {"suggest", {[](const Request& r) { return RunSuggest(r.registry, r.data, AccessFilter(r.peer)); }, false}},
+      {"search", {[](const Request& r) { return RunSearch(r.registry, r.data, AccessFilter(r.peer)); }, false, true}},
+      {"suggest", {[](const Request& r) { return RunSuggest(r.registry, r.data, AccessFilter(r.peer)); }, false, true}},
       {"index_list", {[](const Request& r) { return r.registry.List(); }, false}},
       {"index_create",
        {[](const Request& r) {
@@ -165,6 +170,13 @@ Json::Value Dispatcher::HandleRequest(const Json::Value& request, const PeerIden
     if (nested) return fileindex::FailureAnswer(kCodeBadRequest, "Compound requests cannot be nested");
     const Json::Value& elements = request["compound"];
     if (!elements.isArray()) return fileindex::FailureAnswer(kCodeBadRequest, "\"compound\" must be an array of requests");
+    // The library renames a folder's descendants in one compound of any
+    // size; anybody else's compound is bounded, or one frame could carry a
+    // million searches.
+    if (!MayWrite(peer) && elements.size() > kMaxUserCompound) {
+      return fileindex::FailureAnswer(kCodeBadRequest, "A compound request may hold at most " + std::to_string(kMaxUserCompound) +
+                                                           " requests; send the others separately");
+    }
     Json::Value answer(Json::objectValue);
     answer["success"] = true;
     answer["data"] = Json::Value(Json::arrayValue);
@@ -197,7 +209,15 @@ Json::Value Dispatcher::Run(const std::string& command, const Json::Value& data,
   if (found->second.changes_indexes && !MayWrite(peer)) {
     throw DaemonError(kCodePermissionDenied, "\"" + command + "\" is allowed to root and the service user only");
   }
-  return found->second.run(Request{registry_, data, peer, options_.max_writer_backlog});
+  if (!data.isMember("as_user")) return found->second.run(Request{registry_, data, peer, options_.max_writer_backlog});
+  // A front end (the web daemon) searching for a signed-in user: the filter
+  // runs here, before paging, with that user's own ids and groups.
+  if (!found->second.acts_for_user) throw DaemonError(kCodeBadArgument, "\"as_user\" is taken by search and suggest only");
+  if (!MayWrite(peer)) throw DaemonError(kCodePermissionDenied, "\"as_user\" is allowed to root and the service user only");
+  const std::string name = RequiredString(data, "as_user");
+  PeerIdentity user;
+  if (!IdentityOfUser(name, &user)) throw DaemonError(kCodeBadArgument, "\"as_user\": no such user \"" + name + "\"");
+  return found->second.run(Request{registry_, data, user, options_.max_writer_backlog});
 }
 
 }  // namespace elasticd

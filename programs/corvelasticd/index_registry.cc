@@ -101,12 +101,18 @@ void IndexRegistry::OpenOne(const std::shared_ptr<IndexHandle>& handle) {
     failure = error.what();
     CORV_LOG("index %s could not be opened: %s", id.c_str(), failure.c_str());
   }
-  std::lock_guard<std::mutex> guard(handle->state_mutex_);
-  if (handle->state_ != IndexHandle::State::kOpening) return;  // deleted meanwhile
-  handle->store_ = store;
-  handle->plugin_ = std::move(plugin);
-  handle->failure_ = failure;
-  handle->state_ = failure.empty() ? IndexHandle::State::kReady : IndexHandle::State::kFailed;
+  {
+    std::lock_guard<std::mutex> guard(handle->state_mutex_);
+    if (handle->state_ != IndexHandle::State::kOpening) return;  // deleted meanwhile
+    handle->store_ = store;
+    handle->plugin_ = std::move(plugin);
+    handle->failure_ = failure;
+    handle->state_ = failure.empty() ? IndexHandle::State::kReady : IndexHandle::State::kFailed;
+  }
+  // Taken (after the state's lock: searches take it first) and released, so
+  // a search checking the states cannot miss the news.
+  { std::lock_guard<std::mutex> registry(mutex_); }
+  opened_.notify_all();
 }
 
 void IndexRegistry::Shutdown() {
@@ -142,13 +148,21 @@ std::shared_ptr<IndexHandle> IndexRegistry::Get(const std::string& id) const {
   return handle;
 }
 
-std::vector<std::shared_ptr<IndexHandle>> IndexRegistry::Ready() const {
+std::vector<std::shared_ptr<IndexHandle>> IndexRegistry::AllForSearch(std::chrono::milliseconds wait) const {
   std::vector<std::shared_ptr<IndexHandle>> ready;
-  std::lock_guard<std::mutex> guard(mutex_);
-  for (const auto& [id, handle] : indexes_) {
-    std::lock_guard<std::mutex> state(handle->state_mutex_);
-    if (handle->state_ == IndexHandle::State::kReady) ready.push_back(handle);
-  }
+  std::string opening;
+  const auto collect = [&] {
+    ready.clear();
+    opening.clear();
+    for (const auto& [id, handle] : indexes_) {
+      std::lock_guard<std::mutex> state(handle->state_mutex_);
+      if (handle->state_ == IndexHandle::State::kReady) ready.push_back(handle);
+      if (handle->state_ == IndexHandle::State::kOpening && opening.empty()) opening = handle->id_;
+    }
+    return opening.empty();
+  };
+  std::unique_lock<std::mutex> lock(mutex_);
+  if (!opened_.wait_for(lock, wait, collect)) throw DaemonError(kCodeOpening, "Index " + opening + " is still opening");
   return ready;
 }
 

@@ -7,6 +7,7 @@
 #include <json/json.h>
 
 #include <atomic>
+#include <chrono>
 #include <condition_variable>
 #include <map>
 #include <memory>
@@ -85,8 +86,11 @@ class IndexRegistry {
 
   // Throws 2010 (unknown), 1401 (opening), 2014 (failed to open).
   std::shared_ptr<IndexHandle> Get(const std::string& id) const;
-  // Every index whose state is ready.
-  std::vector<std::shared_ptr<IndexHandle>> Ready() const;
+  // Every index, for a search that names none: waits up to `wait` for the
+  // indexes still opening (just after a start), then throws 1401 naming one
+  // that still is: a search must not silently leave an index out. Indexes
+  // that failed to open are left out.
+  std::vector<std::shared_ptr<IndexHandle>> AllForSearch(std::chrono::milliseconds wait) const;
   Json::Value List() const;
 
   // true when created, false when the same index already existed.
@@ -105,6 +109,7 @@ class IndexRegistry {
   std::string file_;
   int open_delay_ms_;
   mutable std::mutex mutex_;
+  mutable std::condition_variable opened_;  // an index left the opening state
   std::map<std::string, std::shared_ptr<IndexHandle>> indexes_;
   std::vector<std::shared_ptr<IndexHandle>> to_open_;
   std::thread opener_;

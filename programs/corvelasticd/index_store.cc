@@ -12,6 +12,7 @@
 #include "programs/corvelasticd/document_codec.h"
 #include "programs/corvelasticd/index_files.h"
 #include "programs/corvelasticd/search_candidates.h"
+#include "programs/corvelasticd/search_ranking.h"
 #include "programs/corvelasticd/text_analysis.h"
 
 namespace corvlumex {
@@ -28,6 +29,14 @@ constexpr size_t kMaxReaders = 4;
 constexpr int kReaderCacheKb = 16384;
 // Full-text rows queued beyond this are handed to the engine before the next request.
 constexpr size_t kMaxPendingIndexBytes = 16u << 20;
+
+WalLimits g_wal_limits;
+std::mutex g_wal_limits_mutex;
+
+WalLimits CurrentWalLimits() {
+  std::lock_guard<std::mutex> guard(g_wal_limits_mutex);
+  return g_wal_limits;
+}
 
 [[noreturn]] void BadDocument(const std::string& what) { throw DaemonError(kCodeBadDocument, "Bad document: " + what); }
 
@@ -56,7 +65,13 @@ std::string JoinTokens(const std::vector<std::string>& tokens) {
 
 std::string IndexStore::DatabasePath(const std::string& directory) { return directory + "/" + kDatabaseName; }
 
-IndexStore::IndexStore(const std::string& path, std::unique_ptr<Database> writer) : path_(path), writer_(std::move(writer)) {}
+void IndexStore::SetWalLimits(const WalLimits& limits) {
+  std::lock_guard<std::mutex> guard(g_wal_limits_mutex);
+  g_wal_limits = limits;
+}
+
+IndexStore::IndexStore(const std::string& path, std::unique_ptr<Database> writer)
+    : path_(path), wal_limits_(CurrentWalLimits()), writer_(std::move(writer)) {}
 
 IndexStore::~IndexStore() {
   try {
@@ -121,6 +136,7 @@ std::unique_ptr<IndexStore> IndexStore::Open(const std::string& directory) {
 
 void IndexStore::LoadSchema() {
   writer_->Exec("PRAGMA cache_size=-16384");
+  LimitWriteAheadLog();
   Statement& stmt = writer_->Cached("SELECT value FROM meta WHERE name = 'mappings'");
   if (!stmt.Step() || !JsonFromString(mappings_, stmt.Text(0))) {
     throw DaemonError(kCodeIndexFailed, "The index database " + path_ + " has no readable mappings");
@@ -315,6 +331,7 @@ void IndexStore::Atomically(Body body) {
     throw;
   }
   Run("RELEASE request");
+  CommitStepIfLarge();
 }
 
 // Some failures (a full volume, an I/O error) make SQLite roll the whole
@@ -322,6 +339,7 @@ void IndexStore::Atomically(Body body) {
 void IndexStore::NoteLostTransaction() {
   if (!in_transaction_ || sqlite3_get_autocommit(writer_->raw()) == 0) return;
   in_transaction_ = false;
+  transaction_bytes_ = 0;
   pending_index_.Clear();
   key_changes_.clear();
   key_changes_complete_ = true;  // the rows are as last committed, as the directory is
@@ -336,6 +354,7 @@ void IndexStore::FlushIndexWrites() {
   if (pending_index_.empty()) return;
   Begin();
   Run("SAVEPOINT index_writes");
+  transaction_bytes_ += static_cast<int64_t>(pending_index_.bytes());
   try {
     pending_index_.ApplyTo(*writer_);
   } catch (...) {
@@ -370,6 +389,7 @@ void IndexStore::Upsert(const std::string& doc_id, const Json::Value& input) {
       update.Bind(2, row.rowid);
       update.Step();
       update.Reset();
+      transaction_bytes_ += static_cast<int64_t>(stored.size());
       IndexEntries(row.rowid, document, false);
     } else {
       Statement& insert = writer_->Cached("INSERT INTO docs(key, doc) VALUES(?, ?)");
@@ -377,6 +397,7 @@ void IndexStore::Upsert(const std::string& doc_id, const Json::Value& input) {
       insert.BindBlob(2, stored);
       insert.Step();
       insert.Reset();
+      transaction_bytes_ += static_cast<int64_t>(key.size() + stored.size());
       const int64_t rowid = sqlite3_last_insert_rowid(writer_->raw());
       NoteKeyChange(rowid, key);
       IndexEntries(rowid, document, false);
@@ -403,10 +424,12 @@ void IndexStore::SetById(const std::string& doc_id, const Json::Value& changes) 
       NoteDelete(doc_id);
     }
     Statement& update = writer_->Cached("UPDATE docs SET key = ?, doc = ? WHERE rowid = ?");
+    const std::string stored = EncodeDocument(key, document);
     update.BindText(1, key);
-    update.BindBlob(2, EncodeDocument(key, document));
+    update.BindBlob(2, stored);
     update.Bind(3, row.rowid);
     update.Step();
+    transaction_bytes_ += static_cast<int64_t>(key.size() + stored.size());
     update.Reset();
     NoteKeyChange(row.rowid, key);
     IndexEntries(row.rowid, document, false);
@@ -469,23 +492,48 @@ Json::Value IndexStore::GetByQuery(const Query& query, const std::vector<std::st
   return out;
 }
 
+void IndexStore::LimitWriteAheadLog() {
+  // A restarted log is cut back to keep_bytes (it is only ever reused, never
+  // shrunk, otherwise), and a commit checkpoints a log of more than 1,000
+  // pages without waiting for readers (SQLite's passive auto-checkpoint).
+  writer_->Exec("PRAGMA journal_size_limit=" + std::to_string(wal_limits_.keep_bytes));
+  writer_->Exec("PRAGMA wal_autocheckpoint=1000");
+}
+
+void IndexStore::CommitTransaction() {
+  keys_.BeginCommit();
+  try {
+    FlushIndexWrites();
+    writer_->Exec("COMMIT");
+  } catch (const std::exception&) {
+    keys_.EndCommit(false, false, key_changes_);
+    NoteLostTransaction();  // a full volume can make SQLite roll the transaction back
+    throw;
+  }
+  in_transaction_ = false;
+  transaction_bytes_ = 0;
+  keys_.EndCommit(true, key_changes_complete_, key_changes_);
+  key_changes_.clear();
+  key_changes_complete_ = true;
+}
+
+void IndexStore::CommitStepIfLarge() {
+  // What a transaction wrote sits in the page cache until the cache is full
+  // and reaches the log at the latest at the commit, so the log's size shows
+  // the transaction too late: the bytes given to SQLite and the full-text
+  // rows still queued are counted instead.
+  if (!in_transaction_ || transaction_bytes_ + static_cast<int64_t>(pending_index_.bytes()) < wal_limits_.step_bytes) {
+    return;
+  }
+  CommitTransaction();
+  // SQLite checkpoints by itself only past 1,000 pages; a step smaller than
+  // that would otherwise let the log grow to 4 MB before it restarts.
+  writer_->CheckpointPassive();
+}
+
 CommitChanges IndexStore::Commit() {
   CommitChanges changes;
-  if (in_transaction_) {
-    keys_.BeginCommit();
-    try {
-      FlushIndexWrites();
-      writer_->Exec("COMMIT");
-    } catch (const std::exception&) {
-      keys_.EndCommit(false, false, key_changes_);
-      NoteLostTransaction();  // a full volume can make SQLite roll the transaction back
-      throw;
-    }
-    in_transaction_ = false;
-    keys_.EndCommit(true, key_changes_complete_, key_changes_);
-    key_changes_.clear();
-    key_changes_complete_ = true;
-  }
+  if (in_transaction_) CommitTransaction();
   changes.upserted.assign(upserted_.begin(), upserted_.end());
   changes.deleted.assign(deleted_.begin(), deleted_.end());
   changes.truncated = truncated_;
@@ -611,10 +659,14 @@ SearchResult IndexStore::Search(const Query& query, const SortSpec& sort, size_t
   std::vector<SqlValue> values;
   if (ranked) values.push_back(query.RankedExpression());
   query.Compile(ranked, &condition, &values);
-  const std::string from = ranked ? "(SELECT rowid, rank FROM fts_text WHERE fts_text MATCH ?) s JOIN docs d ON d.rowid = s.rowid"
+  const std::string rank_expression = WeightedRank(schema_);
+  const int recency_code = RecencyCode(schema_);
+  const std::string from = ranked ? "(SELECT rowid, " + rank_expression +
+                                        " AS rank FROM fts_text WHERE fts_text MATCH ?) s JOIN docs d ON d.rowid = s.rowid"
                                   : "docs d";
   std::string sort_expression = "NULL";
   std::string order = "d.key";
+  std::vector<SqlValue> select_values = values;
   if (ranked) {
     order = "s.rank, d.key";
   } else if (sort.by == SortSpec::By::kKey) {
@@ -624,9 +676,6 @@ SearchResult IndexStore::Search(const Query& query, const SortSpec& sort, size_t
     if (sort.text) sort_expression = "corv_fold(" + sort_expression + ")";
     order = sort_expression + (sort.descending ? " DESC" : "") + ", d.key";
   }
-  const std::string sql = "SELECT d.rowid, d.key, " + std::string(ranked ? "s.rank" : "0") + ", " + sort_expression +
-                          " FROM " + from + " WHERE " + condition + " ORDER BY " + order;
-
   std::unique_ptr<Database> reader = TakeReader();
   const bool ranked_alone = ranked && condition == "1";
   if (ranked_alone && !keys_.ready()) BuildKeyDirectory(*reader);
@@ -635,17 +684,34 @@ SearchResult IndexStore::Search(const Query& query, const SortSpec& sort, size_t
   // One read transaction: the hits, their documents and the count come from one snapshot.
   reader->Exec("BEGIN");
   try {
+    // The snapshot is taken by the first read, here: the key directory
+    // serves it when no commit began before that.
+    const NameTiers tiers = ranked ? NameTiers::Find(*reader, query, schema_) : NameTiers();
     // A word query alone (the usual search) is ordered from the full-text
     // index's scores; anything else by SQL.
     std::unique_ptr<SearchCandidates> candidates;
     if (ranked_alone) {
-      // The snapshot is taken by the first read, in the constructor: the
-      // directory serves it when no commit began before that.
-      candidates = std::make_unique<RankedMatchCandidates>(*reader, query.RankedExpression(), &keys_, keys_at);
+      candidates = std::make_unique<RankedMatchCandidates>(*reader, query.RankedExpression(), rank_expression, tiers,
+                                                           recency_code, &keys_, keys_at);
     } else {
+      if (ranked) {
+        // Exact names, then names holding the words, then the rest; newest first on ties.
+        std::string tier = "2";
+        if (!tiers.name_expression().empty()) {
+          std::string exact = "-1";
+          for (const int64_t rowid : tiers.exact()) exact += ", " + std::to_string(rowid);
+          tier = "CASE WHEN d.rowid IN (" + exact +
+                 ") THEN 0 WHEN d.rowid IN (SELECT rowid FROM fts_text WHERE fts_text MATCH ?) THEN 1 ELSE 2 END";
+          select_values.push_back(tiers.name_expression());
+        }
+        const std::string recency = recency_code >= 0 ? "corv_field(d.key, d.doc, " + std::to_string(recency_code) + ") DESC, " : "";
+        order = tier + ", s.rank, " + recency + "d.key";
+      }
+      const std::string sql = "SELECT d.rowid, d.key, " + std::string(ranked ? "s.rank" : "0") + ", " + sort_expression +
+                              " FROM " + from + " WHERE " + condition + " ORDER BY " + order;
       auto select = reader->Prepare(sql);
-      select->BindAll(values);
-      candidates = std::make_unique<StatementCandidates>(std::move(select), ranked);
+      select->BindAll(select_values);
+      candidates = std::make_unique<StatementCandidates>(std::move(select), ranked, &tiers);
     }
     std::vector<Hit> batch;
     std::vector<int64_t> rowids;

@@ -6,6 +6,14 @@
 // Writes go through one writer connection inside an open transaction that
 // "commit" ends, so searches (reader connections) see only committed data
 // while the writer's own later requests see its uncommitted writes.
+//
+// The write-ahead log holds a whole transaction until it is committed, so a
+// folder's first index (one batch, one "commit") would need the index's size
+// twice over on disk. A transaction that has written more than
+// WalLimits::step_bytes is therefore committed in steps: searches may see the
+// first part of such a long batch before its "commit", and the log,
+// checkpointed after each step and cut back to WalLimits::keep_bytes when it
+// restarts, stays near the step's size.
 #pragma once
 
 #include <json/json.h>
@@ -62,8 +70,17 @@ struct Suggestion {
   int64_t frequency = 0;
 };
 
+// Bounds on the write-ahead log; the defaults suit the daemon, tests make them small.
+struct WalLimits {
+  int64_t step_bytes = 32 << 20;  // a transaction writing more is committed in steps
+  int64_t keep_bytes = 32 << 20;  // the log is cut back to this when it restarts
+};
+
 class IndexStore {
  public:
+  // Applies to stores opened afterwards; the daemon keeps the defaults.
+  static void SetWalLimits(const WalLimits& limits);
+
   static std::string DatabasePath(const std::string& directory);
   // A new database in `directory` (created when missing). Throws DaemonError.
   static std::unique_ptr<IndexStore> Create(const std::string& directory, const Json::Value& mappings,
@@ -121,6 +138,11 @@ class IndexStore {
   void Atomically(Body body);
   void FlushIndexWrites();
   void NoteLostTransaction();
+  // Commits the open transaction; the changed keys stay for the client's commit.
+  void CommitTransaction();
+  // Commits a transaction that has written more than WalLimits::step_bytes.
+  void CommitStepIfLarge();
+  void LimitWriteAheadLog();
   // Runs a statement without parameters that returns no rows, kept prepared.
   void Run(const char* sql);
 
@@ -134,8 +156,10 @@ class IndexStore {
   void ReturnReader(std::unique_ptr<Database> reader);
 
   std::string path_;
+  WalLimits wal_limits_;
   std::unique_ptr<Database> writer_;
   bool in_transaction_ = false;
+  int64_t transaction_bytes_ = 0;  // document and full-text rows given to SQLite since BEGIN
   Json::Value mappings_;
   IndexSchema schema_;
   std::vector<const FieldSpec*> text_fields_;

@@ -1,5 +1,6 @@
 #include "programs/corvelasticd/json_text.h"
 
+#include <exception>
 #include <memory>
 #include <sstream>
 
@@ -14,7 +15,12 @@ bool ParseJsonText(std::string_view text, Json::Value* value) {
   }());
   Json::Value parsed;
   std::string errors;
-  if (!reader->parse(text.data(), text.data() + text.size(), &parsed, &errors)) return false;
+  try {
+    if (!reader->parse(text.data(), text.data() + text.size(), &parsed, &errors)) return false;
+  } catch (const std::exception&) {
+    // jsoncpp throws, instead of failing, on nesting deeper than its limit.
+    return false;
+  }
   value->swap(parsed);
   return true;
 }

@@ -11,7 +11,8 @@
 namespace corvlumex {
 namespace elasticd {
 
-// False (and `value` untouched) when `text` is not JSON.
+// False (and `value` untouched) when `text` is not JSON, or nests deeper
+// than the JSON reader allows. Never throws.
 bool ParseJsonText(std::string_view text, Json::Value* value);
 // One line, UTF-8 kept as it is.
 std::string JsonText(const Json::Value& value);

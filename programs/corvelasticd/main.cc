@@ -32,6 +32,7 @@ constexpr const char* kUsage =
     "  --max-frame-bytes N      largest request accepted (default 67108864)\n"
     "  --max-writer-backlog N   writes waiting on one index before answers are busy (default 64)\n"
     "  --max-clients N          connections served at once (default 256)\n"
+    "  --max-clients-per-user N connections one user other than root and the service users may hold (default 64)\n"
     "  --log-stderr             log to standard error instead of syslog\n"
     "  --test-open-delay-ms N   delay the reopening of indexes at start (tests of the busy answer)\n";
 
@@ -73,7 +74,7 @@ int main(int argc, char** argv) {
       return 0;
     }
     if (option == "--log-stderr") {
-      SetLogSink([](int, const std::string& line) { std::cerr << line << std::endl; });
+      LogToStderr("corvelasticd");
       continue;
     }
     if (i + 1 >= argc) Fail("unknown option or missing value: " + option + "\n" + kUsage);
@@ -98,6 +99,8 @@ int main(int argc, char** argv) {
       dispatch_options.max_writer_backlog = static_cast<int>(Number(option, value));
     } else if (option == "--max-clients") {
       server_options.max_clients = static_cast<int>(Number(option, value));
+    } else if (option == "--max-clients-per-user") {
+      server_options.max_clients_per_user = static_cast<int>(Number(option, value));
     } else if (option == "--test-open-delay-ms") {
       open_delay_ms = static_cast<int>(Number(option, value));
     } else {
@@ -105,6 +108,7 @@ int main(int argc, char** argv) {
     }
   }
 
+  server_options.trusted_uids = dispatch_options.writer_uids;
   signal(SIGPIPE, SIG_IGN);
   IndexRegistry registry(registry_file, open_delay_ms);
   Dispatcher dispatcher(registry, dispatch_options);

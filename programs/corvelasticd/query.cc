@@ -2,6 +2,7 @@
 
 #include <time.h>
 
+#include <algorithm>
 #include <cmath>
 #include <cstring>
 #include <optional>
@@ -13,24 +14,19 @@ namespace corvlumex {
 namespace elasticd {
 namespace {
 
+// What one query may ask of the daemon. Every word is a look-up in the
+// full-text index, and the whole expression is evaluated for every candidate:
+// a 100,000-word match took over 12 s of CPU. People type a few words; the
+// library's own queries stay far below these.
 constexpr int kMaxDepth = 32;
-constexpr size_t kMaxClauses = 1024;
+constexpr size_t kMaxClauses = 1024;          // clauses, and values of "terms"
+constexpr size_t kMaxClauseWords = 64;        // words of one match/term on a text field
+constexpr size_t kMaxQueryWords = 256;        // words of the whole query
+constexpr size_t kMaxQueryTextBytes = 64u << 10;  // bytes of every text in the query
+constexpr size_t kMaxSubstringBytes = 1024;   // a name substring (names are at most 255 bytes)
 constexpr const char* kAllField = "_all";
 
 [[noreturn]] void Bad(const std::string& what) { throw DaemonError(kCodeBadQuery, "Bad query: " + what); }
-
-// One token or phrase in the index's expression syntax: quotes doubled.
-std::string Phrase(const std::vector<std::string>& tokens) {
-  std::string out = "\"";
-  for (size_t i = 0; i < tokens.size(); ++i) {
-    if (i > 0) out += ' ';
-    for (const char c : tokens[i]) {
-      out += c;
-      if (c == '"') out += '"';
-    }
-  }
-  return out + "\"";
-}
 
 std::string ColumnFilter(const std::vector<std::string>& columns) {
   std::string out = "{";
@@ -52,7 +48,7 @@ class Parser {
 
   QueryNode Clause(const Json::Value& clause, int depth, bool negated) {
     if (depth > kMaxDepth) Bad("clauses nested deeper than " + std::to_string(kMaxDepth));
-    if (++clauses_ > kMaxClauses) Bad("more than " + std::to_string(kMaxClauses) + " clauses");
+    CountClause();
     if (!clause.isObject() || clause.size() != 1) Bad("a clause must be an object with exactly one key: " + Short(clause));
     const std::string kind = clause.getMemberNames().front();
     const Json::Value& body = clause[kind];
@@ -62,6 +58,7 @@ class Parser {
     const std::string field = body.getMemberNames().front();
     const Json::Value& argument = body[field];
     if (kind == "match") return Match(field, argument, negated);
+    if (kind == "match_phrase") return MatchPhrase(field, argument, negated);
     if (kind == "term") return Term(field, argument, negated);
     if (kind == "terms") return Terms(field, argument, negated);
     if (kind == "prefix") return Prefix(field, argument);
@@ -75,6 +72,26 @@ class Parser {
     builder["indentation"] = "";
     std::string text = Json::writeString(builder, value);
     return text.size() > 120 ? text.substr(0, 120) + "..." : text;
+  }
+
+  void CountClause() {
+    if (++clauses_ > kMaxClauses) Bad("more than " + std::to_string(kMaxClauses) + " clauses and \"terms\" values; split the query");
+  }
+
+  // Every text the query searches for counts towards its size.
+  const std::string& CountText(const std::string& text) {
+    text_bytes_ += text.size();
+    if (text_bytes_ > kMaxQueryTextBytes) {
+      Bad("the texts of the query are longer than " + std::to_string(kMaxQueryTextBytes) + " bytes; search for fewer words");
+    }
+    return text;
+  }
+
+  void CountWords(size_t clause_words) {
+    if (clause_words > kMaxClauseWords) {
+      Bad("more than " + std::to_string(kMaxClauseWords) + " words in one clause; search for fewer words");
+    }
+    if (++words_ > kMaxQueryWords) Bad("more than " + std::to_string(kMaxQueryWords) + " words in the query; search for fewer words");
   }
 
   const FieldSpec& Field(const std::string& name) const {
@@ -150,21 +167,46 @@ class Parser {
     return groups;
   }
 
+  // The word columns of the file names searched by the catch-all field.
+  std::vector<std::string> NameWordColumns(const std::string& field) const {
+    std::vector<std::string> columns;
+    if (field != kAllField) return columns;
+    for (const FieldSpec* field_def : schema_.TextFields()) {
+      if (field_def->in_all && field_def->kind == FieldKind::kNgram) columns.push_back(field_def->Column());
+    }
+    return columns;
+  }
+
   // Every word (or, with "or", any word) must be found in one of the columns.
   QueryNode Words(const std::string& field, const std::string& text, bool any, bool negated) {
     const auto groups = ColumnsFor(field);
     std::vector<std::string> word_expressions;
     // Words are split on blanks first so each word is analyzed per column kind.
     std::vector<std::string> raw_words;
-    ForEachBlankSeparated(text, &raw_words);
+    ForEachBlankSeparated(CountText(text), &raw_words);
+    size_t clause_words = 0;
+    const std::vector<std::string> name_columns = NameWordColumns(field);
+    std::vector<std::string> name_expressions, exact_tokens;
     for (const std::string& word : raw_words) {
       std::vector<std::string> alternatives;
+      // A word is as many words as it analyzes to ("ac-3" is two): each is a look-up.
+      size_t most_tokens = 0;
       for (const auto& group : groups) {
+        size_t group_tokens = 0;
         for (const auto& tokens : AnalyzeQuery(group.first, word)) {
-          alternatives.push_back(ColumnFilter(group.second) + " : " + Phrase(tokens));
+          alternatives.push_back(ColumnFilter(group.second) + " : " + FtsPhrase(tokens));
+          group_tokens += tokens.size();
         }
+        most_tokens = std::max(most_tokens, group_tokens);
       }
+      for (size_t i = 0; i < most_tokens; ++i) CountWords(++clause_words);
       if (alternatives.empty()) continue;
+      if (!name_columns.empty()) {
+        std::vector<std::string> tokens;
+        Analyze(Analyzer::kStandard, word, &tokens);
+        if (!tokens.empty()) name_expressions.push_back(ColumnFilter(name_columns) + " : " + FtsPhrase(tokens));
+        exact_tokens.insert(exact_tokens.end(), tokens.begin(), tokens.end());
+      }
       std::string expression = alternatives.size() == 1 ? alternatives[0] : "(";
       if (alternatives.size() > 1) {
         for (size_t i = 0; i < alternatives.size(); ++i) expression += (i > 0 ? " OR " : "") + alternatives[i];
@@ -181,6 +223,10 @@ class Parser {
     for (size_t i = 0; i < word_expressions.size(); ++i) {
       node.fts += (i > 0 ? (any ? " OR " : " AND ") : "") + word_expressions[i];
     }
+    for (size_t i = 0; i < name_expressions.size(); ++i) {
+      node.name_fts += (i > 0 ? (any ? " OR " : " AND ") : "") + name_expressions[i];
+    }
+    if (!any) node.exact_name_tokens = std::move(exact_tokens);
     if (!negated) AddHighlight(text);
     return node;
   }
@@ -201,10 +247,13 @@ class Parser {
     QueryNode node;
     node.type = QueryNode::Type::kName;
     node.code = field_def.code;
+    if (CountText(text).size() > kMaxSubstringBytes) {
+      Bad("the text searched in \"" + field_def.name + "\" is longer than " + std::to_string(kMaxSubstringBytes) + " bytes");
+    }
     const std::string folded = Fold(text, FoldMode::kSearch);
     if (folded.empty()) return QueryNode{};  // every name holds the empty text
     if (CodePointCount(folded) >= 3) {
-      node.fts = "{" + field_def.NameColumn() + "} : " + Phrase({folded});
+      node.fts = "{" + field_def.NameColumn() + "} : " + FtsPhrase({folded});
     } else {
       node.substring = folded;
     }
@@ -212,6 +261,7 @@ class Parser {
   }
 
   QueryNode KeyIn(std::vector<std::string> keys) {
+    for (const std::string& key : keys) CountText(key);
     QueryNode node;
     node.type = QueryNode::Type::kKeyIn;
     node.keys = std::move(keys);
@@ -228,14 +278,14 @@ class Parser {
 
   QueryNode KeywordToken(const FieldSpec& field_def, const std::string& value) {
     std::vector<std::string> tokens;
-    Analyze(Analyzer::kKeyword, value, &tokens);
+    Analyze(Analyzer::kKeyword, CountText(value), &tokens);
     QueryNode node;
     if (tokens.empty()) {
       node.type = QueryNode::Type::kNone;
       return node;
     }
     node.type = QueryNode::Type::kText;
-    node.fts = "{" + field_def.Column() + "} : " + Phrase(tokens);
+    node.fts = "{" + field_def.Column() + "} : " + FtsPhrase(tokens);
     return node;
   }
 
@@ -245,7 +295,9 @@ class Parser {
     if (argument.isObject()) {
       if (!argument["query"].isString()) Bad("\"match\" on \"" + field + "\" needs a string \"query\"");
       text = argument["query"].asString();
-      const std::string op = argument.get("operator", "and").asString();
+      const Json::Value& given = argument["operator"];
+      if (!given.isNull() && !given.isString()) Bad("\"operator\" must be \"and\" or \"or\"");
+      const std::string op = given.isNull() ? "and" : given.asString();
       if (op != "and" && op != "or") Bad("\"operator\" must be \"and\" or \"or\"");
       any = op == "or";
     } else {
@@ -260,6 +312,54 @@ class Parser {
       case FieldKind::kText: return Words(field, text, any, negated);
       default: return NumberIn(field_def, {Number(field_def, argument)});
     }
+  }
+
+  // The words of `text` next to each other and in this order, in one column
+  // (a phrase never spans two fields).
+  QueryNode MatchPhrase(const std::string& field, const Json::Value& argument, bool negated) {
+    std::string text;
+    if (argument.isObject()) {
+      if (!argument["query"].isString()) Bad("\"match_phrase\" on \"" + field + "\" needs a string \"query\"");
+      text = argument["query"].asString();
+    } else {
+      text = ScalarText(field, argument);
+    }
+    CountText(text);
+    if (field != kAllField) {
+      const FieldSpec& field_def = Field(field);
+      if (IsKey(field_def)) return KeyIn({text});
+      switch (field_def.kind) {
+        case FieldKind::kNgram: return Substring(field_def, text);
+        case FieldKind::kKeyword: return KeywordToken(field_def, text);
+        case FieldKind::kText: break;
+        default: Bad("\"match_phrase\" needs a text field, \"" + field + "\" is not one");
+      }
+    }
+    std::vector<std::string> alternatives;
+    size_t most_tokens = 0;
+    for (const auto& group : ColumnsFor(field)) {
+      std::vector<std::string> tokens;
+      Analyze(group.first, text, &tokens);
+      most_tokens = std::max(most_tokens, tokens.size());
+      if (!tokens.empty()) alternatives.push_back(ColumnFilter(group.second) + " : " + FtsPhrase(tokens));
+    }
+    // A phrase of n words is n look-ups, bounded like the words of "match".
+    for (size_t i = 0; i < most_tokens; ++i) CountWords(i + 1);
+    QueryNode node;
+    node.type = QueryNode::Type::kNone;  // no word at all: matches nothing, as "match" does
+    if (alternatives.empty()) return node;
+    node.type = QueryNode::Type::kText;
+    for (size_t i = 0; i < alternatives.size(); ++i) node.fts += (i > 0 ? " OR " : "") + alternatives[i];
+    if (alternatives.size() > 1) node.fts = "(" + node.fts + ")";
+    const std::vector<std::string> name_columns = NameWordColumns(field);
+    std::vector<std::string> tokens;
+    Analyze(Analyzer::kStandard, text, &tokens);
+    if (!name_columns.empty() && !tokens.empty()) {
+      node.name_fts = ColumnFilter(name_columns) + " : " + FtsPhrase(tokens);
+      node.exact_name_tokens = tokens;
+    }
+    if (!negated) AddHighlight(text);
+    return node;
   }
 
   QueryNode Term(const std::string& field, const Json::Value& argument, bool negated) {
@@ -280,17 +380,26 @@ class Parser {
     const FieldSpec* field_def = field == kAllField ? nullptr : &Field(field);
     if (field_def != nullptr && IsKey(*field_def)) {
       std::vector<std::string> keys;
-      for (const Json::Value& value : argument) keys.push_back(ScalarText(field, value));
+      for (const Json::Value& value : argument) {
+        CountClause();
+        keys.push_back(ScalarText(field, value));
+      }
       return KeyIn(std::move(keys));
     }
     if (field_def != nullptr && (field_def->kind == FieldKind::kNumber || field_def->kind == FieldKind::kBool)) {
       std::vector<SqlValue> numbers;
-      for (const Json::Value& value : argument) numbers.push_back(Number(*field_def, value));
+      for (const Json::Value& value : argument) {
+        CountClause();
+        numbers.push_back(Number(*field_def, value));
+      }
       return NumberIn(*field_def, std::move(numbers));
     }
     QueryNode node;
     node.type = QueryNode::Type::kBool;
-    for (const Json::Value& value : argument) node.should.push_back(Term(field, value, negated));
+    for (const Json::Value& value : argument) {
+      CountClause();
+      node.should.push_back(Term(field, value, negated));
+    }
     if (node.should.empty()) node.type = QueryNode::Type::kNone;
     return node;
   }
@@ -299,6 +408,7 @@ class Parser {
     const Json::Value& value = argument.isObject() ? argument["value"] : argument;
     if (!value.isString()) Bad("\"prefix\" on \"" + field + "\" needs a string");
     const std::string text = value.asString();
+    CountText(text);
     std::vector<std::string> columns;
     std::vector<std::string> tokens;
     if (field == kAllField) {
@@ -323,9 +433,12 @@ class Parser {
       }
     }
     if (tokens.empty()) return QueryNode{};  // every value starts with ""
+    for (size_t i = 1; i <= tokens.size(); ++i) CountWords(i);
     QueryNode node;
     node.type = columns.empty() ? QueryNode::Type::kNone : QueryNode::Type::kText;
-    node.fts = ColumnFilter(columns) + " : " + Phrase(tokens) + " *";
+    node.fts = ColumnFilter(columns) + " : " + FtsPhrase(tokens) + " *";
+    const std::vector<std::string> name_columns = NameWordColumns(field);
+    if (!name_columns.empty()) node.name_fts = ColumnFilter(name_columns) + " : " + FtsPhrase(tokens) + " *";
     return node;
   }
 
@@ -380,6 +493,8 @@ class Parser {
   const IndexSchema& schema_;
   std::set<std::string>* highlight_;
   size_t clauses_ = 0;
+  size_t words_ = 0;
+  size_t text_bytes_ = 0;
 };
 
 // The first full-text clause every hit must satisfy: the clause itself, or
@@ -396,6 +511,18 @@ const QueryNode* FindRanked(const QueryNode& node) {
 std::string JsonField(int code) { return "corv_field(d.key, d.doc, " + std::to_string(code) + ")"; }
 
 }  // namespace
+
+std::string FtsPhrase(const std::vector<std::string>& tokens) {
+  std::string out = "\"";
+  for (size_t i = 0; i < tokens.size(); ++i) {
+    if (i > 0) out += ' ';
+    for (const char c : tokens[i]) {
+      out += c;
+      if (c == '"') out += '"';
+    }
+  }
+  return out + "\"";
+}
 
 std::string PrefixUpperBound(const std::string& prefix) {
   std::string bound = prefix;

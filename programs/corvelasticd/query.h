@@ -35,6 +35,11 @@ struct QueryNode {
   bool low_inclusive = true, high_inclusive = true;
   std::vector<SqlValue> numbers;   // kNumberIn
   std::vector<QueryNode> must, should, must_not;
+  // kText on the catch-all field: the same words within file names only
+  // (ranks name matches first), and the words a name must consist of to be
+  // an exact match (empty when the clause cannot give one, as a prefix).
+  std::string name_fts;
+  std::vector<std::string> exact_name_tokens;
 };
 
 class Query {
@@ -49,6 +54,10 @@ class Query {
   void Compile(bool ranked, std::string* condition, std::vector<SqlValue>* values) const;
   bool HasRankedClause() const { return ranked_ != nullptr; }
   const std::string& RankedExpression() const { return ranked_->fts; }
+  // The driving clause's words within names, and the tokens of an exact
+  // name; empty when it has none (see QueryNode).
+  const std::string& RankedNameExpression() const { return ranked_->name_fts; }
+  const std::vector<std::string>& ExactNameTokens() const { return ranked_->exact_name_tokens; }
 
   // Folded words the query looks for, to highlight them in a snippet.
   const std::set<std::string>& HighlightTokens() const { return highlight_; }
@@ -60,6 +69,9 @@ class Query {
   const QueryNode* ranked_ = nullptr;
   std::set<std::string> highlight_;
 };
+
+// One token or phrase in the full-text index's expression syntax, quotes doubled.
+std::string FtsPhrase(const std::vector<std::string>& tokens);
 
 // The exclusive upper bound of keys that start with `prefix` (empty when
 // there is none: the prefix is all 0xFF bytes).

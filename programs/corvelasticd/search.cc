@@ -1,6 +1,7 @@
 #include "programs/corvelasticd/search.h"
 
 #include <algorithm>
+#include <chrono>
 #include <map>
 
 #include "programs/corvelasticd/daemon_error.h"
@@ -17,6 +18,11 @@ constexpr int64_t kMaxWindow = 100000;          // from + size
 constexpr size_t kDefaultCheckBudget = 1000;     // candidates checked past the page for the total
 constexpr size_t kSuggestCheckBudget = 200;
 constexpr int64_t kMaxSuggestions = 100;
+constexpr size_t kMaxLoadFields = 256;       // an index has a few dozen fields
+constexpr size_t kMaxMarkBytes = 64;         // highlight marks: "<em>", a terminal's bold
+// How long a search naming no index waits for indexes still opening after a
+// start (usually milliseconds) before it answers 1401 rather than leave one out.
+constexpr std::chrono::milliseconds kOpeningWait{2000};
 
 struct SortRequest {
   std::string field = "_score";
@@ -35,7 +41,9 @@ SortRequest ParseSort(const Json::Value& sort) {
     request.descending = request.field == "_score";
   } else if (first.isObject() && first["field"].isString()) {
     request.field = first["field"].asString();
-    const std::string order = first.get("order", request.field == "_score" ? "desc" : "asc").asString();
+    const Json::Value& given = first["order"];
+    if (!given.isNull() && !given.isString()) throw DaemonError(kCodeBadArgument, "\"order\" must be \"asc\" or \"desc\"");
+    const std::string order = given.isNull() ? (request.field == "_score" ? "desc" : "asc") : given.asString();
     if (order != "asc" && order != "desc") throw DaemonError(kCodeBadArgument, "\"order\" must be \"asc\" or \"desc\"");
     request.descending = order == "desc";
   } else {
@@ -67,12 +75,13 @@ std::vector<std::shared_ptr<IndexHandle>> TargetIndexes(const IndexRegistry& reg
     if (!data["ids"].isArray()) throw DaemonError(kCodeBadArgument, "\"ids\" must be an array of index ids");
     for (const Json::Value& id : data["ids"]) {
       if (!id.isString()) throw DaemonError(kCodeBadArgument, "\"ids\" must be an array of index ids");
-      ids.push_back(id.asString());
+      // Each index once, however often it is named.
+      if (std::find(ids.begin(), ids.end(), id.asString()) == ids.end()) ids.push_back(id.asString());
     }
   } else if (data.isMember("id")) {
     ids.push_back(RequiredString(data, "id"));
   } else {
-    return registry.Ready();  // no index named: every ready index
+    return registry.AllForSearch(kOpeningWait);  // no index named: every index
   }
   std::vector<std::shared_ptr<IndexHandle>> handles;
   for (const std::string& id : ids) handles.push_back(registry.Get(id));
@@ -101,9 +110,13 @@ Json::Value RunSearch(const IndexRegistry& registry, const Json::Value& data, co
   const int64_t from = OptionalInt(data, "from", 0);
   const int64_t size = OptionalInt(data, "size", kDefaultSize);
   if (from < 0 || size < 0 || size > kMaxSize) throw DaemonError(kCodeBadArgument, "\"size\" must be 0.." + std::to_string(kMaxSize) + " and \"from\" at least 0");
-  if (from + size > kMaxWindow) throw DaemonError(kCodeBadArgument, "\"from\" + \"size\" must not exceed " + std::to_string(kMaxWindow));
+  // Compared without adding: a huge "from" must not overflow.
+  if (from > kMaxWindow - size) throw DaemonError(kCodeBadArgument, "\"from\" + \"size\" must not exceed " + std::to_string(kMaxWindow));
   const SortRequest sort = ParseSort(data["sort"]);
   const std::vector<std::string> load_fields = OptionalStrings(data, "load_field");
+  if (load_fields.size() > kMaxLoadFields) {
+    throw DaemonError(kCodeBadArgument, "\"load_field\" names more than " + std::to_string(kMaxLoadFields) + " fields");
+  }
   const bool track_total = OptionalBool(data, "track_total", false);
   Json::Value clause;
   if (data.isMember("query")) {
@@ -120,6 +133,10 @@ Json::Value RunSearch(const IndexRegistry& registry, const Json::Value& data, co
     style.size = static_cast<size_t>(std::clamp<int64_t>(OptionalInt(highlight, "size", 160), 20, 2000));
     style.pre = OptionalString(highlight, "pre", style.pre);
     style.post = OptionalString(highlight, "post", style.post);
+    // They are written around every word found in every hit.
+    if (style.pre.size() > kMaxMarkBytes || style.post.size() > kMaxMarkBytes) {
+      throw DaemonError(kCodeBadArgument, "\"pre\" and \"post\" may be " + std::to_string(kMaxMarkBytes) + " bytes at most");
+    }
   } else if (!highlight.isNull() && !highlight.isBool()) {
     throw DaemonError(kCodeBadArgument, "\"highlight\" must be true or {\"field\", \"size\", \"pre\", \"post\"}");
   }

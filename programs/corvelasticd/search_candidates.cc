@@ -26,7 +26,7 @@ bool StatementCandidates::Next(int64_t* rowid, Hit* hit) {
   }
   *rowid = select_->Int(0);
   hit->key = select_->Text(1);
-  hit->score = ranked_ ? -select_->Real(2) : 0.0;
+  hit->score = ranked_ ? -select_->Real(2) + (tiers_ != nullptr ? tiers_->Bonus(*rowid) : 0.0) : 0.0;
   hit->sort_value = ColumnValue(*select_, 3);
   return true;
 }
@@ -39,12 +39,17 @@ std::string KeysOfRowsSql() {
   return sql + ")";
 }
 
-RankedMatchCandidates::RankedMatchCandidates(Database& reader, const std::string& match, const KeyDirectory* keys,
-                                             uint64_t keys_at)
-    : keys_of_rows_(reader.Cached(KeysOfRowsSql())), keys_(keys), keys_at_(keys_at) {
-  Statement& matches = reader.Cached("SELECT rowid, rank FROM fts_text WHERE fts_text MATCH ?");
+RankedMatchCandidates::RankedMatchCandidates(Database& reader, const std::string& match,
+                                             const std::string& rank_expression, const NameTiers& tiers,
+                                             int recency_code, const KeyDirectory* keys, uint64_t keys_at)
+    : keys_of_rows_(reader.Cached(KeysOfRowsSql())), reader_(reader), recency_code_(recency_code), keys_(keys),
+      keys_at_(keys_at) {
+  Statement& matches = reader.Cached("SELECT rowid, " + rank_expression + " FROM fts_text WHERE fts_text MATCH ?");
   matches.BindText(1, match);
-  while (matches.Step()) ranked_.emplace_back(matches.Real(1), matches.Int(0));
+  while (matches.Step()) {
+    const int64_t rowid = matches.Int(0);
+    ranked_.emplace_back(matches.Real(1) - tiers.Bonus(rowid), rowid);
+  }
   matches.Reset();
   // A commit begun before the snapshot was taken: the directory may be ahead of it.
   if (keys_ != nullptr && keys_->generation() != keys_at_) keys_ = nullptr;
@@ -91,17 +96,41 @@ bool RankedMatchCandidates::LoadNextWindow() {
     // A match without its document (never the case in a consistent index) is left out, as a join would.
     window_.erase(std::remove_if(window_.begin(), window_.end(), [](const Candidate& c) { return !c.found; }), window_.end());
   }
-  // Within a run of equal scores, byte order of the keys, as SQLite compares text.
   for (size_t run = 0; run < window_.size();) {
     size_t run_end = run + 1;
     while (run_end < window_.size() && window_[run_end].rank == window_[run].rank) ++run_end;
-    if (run_end - run > 1) {
-      std::sort(window_.begin() + static_cast<std::ptrdiff_t>(run), window_.begin() + static_cast<std::ptrdiff_t>(run_end),
-                [](const Candidate& a, const Candidate& b) { return a.key < b.key; });
-    }
+    if (run_end - run > 1) OrderRun(run, run_end);
     run = run_end;
   }
   return !window_.empty();
+}
+
+void RankedMatchCandidates::OrderRun(size_t begin, size_t end) {
+  if (recency_code_ >= 0) {
+    std::unordered_map<int64_t, size_t> slot;
+    for (size_t i = begin; i < end; ++i) slot.emplace(window_[i].rowid, i);
+    Statement& dates = reader_.Cached("SELECT rowid, corv_field(key, doc, ?) FROM docs WHERE rowid = ?");
+    for (size_t i = begin; i < end; ++i) {
+      dates.Reset();
+      dates.Bind(1, static_cast<int64_t>(recency_code_));
+      dates.Bind(2, window_[i].rowid);
+      if (dates.Step()) window_[i].recency = ColumnValue(dates, 1);
+    }
+    dates.Reset();
+  }
+  // Newest first (a file without the date last), then byte order of the
+  // keys, as SQLite compares text.
+  const auto date = [](const SqlValue& value) {
+    if (std::holds_alternative<int64_t>(value)) return static_cast<double>(std::get<int64_t>(value));
+    if (std::holds_alternative<double>(value)) return std::get<double>(value);
+    return -1e300;
+  };
+  std::sort(window_.begin() + static_cast<std::ptrdiff_t>(begin), window_.begin() + static_cast<std::ptrdiff_t>(end),
+            [&](const Candidate& a, const Candidate& b) {
+              const double x = date(a.recency), y = date(b.recency);
+              if (x != y) return x > y;
+              return a.key < b.key;
+            });
 }
 
 bool RankedMatchCandidates::Next(int64_t* rowid, Hit* hit) {
@@ -109,7 +138,7 @@ bool RankedMatchCandidates::Next(int64_t* rowid, Hit* hit) {
   Candidate& candidate = window_[window_next_++];
   *rowid = candidate.rowid;
   hit->key = std::move(candidate.key);
-  hit->score = -candidate.rank;
+  hit->score = -candidate.rank;  // the tier bonus is part of it
   hit->sort_value = nullptr;
   return true;
 }

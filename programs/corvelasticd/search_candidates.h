@@ -11,6 +11,7 @@
 
 #include "programs/corvelasticd/index_store.h"
 #include "programs/corvelasticd/key_directory.h"
+#include "programs/corvelasticd/search_ranking.h"
 #include "programs/corvelasticd/sqlite_db.h"
 
 namespace corvlumex {
@@ -26,18 +27,23 @@ class SearchCandidates {
 // The rows of a statement that selects (rowid, key, rank or 0, sort value).
 class StatementCandidates : public SearchCandidates {
  public:
-  StatementCandidates(std::unique_ptr<Statement> select, bool ranked) : select_(std::move(select)), ranked_(ranked) {}
+  // `tiers` (may be null) adds the name tier to the scores of ranked rows.
+  StatementCandidates(std::unique_ptr<Statement> select, bool ranked, const NameTiers* tiers)
+      : select_(std::move(select)), ranked_(ranked), tiers_(tiers) {}
   bool Next(int64_t* rowid, Hit* hit) override;
 
  private:
   std::unique_ptr<Statement> select_;
   bool ranked_;
+  const NameTiers* tiers_;
   // SQLite starts a finished statement over when stepped again: a search
   // that had counted every candidate then called its total inexact.
   bool done_ = false;
 };
 
-// The matches of one full-text expression, best first, ties in key order.
+// The matches of one full-text expression, best first (name tier, then
+// `rank_expression`), ties newest first (field `recency_code`, -1: none),
+// then in key order.
 // Every match is scored, but a match's key is read from "docs" (a random
 // page of a large table) only when the caller reaches it: a word found in
 // many documents costs one score each, not a document lookup and a sort
@@ -47,21 +53,27 @@ class RankedMatchCandidates : public SearchCandidates {
  public:
   // `keys` (may be null) gives the keys when it is at generation `keys_at`
   // (the reader's snapshot), else they are read from "docs".
-  RankedMatchCandidates(Database& reader, const std::string& match, const KeyDirectory* keys, uint64_t keys_at);
+  RankedMatchCandidates(Database& reader, const std::string& match, const std::string& rank_expression,
+                        const NameTiers& tiers, int recency_code, const KeyDirectory* keys, uint64_t keys_at);
   bool Next(int64_t* rowid, Hit* hit) override;
 
  private:
   struct Candidate {
-    double rank;
+    double rank;  // tier bonus taken off: lower is better
     int64_t rowid;
     std::string key;
     bool found;
+    SqlValue recency = nullptr;
   };
+  // Reads the recency of a run of equal scores and orders it.
+  void OrderRun(size_t begin, size_t end);
   // Reads the keys of the next window of matches (whole runs of equal
   // scores) and puts each run in key order.
   bool LoadNextWindow();
 
   Statement& keys_of_rows_;
+  Database& reader_;
+  int recency_code_;
   const KeyDirectory* keys_;
   uint64_t keys_at_;
   std::vector<std::pair<double, int64_t>> ranked_;  // (rank, rowid), best (lowest rank) first

@@ -8,18 +8,21 @@
 #include <sys/un.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <chrono>
 #include <cstring>
 #include <stdexcept>
+#include <system_error>
+#include <new>
 #include <thread>
 
 #include "common/error.h"
 #include "common/log.h"
 #include "common/sys.h"
 #include "fileindex/communication.h"
+#include "fileindex/frame_reader.h"
 #include "programs/corvelasticd/daemon_error.h"
-#include "programs/corvelasticd/request_frame.h"
 
 namespace corvlumex {
 namespace elasticd {
@@ -127,7 +130,15 @@ void Server::Run() {
 void Server::StartWorker() {
   ++workers_;
   ++waiting_;
-  std::thread([this] { WorkerLoop(); }).detach();
+  try {
+    std::thread([this] { WorkerLoop(); }).detach();
+  } catch (const std::system_error& error) {
+    // No thread to be had now (a flood of connections): the running
+    // workers serve on; the next connection tries again.
+    --workers_;
+    --waiting_;
+    CORV_LOG("cannot start a connection worker: %s", error.what());
+  }
 }
 
 int Server::Accept(int poll_fd) {
@@ -180,6 +191,19 @@ void Server::WorkerLoop() {
       ++waiting_;
       continue;
     }
+    const PeerIdentity peer = ReadPeerIdentity(fd);
+    const bool counted = peer.uid != 0 && std::find(options_.trusted_uids.begin(), options_.trusted_uids.end(), peer.uid) ==
+                                              options_.trusted_uids.end();
+    if (counted && per_user_[peer.uid] >= options_.max_clients_per_user) {
+      lock.unlock();
+      SendAnswer(fd, Dispatcher::ErrorAnswer(kCodeBusy, "Too many connections from user " + std::to_string(peer.uid) +
+                                                            "; close some or try again later"));
+      close(fd);
+      lock.lock();
+      ++waiting_;
+      continue;
+    }
+    if (counted) ++per_user_[peer.uid];
     ++serving_;
     open_fds_.insert(fd);
     // Someone must be waiting for the next client (or to tell it the server is full).
@@ -187,11 +211,12 @@ void Server::WorkerLoop() {
     lock.unlock();
     const struct timeval send_timeout = {options_.stall_ms / 1000, (options_.stall_ms % 1000) * 1000};
     setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &send_timeout, sizeof(send_timeout));
-    Serve(fd);
+    Serve(fd, peer);
     lock.lock();
     open_fds_.erase(fd);
     close(fd);
     --serving_;
+    if (counted && --per_user_[peer.uid] == 0) per_user_.erase(peer.uid);
     if (waiting_ >= kMaxIdleWorkers) break;
     ++waiting_;
   }
@@ -199,11 +224,12 @@ void Server::WorkerLoop() {
   if (--workers_ == 0) all_done_.notify_all();
 }
 
-void Server::Serve(int fd) {
-  const PeerIdentity peer = ReadPeerIdentity(fd);
+void Server::Serve(int fd, const PeerIdentity& peer) {
+  using fileindex::FrameStatus;
   std::string request;
   for (;;) {
-    const FrameStatus status = ReadRequestFrame(fd, options_.max_frame_bytes, options_.idle_ms, options_.stall_ms, &request);
+    const FrameStatus status =
+        fileindex::ReadFrameBounded(fd, options_.max_frame_bytes, options_.idle_ms, options_.stall_ms, &request, options_.frame_ms);
     if (status == FrameStatus::kTooLarge) {
       // The rest of the frame is not read, so the connection cannot go on.
       SendAnswer(fd, Dispatcher::ErrorAnswer(kCodeFrameTooLarge, "The request is larger than " +
@@ -215,7 +241,24 @@ void Server::Serve(int fd) {
       return;
     }
     if (status != FrameStatus::kOk) return;
-    SendAnswer(fd, dispatcher_.Handle(request, peer));
+    SendAnswer(fd, AnswerTo(request, peer));
+  }
+}
+
+std::string Server::AnswerTo(const std::string& request, const PeerIdentity& peer) {
+  // Whatever one request throws ends that request, never the daemon: an
+  // exception leaving a worker thread would abort every search.
+  try {
+    return dispatcher_.Handle(request, peer);
+  } catch (const std::bad_alloc&) {
+    CORV_LOG("a request of %zu bytes ran out of memory", request.size());
+    return Dispatcher::ErrorAnswer(kCodeInternal, "The daemon ran out of memory for this request");
+  } catch (const std::exception& error) {
+    CORV_LOG("a request failed unexpectedly: %s", error.what());
+    return Dispatcher::ErrorAnswer(kCodeInternal, std::string("Internal error: ") + error.what());
+  } catch (...) {
+    CORV_LOG("a request failed unexpectedly");
+    return Dispatcher::ErrorAnswer(kCodeInternal, "Internal error");
   }
 }
 

@@ -11,8 +11,10 @@
 #include <atomic>
 #include <condition_variable>
 #include <mutex>
+#include <map>
 #include <set>
 #include <string>
+#include <vector>
 
 #include "programs/corvelasticd/dispatcher.h"
 
@@ -25,8 +27,14 @@ struct ServerOptions {
   gid_t socket_group = static_cast<gid_t>(-1);
   size_t max_frame_bytes = 64u << 20;
   int max_clients = 256;
+  // Connections one user may hold, so that nobody can take every connection
+  // (and with them search and indexing) for himself; root and `trusted_uids`
+  // (the library's users) are not counted.
+  int max_clients_per_user = 64;
+  std::vector<uid_t> trusted_uids;
   int idle_ms = 60000;                 // a kept-open connection with no new request
   int stall_ms = 10000;                // a frame that stops arriving half way
+  int frame_ms = 60000;                // a whole frame, from its first byte (a client trickling bytes)
 };
 
 class Server {
@@ -43,7 +51,9 @@ class Server {
   void Stop();
 
  private:
-  void Serve(int fd);
+  void Serve(int fd, const PeerIdentity& peer);
+  // The answer to one request text; never throws.
+  std::string AnswerTo(const std::string& request, const PeerIdentity& peer);
   // With mutex_ held.
   void StartWorker();
   void WorkerLoop();
@@ -61,6 +71,7 @@ class Server {
   int waiting_ = 0;   // workers waiting for a connection
   int serving_ = 0;   // connections being served
   std::set<int> open_fds_;
+  std::map<uid_t, int> per_user_;  // connections served, by user (the counted ones)
 };
 
 }  // namespace elasticd

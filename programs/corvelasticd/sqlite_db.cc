@@ -117,5 +117,12 @@ std::unique_ptr<Statement> Database::Prepare(const std::string& sql) {
   return std::make_unique<Statement>(db_, stmt, true);
 }
 
+void Database::CheckpointPassive() {
+  const int rc = sqlite3_wal_checkpoint_v2(db_, nullptr, SQLITE_CHECKPOINT_PASSIVE, nullptr, nullptr);
+  // Busy means a reader or another checkpoint holds part of the log; the
+  // next commit's checkpoint takes it further.
+  if (rc != SQLITE_OK && rc != SQLITE_BUSY) ThrowSqlite(db_, rc, "checkpoint");
+}
+
 }  // namespace elasticd
 }  // namespace corvlumex

@@ -63,6 +63,9 @@ class Database {
   // A statement for one use.
   std::unique_ptr<Statement> Prepare(const std::string& sql);
   int64_t Changes() const { return sqlite3_changes64(db_); }
+  // Copies what the write-ahead log holds into the database, as far as no
+  // reader still needs it, without waiting for readers or blocking them.
+  void CheckpointPassive();
   sqlite3* raw() { return db_; }
 
  private:

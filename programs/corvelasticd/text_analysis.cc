@@ -2,6 +2,7 @@
 
 #include <utf8proc.h>
 
+#include <algorithm>
 #include <cstdint>
 
 namespace corvlumex {
@@ -100,7 +101,40 @@ int StandardKind(int32_t cp) {
 
 int WhitespaceKind(int32_t cp) { return IsBlank(cp) ? 0 : 1; }
 
+bool IsAsciiUpper(char c) { return c >= 'A' && c <= 'Z'; }
+bool IsAsciiLowerOrDigit(char c) { return (c >= 'a' && c <= 'z') || (c >= '0' && c <= '9'); }
+
 }  // namespace
+
+void AddWordParts(std::string_view word, std::vector<std::string>* tokens) {
+  std::vector<std::string_view> parts;  // allocated only for a word that has parts
+  bool split = false;
+  size_t start = 0;
+  for (size_t i = 0; i < word.size(); ++i) {
+    bool cut_before = false, skip = false;
+    if (word[i] == '_') {
+      skip = true;
+    } else if (i > start && IsAsciiUpper(word[i])) {
+      // "readFile": a capital after a small letter or digit starts a part;
+      // "XMLParser": so does the last capital of a run followed by a small
+      // letter, when the run is an acronym of two letters or more.
+      if (IsAsciiLowerOrDigit(word[i - 1])) {
+        cut_before = true;
+      } else if (i + 1 < word.size() && word[i + 1] >= 'a' && word[i + 1] <= 'z' && i - start >= 2 &&
+                 IsAsciiUpper(word[i - 1]) && IsAsciiUpper(word[i - 2])) {
+        cut_before = true;
+      }
+    }
+    if (skip || cut_before) {
+      split = true;
+      if (i > start) parts.push_back(word.substr(start, i - start));
+      start = skip ? i + 1 : i;
+    }
+  }
+  if (!split) return;  // a plain word
+  if (start < word.size()) parts.push_back(word.substr(start));
+  for (const std::string_view part : parts) tokens->push_back(Fold(part, FoldMode::kSearch));
+}
 
 std::string Fold(std::string_view text, FoldMode mode) {
   if (IsAscii(text)) return AsciiLower(text);
@@ -137,14 +171,28 @@ void Analyze(Analyzer analyzer, std::string_view text, std::vector<std::string>*
     tokens->push_back(std::move(token));
     return;
   }
-  const std::string folded = Fold(text, FoldMode::kSearch);
-  const std::string_view view(folded);
-  auto add = [&](size_t begin, size_t end) { tokens->emplace_back(view.substr(begin, end - begin)); };
   if (analyzer == Analyzer::kWhitespace) {
-    SplitRuns(view, WhitespaceKind, add);
-  } else {
-    SplitRuns(view, StandardKind, add);
+    const std::string folded = Fold(text, FoldMode::kSearch);
+    const std::string_view view(folded);
+    SplitRuns(view, WhitespaceKind, [&](size_t begin, size_t end) { tokens->emplace_back(view.substr(begin, end - begin)); });
+    return;
   }
+  if (text.find('_') == std::string_view::npos &&
+      std::none_of(text.begin(), text.end(), [](char c) { return IsAsciiUpper(c); })) {
+    // No word can have parts: fold once and split, which costs less than
+    // folding word by word and gives the same words.
+    const std::string folded = Fold(text, FoldMode::kSearch);
+    const std::string_view view(folded);
+    SplitRuns(view, StandardKind, [&](size_t begin, size_t end) { tokens->emplace_back(view.substr(begin, end - begin)); });
+    return;
+  }
+  // Words are found before folding: the case of the letters marks where a
+  // camelCase word's parts meet.
+  SplitRuns(text, StandardKind, [&](size_t begin, size_t end) {
+    const std::string_view word = text.substr(begin, end - begin);
+    tokens->push_back(Fold(word, FoldMode::kSearch));
+    AddWordParts(word, tokens);
+  });
 }
 
 std::vector<std::vector<std::string>> AnalyzeQuery(Analyzer analyzer, std::string_view text) {

@@ -31,6 +31,14 @@ enum class Analyzer {
 // have their blanks replaced by '\x1F' so no token ever holds a blank.
 void Analyze(Analyzer analyzer, std::string_view text, std::vector<std::string>* tokens);
 
+// Appends the parts of one word of kStandard when it is joined by '_' or
+// written in camelCase ("pthread_mutex_lock": pthread, mutex, lock;
+// "readFileSync": read, file, sync; "XMLParser": xml, parser), folded;
+// nothing for a plain word. kStandard gives a word's parts right after the
+// whole word, so the whole word and each part are found, and a phrase
+// query, analysed the same way, still matches the same run of tokens.
+void AddWordParts(std::string_view word, std::vector<std::string>* tokens);
+
 // The tokens of the query text, grouped by the blank-separated word they
 // came from ("ac-3 tokyo" under kStandard gives [[ac, 3], [tokyo]]); a group
 // of several tokens is searched as a phrase.

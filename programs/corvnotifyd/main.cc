@@ -20,6 +20,8 @@
 #include "common/error.h"
 #include "common/log.h"
 #include "common/sys.h"
+#include "platform/linux/config_files.h"
+#include "platform/linux/notifier_presence.h"
 #include "programs/corvnotifyd/notifier.h"
 
 namespace {
@@ -31,7 +33,7 @@ void Usage(FILE* out) {
           "usage: corvnotifyd [--foreground] [--config-dir DIR]\n"
           "  --foreground    stay attached to the terminal and log to standard error\n"
           "  --config-dir    folder of the monitor-queue configurations (default %s)\n",
-          corvlumex::SysPath("/etc/corvlumex/monitor.d").c_str());
+          corvlumex::platform::NotifierConfigDir().c_str());
 }
 
 // Test hooks, honoured only inside a sandbox root so that a stray variable
@@ -53,7 +55,7 @@ void ApplyTestHooks(NotifierOptions* options) {
 int main(int argc, char** argv) {
   bool foreground = false;
   NotifierOptions options;
-  options.config_dir = corvlumex::SysPath("/etc/corvlumex/monitor.d");
+  options.config_dir = corvlumex::platform::NotifierConfigDir();
   for (int i = 1; i < argc; ++i) {
     const std::string arg = argv[i];
     if (arg == "--foreground") {
@@ -75,16 +77,33 @@ int main(int argc, char** argv) {
 
   // Two notifiers reading one configuration would append every change twice:
   // the configuration folder stays locked while this one runs (the lock goes
-  // with the process, also into the background child).
+  // with the process, also into the background child). It also carries the
+  // mark by which `fileindex status` tells that a notifier runs. The folder
+  // is made first, so that even the first run is locked and seen.
+  if (!corvlumex::platform::MakeDirs(options.config_dir)) {
+    fprintf(stderr, "corvnotifyd: cannot create the configuration folder %s: %s\n", options.config_dir.c_str(),
+            strerror(errno));
+    return 1;
+  }
   const int config_lock = open(options.config_dir.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
-  if (config_lock >= 0 && flock(config_lock, LOCK_EX | LOCK_NB) != 0) {
+  if (config_lock < 0) {
+    fprintf(stderr, "corvnotifyd: cannot open the configuration folder %s: %s\n", options.config_dir.c_str(),
+            strerror(errno));
+    return 1;
+  }
+  if (flock(config_lock, LOCK_EX | LOCK_NB) != 0) {
     fprintf(stderr, "corvnotifyd: another corvnotifyd already watches as configured in %s\n",
             options.config_dir.c_str());
     return 1;
   }
+  if (!corvlumex::platform::HoldNotifierPresence(config_lock)) {
+    fprintf(stderr, "corvnotifyd: cannot lock the configuration folder %s: %s\n", options.config_dir.c_str(),
+            strerror(errno));
+    return 1;
+  }
 
   if (foreground) {
-    corvlumex::SetLogSink([](int, const std::string& line) { fprintf(stderr, "corvnotifyd: %s\n", line.c_str()); });
+    corvlumex::LogToStderr("corvnotifyd");
   } else {
     openlog("corvnotifyd", LOG_PID, LOG_DAEMON);
     if (daemon(0, 0) != 0) {

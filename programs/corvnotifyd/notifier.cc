@@ -6,7 +6,6 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
-#include <fstream>
 
 #include "common/error.h"
 #include "common/file_util.h"
@@ -15,6 +14,7 @@
 #include "platform/linux/config_files.h"
 #include "programs/corvnotifyd/admin_notice.h"
 #include "programs/corvnotifyd/event_line.h"
+#include "programs/corvnotifyd/loss_advice.h"
 
 namespace corvlumex {
 namespace notifyd {
@@ -36,41 +36,13 @@ int OpenInotify() {
   return fd;
 }
 
-std::string KernelLimit(const char* name) {
-  std::ifstream in(std::string("/proc/sys/fs/inotify/") + name);
-  long value = 0;
-  if (!(in >> value)) return "unknown";
-  return std::to_string(value);
-}
-
-// The log line that says what was lost and how to stop it happening.
-std::string Remedy(LossKind kind) {
-  switch (kind) {
-    case LossKind::kKernelOverflow: {
-      const std::string now = KernelLimit("max_queued_events");
-      return "the kernel's inotify event queue overflowed (fs.inotify.max_queued_events=" + now +
-             "); raise it, e.g. sysctl -w fs.inotify.max_queued_events=" +
-             (now == "unknown" ? std::string("65536") : std::to_string(std::stol(now) * 4)) +
-             " (and in /etc/sysctl.d/ to keep it)";
-    }
-    case LossKind::kNoWatches: {
-      const std::string now = KernelLimit("max_user_watches");
-      return "the kernel has no inotify watch left (fs.inotify.max_user_watches=" + now +
-             "); raise it, e.g. sysctl -w fs.inotify.max_user_watches=" +
-             (now == "unknown" ? std::string("1048576") : std::to_string(std::stol(now) * 2)) +
-             " (and in /etc/sysctl.d/ to keep it)";
-    }
-    case LossKind::kQueueUnwritable:
-      return "the queue could not be written for too long and its pending lines were dropped";
-  }
-  return std::string();
-}
-
 }  // namespace
 
 Notifier::Notifier(NotifierOptions options)
     : options_(std::move(options)),
       inotify_fd_(OpenInotify()),
+      // Fixed for this instance when it was made: the length that overflows.
+      queued_events_in_force_(ReadInotifyLimit("max_queued_events")),
       raw_(options_.max_raw_bytes),
       tree_(inotify_fd_),
       writer_(options_.max_pending_bytes,
@@ -105,8 +77,28 @@ void Notifier::Start() {
   WatchConfigDir();
   config_dirty_ = true;
   ReloadConfig();
+  // Every folder is watched now: the kernel queues each change from here on.
+  WriteStartMarkers();
   reader_ = std::make_unique<InotifyReader>(inotify_fd_, &raw_, options_.pause_file);
   reader_->Start();
+}
+
+void Notifier::WriteStartMarkers() {
+  // Nobody saw the changes made while no notifier ran (stopped, killed,
+  // crashed, not yet started): each watched share is checked against the
+  // disk. The marker is written after the watches are set, so the check
+  // (which reads the disk after it reads the marker) sees every change made
+  // before them, and the lines cover every change made after them.
+  std::set<std::string> queues;
+  for (const WatchRoot& root : tree_.roots()) queues.insert(root.queue);
+  for (const std::string& queue : queues) {
+    FormatQueueLine(writer_.Buffer(queue), kEventQueueCrash, true, MarkerPath(queue));
+  }
+  writer_.Flush(Clock::now(), true);
+  if (queues.empty()) return;
+  CORV_LOG("started: changes made while no notifier ran were not seen, so each watched share is checked against the "
+           "disk (a crash marker in the queue of %zu share%s)",
+           queues.size(), queues.size() == 1 ? "" : "s");
 }
 
 void Notifier::Stop() {
@@ -143,6 +135,9 @@ void Notifier::OnLoss(const std::string& queue, LossKind kind, const std::string
   const bool was_pending = backoff.Pending();
   backoff.OnLoss(now);
   loss_kinds_[queue].insert(kind);
+  // The watch limit applies to each new watch: the one in force is the one
+  // that refused this watch.
+  if (kind == LossKind::kNoWatches) user_watches_at_loss_ = ReadInotifyLimit("max_user_watches");
   if (!was_pending && !backoff.Due(now)) {
     CORV_LOG("events of queue %s lost again inside its back-off window: its next crash marker is written in %lld s",
              queue.c_str(),
@@ -155,8 +150,20 @@ void Notifier::OnLoss(const std::string& queue, LossKind kind, const std::string
 void Notifier::TellAdministrators(LossKind kind) {
   if (kind == LossKind::kQueueUnwritable || !told_.insert(kind).second) return;
   const char* notice = kind == LossKind::kKernelOverflow ? kNoticeInotifyOverflow : kNoticeInotifyWatchLimit;
-  CORV_LOG("telling the administrators: %s (%s)", notice, Remedy(kind).c_str());
+  CORV_LOG("telling the administrators: %s (%s)", notice, Advice(kind).c_str());
   SendAdminNotice(notice);
+}
+
+std::string Notifier::Advice(LossKind kind) const {
+  switch (kind) {
+    case LossKind::kKernelOverflow:
+      return LossAdvice(kind, queued_events_in_force_, ReadInotifyLimit("max_queued_events"));
+    case LossKind::kNoWatches:
+      return LossAdvice(kind, user_watches_at_loss_, ReadInotifyLimit("max_user_watches"));
+    case LossKind::kQueueUnwritable:
+      break;
+  }
+  return LossAdvice(kind, -1, -1);
 }
 
 std::string Notifier::MarkerPath(const std::string& queue) const {
@@ -182,7 +189,7 @@ void Notifier::WriteDueMarkers(Clock::time_point now, bool shutting_down) {
     const bool complete = shutting_down || translator_.Rewatch(queue);
     const unsigned losses = backoff.losses();
     std::string reasons;
-    for (LossKind kind : loss_kinds_[queue]) reasons += "; " + Remedy(kind);
+    for (LossKind kind : loss_kinds_[queue]) reasons += "; " + Advice(kind);
     loss_kinds_.erase(queue);
     FormatQueueLine(writer_.Buffer(queue), kEventQueueCrash, true, MarkerPath(queue));
     backoff.MarkerWritten(now);

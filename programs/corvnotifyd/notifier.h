@@ -59,13 +59,18 @@ class Notifier {
   void WatchConfigDir();
   void ReloadConfig();
   void OnLoss(const std::string& queue, LossKind kind, const std::string& detail);
+  void WriteStartMarkers();
   void WriteDueMarkers(Clock::time_point now, bool shutting_down);
+  // The log line's advice for a loss, quoting the kernel limit in force.
+  std::string Advice(LossKind kind) const;
   std::string MarkerPath(const std::string& queue) const;
   void TellAdministrators(LossKind kind);
   std::chrono::milliseconds NextWakeUp(Clock::time_point now) const;
 
   NotifierOptions options_;
   int inotify_fd_ = -1;
+  long queued_events_in_force_ = -1;  // fs.inotify.max_queued_events of this instance
+  long user_watches_at_loss_ = -1;    // fs.inotify.max_user_watches when a watch was refused
   RawEventQueue raw_;
   WatchTree tree_;
   QueueWriter writer_;

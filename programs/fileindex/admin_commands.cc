@@ -12,7 +12,7 @@
 #include "fileindex/status_mgr.h"
 #include "programs/fileindex/argument_checks.h"
 #include "programs/fileindex/commands.h"
-#include "programs/fileindex/daemon_client.h"
+#include "programs/frontend/daemon_client.h"
 
 namespace corvlumex {
 namespace cli {
@@ -126,7 +126,7 @@ void AddUser(CLI::App& app, Output& output) {
 
 void PrepareChange(const std::string& command) {
   RequireRoot(command);
-  RequireRunning(Daemon::kIndexer, "nothing was changed");
+  frontend::RequireRunning(frontend::Daemon::kIndexer, "nothing was changed");
 }
 
 void Done(const Output& output, const std::string& message) {

@@ -4,6 +4,7 @@
 #include <json/json.h>
 
 #include <iostream>
+#include <optional>
 
 #include "common/error.h"
 #include "common/file_util.h"
@@ -11,8 +12,9 @@
 #include "fileindex/index_mgr.h"
 #include "programs/fileindex/argument_checks.h"
 #include "programs/fileindex/commands.h"
-#include "programs/fileindex/daemon_client.h"
 #include "programs/fileindex/folder_support.h"
+#include "programs/frontend/daemon_client.h"
+#include "programs/frontend/folder_request.h"
 
 namespace corvlumex {
 namespace cli {
@@ -27,9 +29,19 @@ struct FolderArgs {
   double timeout = 0;
 };
 
-bool OnOff(const std::string& value, bool fallback) {
-  if (value.empty()) return fallback;
+std::optional<bool> OnOff(const std::string& value) {
+  if (value.empty()) return std::nullopt;
   return value == "on" || value == "yes" || value == "true" || value == "1";
+}
+
+frontend::FolderChoice Choice(const FolderArgs& args) {
+  frontend::FolderChoice choice;
+  choice.name = args.name;
+  choice.document = OnOff(args.document);
+  choice.audio = OnOff(args.audio);
+  choice.video = OnOff(args.video);
+  choice.photo = OnOff(args.photo);
+  return choice;
 }
 
 void AddCategoryOptions(CLI::App* command, FolderArgs& args) {
@@ -147,22 +159,15 @@ void AddAdd(CLI::App* folder, Output& output) {
       throw Error(kErrorDuplicatedId, path + " is already indexed (fileindex folder set " + path +
                                           " changes it, fileindex folder reindex " + path + " indexes it again)");
     }
-    Json::Value entry(Json::objectValue);
-    entry["path"] = path;
-    entry["name"] = add.name.empty() ? Basename(path) : add.name;
-    entry["document"] = OnOff(add.document, true);
-    entry["audio"] = OnOff(add.audio, true);
-    entry["video"] = OnOff(add.video, true);
-    entry["photo"] = OnOff(add.photo, true);
     Json::Value list(Json::arrayValue);
-    list.append(entry);
+    list.append(frontend::NewFolderRecord(path, Choice(add)));
     try {
       fileindex::FolderAdd(list, false);
     } catch (const Error& error) {
       // The first folder starts fileindexd; when it did not come up, the
       // folder is configured all the same and is indexed once it runs.
-      if (!fileindex::FolderMgr().HasFolder(path) || DaemonRunning(Daemon::kIndexer)) throw;
-      throw Error(error.code, path + " was added to the configuration, but " + NotRunningText(Daemon::kIndexer) +
+      if (!fileindex::FolderMgr().HasFolder(path) || frontend::DaemonRunning(frontend::Daemon::kIndexer)) throw;
+      throw Error(error.code, path + " was added to the configuration, but " + frontend::NotRunningText(frontend::Daemon::kIndexer) +
                                   "; it indexes the folder when it starts");
     }
     Finish(output, "added", {path}, add);
@@ -181,13 +186,8 @@ void AddSet(CLI::App* folder, Output& output) {
     const std::string path = ConfiguredFolder(set.path);
     Json::Value current;
     fileindex::FolderGet(current, path);
-    current["name"] = set.name.empty() ? current["name"].asString() : set.name;
-    current["document"] = OnOff(set.document, current["document"].asBool());
-    current["audio"] = OnOff(set.audio, current["audio"].asBool());
-    current["video"] = OnOff(set.video, current["video"].asBool());
-    current["photo"] = OnOff(set.photo, current["photo"].asBool());
     Json::Value list(Json::arrayValue);
-    list.append(current);
+    list.append(frontend::ChangedFolderRecord(current, Choice(set)));
     fileindex::FolderSet(list, false);
     Finish(output, "changed", {path}, set);
   });

@@ -12,7 +12,7 @@
 #include "fileindex/util.h"
 #include "programs/fileindex/cli_output.h"
 #include "programs/fileindex/folder_support.h"
-#include "programs/fileindex/daemon_client.h"
+#include "programs/frontend/daemon_client.h"
 
 namespace corvlumex {
 namespace cli {
@@ -35,7 +35,7 @@ struct Progress {
 Progress WorkersProgress(const std::set<std::string>& shares) {
   Progress progress;
   try {
-    const Json::Value status = AskDaemon("status", Json::Value(Json::objectValue));
+    const Json::Value status = frontend::AskDaemon("status", Json::Value(Json::objectValue));
     progress.state = "queued";
     for (const std::string& share : shares) {
       const Json::Value& entry = status["shares"][share];

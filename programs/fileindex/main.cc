@@ -29,7 +29,7 @@ int main(int argc, char** argv) {
   app.add_flag("-v,--verbose", verbose, "print the library's log lines on standard error");
   app.parse_complete_callback([&verbose] {
     if (verbose) {
-      SetLogSink([](int, const std::string& line) { std::cerr << line << std::endl; });
+      LogToStderr("fileindex");
     } else {
       // The library's failure lines repeat what the error message says.
       SetLogSink([](int, const std::string&) {});

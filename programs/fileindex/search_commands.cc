@@ -3,14 +3,17 @@
 #include <unistd.h>
 
 #include <iostream>
+#include <sstream>
 
 #include "common/error.h"
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/elastic/schema.h"
 #include "fileindex/file_type.h"
+#include "fileindex/query/user_query.h"
 #include "platform/platform.h"
 #include "programs/fileindex/commands.h"
-#include "programs/fileindex/daemon_client.h"
+#include "programs/frontend/daemon_client.h"
+#include "programs/frontend/search_request.h"
 
 namespace corvlumex {
 namespace cli {
@@ -22,7 +25,7 @@ constexpr char kBoldOn[] = "\033[1m";
 constexpr char kBoldOff[] = "\033[0m";
 
 struct SearchArgs {
-  std::string query;
+  std::vector<std::string> words;
   bool name = false;
   bool content = false;
   std::vector<std::string> shares;
@@ -31,48 +34,82 @@ struct SearchArgs {
   unsigned size = 20;
 };
 
-Json::Value MatchClause(const std::string& field, const std::string& text) {
-  Json::Value clause(Json::objectValue);
-  clause["match"][field]["query"] = text;
-  clause["match"][field]["operator"] = "and";
+// Points the query's text clauses (those on "_all") at file names only:
+// each word, phrase or prefix becomes a part of the name to find.
+Json::Value NamesOnly(const Json::Value& clause) {
+  if (!clause.isObject() || clause.size() != 1) return clause;
+  const std::string kind = clause.getMemberNames().front();
+  const Json::Value& body = clause[kind];
+  if (kind == "bool") {
+    Json::Value out(Json::objectValue);
+    for (const std::string& list : body.getMemberNames()) {
+      for (const Json::Value& member : body[list]) out["bool"][list].append(NamesOnly(member));
+    }
+    return out;
+  }
+  if ((kind != "match" && kind != "match_phrase" && kind != "prefix") || !body.isMember("_all")) return clause;
+  std::vector<std::string> parts;
+  const std::string text = body["_all"].asString();
+  if (kind == "match") {
+    std::istringstream words(text);
+    for (std::string word; words >> word;) parts.push_back(word);
+  } else {
+    parts.push_back(text);
+  }
+  Json::Value out(Json::objectValue);
+  for (const std::string& part : parts) {
+    Json::Value match(Json::objectValue);
+    match["match"][elastic::kFieldSearchFileName] = part;
+    out["bool"]["must"].append(match);
+  }
+  return out;
+}
+
+// Points the query's text clauses at the content only.
+Json::Value ContentOnly(const Json::Value& clause) {
+  if (clause.isArray() || clause.isObject()) {
+    Json::Value out(clause.type());
+    for (auto member = clause.begin(); member != clause.end(); ++member) {
+      const Json::Value converted = ContentOnly(*member);
+      if (clause.isArray()) {
+        out.append(converted);
+      } else {
+        const std::string key = member.name();
+        out[key == "_all" ? "CORVMDTextContent" : key] = converted;
+      }
+    }
+    return out;
+  }
   return clause;
 }
 
 // The request of corvelasticd's "search" command for these arguments.
 Json::Value SearchRequest(const SearchArgs& args) {
-  const std::string field = args.name ? elastic::kFieldSearchFileName : args.content ? "CORVMDTextContent" : "_all";
-  Json::Value qsl = MatchClause(field, args.query);
-  if (!args.type.empty()) {
-    Json::Value extensions(Json::arrayValue);
-    for (const std::string& ext : fileindex::GetExtensionsByCategory(args.type)) extensions.append(ext);
-    Json::Value filtered(Json::objectValue);
-    filtered["bool"]["must"].append(qsl);
-    filtered["bool"]["filter"].append(Json::Value(Json::objectValue));
-    filtered["bool"]["filter"][0]["terms"][elastic::kFieldExtension] = extensions;
-    qsl = filtered;
+  // Each argument is a part of the query: `search saffron rice` and
+  // `search 'saffron rice'` mean the same.
+  std::string text;
+  for (const std::string& word : args.words) text += (text.empty() ? "" : " ") + word;
+  frontend::SearchSpec spec;
+  try {
+    spec.qsl = fileindex::UserQueryToSearch(text)["qsl"];
+  } catch (const fileindex::UserQuerySyntaxError& error) {
+    throw Error(kErrorBadArgument, std::string(error.what()) + " (the syntax: docs/search.md)");
   }
-  Json::Value data(Json::objectValue);
-  if (!args.shares.empty()) {
-    for (const std::string& share : args.shares) data["ids"].append(elastic::GetFileIndexID(share));
-  }
-  data["query"]["qsl"] = qsl;
-  data["from"] = args.from;
-  data["size"] = args.size;
-  data["track_total"] = true;
-  for (const char* field_name : {elastic::kFieldPath, "CORVMDIsDir", "CORVMDFSSize", "CORVMDFSContentChangeDate"}) {
-    data["load_field"].append(field_name);
-  }
+  if (args.name) spec.qsl = NamesOnly(spec.qsl);
+  if (args.content) spec.qsl = ContentOnly(spec.qsl);
+  spec.shares = args.shares;
+  spec.category = args.type;
+  spec.from = args.from;
+  spec.size = args.size;
   if (!args.name) {
     // Matched words in bold on a terminal (unless NO_COLOR), in [brackets] otherwise.
     const bool tty = UseColour();
-    data["highlight"]["size"] = 80;
-    data["highlight"]["pre"] = tty ? kBoldOn : "[";
-    data["highlight"]["post"] = tty ? kBoldOff : "]";
+    spec.highlight = true;
+    spec.highlight_size = 80;
+    spec.highlight_pre = tty ? kBoldOn : "[";
+    spec.highlight_post = tty ? kBoldOff : "]";
   }
-  Json::Value request(Json::objectValue);
-  request["command"] = "search";
-  request["data"] = data;
-  return request;
+  return frontend::SearchRequest(spec);
 }
 
 void PrintHits(const SearchArgs& args, const Json::Value& result) {
@@ -109,16 +146,21 @@ void PrintHits(const SearchArgs& args, const Json::Value& result) {
 void AddSearchCommands(CLI::App& app, Output& output) {
   static SearchArgs search;
   CLI::App* search_cmd = app.add_subcommand("search", "search the index by file name and content");
-  search_cmd->add_option("query", search.query, "the words to look for")->required();
+  search_cmd->add_option("words", search.words,
+                         "what to look for: words, \"a phrase\", prefix*, OR, NOT word, (groups), name:, ext:, "
+                         "type:, in:, size:, modified:, owner: (see docs/search.md); put -- before words "
+                         "that start with -")
+      ->required();
   auto* name = search_cmd->add_flag("--name", search.name, "search file names only");
   search_cmd->add_flag("--content", search.content, "search file content only")->excludes(name);
-  search_cmd->add_option("--share", search.shares, "only in this share (repeatable)");
+  // One value per --share, so the words may follow it: `search --share docs saffron rice`.
+  search_cmd->add_option("--share", search.shares, "only in this share (repeatable)")->allow_extra_args(false);
   search_cmd->add_option("--type", search.type, "only files of this category")
-      ->check(CLI::IsMember({"document", "audio", "video", "image"}));
+      ->check(CLI::IsMember({"document", "audio", "video", "photo"}));
   search_cmd->add_option("--from", search.from, "skip this many results (paging)");
   search_cmd->add_option("--size", search.size, "show at most this many results (1-1000)")->check(CLI::Range(1, 1000));
   search_cmd->callback([&output] {
-    RequireRunning(Daemon::kSearch);
+    frontend::RequireRunning(frontend::Daemon::kSearch);
     Json::Value answer;
     elastic::SendRequestWithRetry(answer, SearchRequest(search));
     if (output.json) return PrintJson(answer["data"]);
@@ -132,22 +174,56 @@ void AddSearchCommands(CLI::App& app, Output& output) {
   } suggest;
   CLI::App* suggest_cmd = app.add_subcommand("suggest", "file-name words that begin with TEXT");
   suggest_cmd->add_option("text", suggest.text, "the beginning of a word")->required();
-  suggest_cmd->add_option("--share", suggest.shares, "only in this share (repeatable)");
+  suggest_cmd->add_option("--share", suggest.shares, "only in this share (repeatable)")->allow_extra_args(false);
   suggest_cmd->add_option("--size", suggest.size, "at most this many (1-100)")->check(CLI::Range(1, 100));
   suggest_cmd->callback([&output] {
     Json::Value request(Json::objectValue);
     request["command"] = "suggest";
-    for (const std::string& share : suggest.shares) request["data"]["ids"].append(elastic::GetFileIndexID(share));
+    if (!suggest.shares.empty()) request["data"]["ids"] = frontend::IndexIds(suggest.shares);
     request["data"]["field"] = elastic::kFieldSearchFileName;
     request["data"]["text"] = suggest.text;
     request["data"]["size"] = suggest.size;
-    RequireRunning(Daemon::kSearch);
+    frontend::RequireRunning(frontend::Daemon::kSearch);
     Json::Value answer;
     elastic::SendRequestWithRetry(answer, request);
     if (output.json) return PrintJson(answer["data"]);
     for (const Json::Value& item : answer["data"]["suggestions"]) {
       std::cout << item["term"].asString() << "  (" << item["freq"].asInt64() << ")\n";
     }
+  });
+
+  static struct {
+    std::vector<std::string> shares;
+    unsigned from = 0;
+    unsigned size = 100;
+  } failed;
+  CLI::App* failed_cmd = app.add_subcommand(
+      "failed", "files whose content could not be read, with the reason (they are still found by name and path)");
+  failed_cmd->add_option("--share", failed.shares, "only in this share (repeatable)")->allow_extra_args(false);
+  failed_cmd->add_option("--from", failed.from, "skip this many files (paging)");
+  failed_cmd->add_option("--size", failed.size, "show at most this many files (1-1000)")->check(CLI::Range(1, 1000));
+  failed_cmd->callback([&output] {
+    Json::Value data(Json::objectValue);
+    if (!failed.shares.empty()) data["ids"] = frontend::IndexIds(failed.shares);
+    data["query"]["qsl"]["term"][elastic::kFieldExtractionFailed] = true;
+    data["from"] = failed.from;
+    data["size"] = failed.size;
+    data["track_total"] = true;
+    data["load_field"].append(elastic::kFieldPath);
+    data["load_field"].append(elastic::kFieldExtractionError);
+    Json::Value request(Json::objectValue);
+    request["command"] = "search";
+    request["data"] = data;
+    frontend::RequireRunning(frontend::Daemon::kSearch);
+    Json::Value answer;
+    elastic::SendRequestWithRetry(answer, request);
+    if (output.json) return PrintJson(answer["data"]);
+    std::vector<std::vector<std::string>> rows;
+    for (const Json::Value& hit : answer["data"]["hits"]) {
+      rows.push_back({hit["fields"][elastic::kFieldPath].asString(), hit["fields"][elastic::kFieldExtractionError].asString()});
+    }
+    if (!rows.empty()) PrintTable({"PATH", "REASON"}, rows);
+    std::cout << answer["data"]["total"].asInt64() << " file(s) whose content could not be read\n";
   });
 
   static struct {

@@ -2,69 +2,41 @@
 
 #include <fcntl.h>
 #include <poll.h>
-#include <sys/ioctl.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
 #include <unistd.h>
 
 #include <cerrno>
-#include <chrono>
-#include <thread>
 #include <cstring>
-#include <vector>
+#include <system_error>
+#include <thread>
 
 #include "common/error.h"
 #include "common/file_util.h"
 #include "common/json_util.h"
 #include "common/log.h"
 #include "fileindex/communication.h"
+#include "fileindex/frame_reader.h"
 
 namespace corvlumex {
 namespace fileindexd {
 namespace {
 
-constexpr uint32_t kMaxRequestBytes = 1u << 20;
-constexpr int kRequestTimeoutMs = 5000;
+std::string Failure(int code, const std::string& message) { return JsonToString(fileindex::FailureAnswer(code, message)); }
 
-// Waits until a whole frame has arrived, so that reading it cannot block on
-// a client that went away in the middle. False for a client that closed,
-// sent too much or took too long.
-bool WholeFrameArrived(int fd) {
-  using Clock = std::chrono::steady_clock;
-  const Clock::time_point deadline = Clock::now() + std::chrono::milliseconds(kRequestTimeoutMs);
-  size_t need = sizeof(uint32_t);
-  bool have_length = false;
-  for (;;) {
-    int queued = 0;
-    if (ioctl(fd, FIONREAD, &queued) != 0) return false;
-    if (static_cast<size_t>(queued) >= need) {
-      if (have_length) return true;
-      uint32_t length = 0;
-      if (recv(fd, &length, sizeof(length), MSG_PEEK) != static_cast<ssize_t>(sizeof(length))) return false;
-      if (length > kMaxRequestBytes) return false;
-      need += length;
-      have_length = true;
-      continue;
-    }
-    const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(deadline - Clock::now()).count();
-    if (left <= 0) return false;
-    struct pollfd pfd = {fd, POLLIN | POLLRDHUP, 0};
-    const int ready = poll(&pfd, 1, static_cast<int>(left));
-    if (ready < 0 && errno != EINTR) return false;
-    if (ready > 0 && (pfd.revents & (POLLRDHUP | POLLHUP | POLLERR))) {
-      // The client is done sending: what is queued now is all there will be.
-      if (ioctl(fd, FIONREAD, &queued) != 0 || static_cast<size_t>(queued) < need) return false;
-      continue;
-    }
-    if (ready > 0 && queued > 0) std::this_thread::sleep_for(std::chrono::milliseconds(1));  // part of a frame
+void SendAnswer(int fd, const std::string& answer) {
+  try {
+    fileindex::WriteFrame(fd, answer);
+  } catch (const Error& error) {
+    CORV_LOG("command connection dropped: %s", error.reason.c_str());
   }
 }
 
 }  // namespace
 
-CommandServer::CommandServer(std::string socket_path, Handler handler, ReadOnly read_only)
-    : socket_path_(std::move(socket_path)), handler_(std::move(handler)), read_only_(std::move(read_only)) {}
+CommandServer::CommandServer(std::string socket_path, Handler handler, ReadOnly read_only, CommandLimits limits)
+    : socket_path_(std::move(socket_path)), handler_(std::move(handler)), read_only_(std::move(read_only)), limits_(limits) {}
 
 CommandServer::~CommandServer() {
   if (listen_fd_ >= 0) {
@@ -118,37 +90,91 @@ void CommandServer::Run() {
         continue;
       }
       CORV_LOG("poll failed on the command socket");
-      return;
+      break;
     }
-    if (fds[1].revents & POLLIN) return;
+    if (fds[1].revents & POLLIN) break;
     if (!(fds[0].revents & POLLIN)) continue;
     const int fd = accept4(listen_fd_, nullptr, nullptr, SOCK_CLOEXEC);
     if (fd < 0) {
       errno = 0;
       continue;
     }
-    Serve(fd);
-    close(fd);
+    struct ucred peer;
+    socklen_t peer_size = sizeof(peer);
+    if (getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &peer, &peer_size) != 0) {
+      errno = 0;
+      close(fd);
+      continue;
+    }
+    // Root and the daemon's own user (the management operations) are never
+    // turned away; every other user has a share of the connections.
+    const bool counted = peer.uid != 0 && peer.uid != geteuid();
+    Connections& open = *connections_;
+    std::unique_lock<std::mutex> lock(open.mutex);
+    if (counted && (open.counted >= limits_.max_connections || open.per_user[peer.uid] >= limits_.max_connections_per_user)) {
+      lock.unlock();
+      SendAnswer(fd, Failure(kErrorSystem, "Too many connections to fileindexd; try again later"));
+      close(fd);
+      continue;
+    }
+    open.fds.insert(fd);
+    if (counted) ++open.counted, ++open.per_user[peer.uid];
+    const auto finished = [fd, counted, uid = peer.uid](Connections& connections) {
+      connections.fds.erase(fd);
+      if (counted) {
+        --connections.counted;
+        if (--connections.per_user[uid] == 0) connections.per_user.erase(uid);
+      }
+    };
+    try {
+      std::thread([this, fd, uid = peer.uid, finished, connections = connections_] {
+        Serve(fd, uid);
+        std::lock_guard<std::mutex> guard(connections->mutex);
+        finished(*connections);
+        close(fd);
+        connections->all_closed.notify_all();
+      }).detach();
+    } catch (const std::system_error&) {
+      finished(open);
+      lock.unlock();
+      SendAnswer(fd, Failure(kErrorSystem, "fileindexd cannot take the connection now; try again later"));
+      close(fd);
+    }
   }
+  // Readers still waiting for a request give up now; a command being run finishes.
+  Connections& open = *connections_;
+  std::unique_lock<std::mutex> lock(open.mutex);
+  for (const int fd : open.fds) shutdown(fd, SHUT_RD);
+  open.all_closed.wait(lock, [&open] { return open.fds.empty(); });
 }
 
-void CommandServer::Serve(int fd) {
-  struct ucred peer;
-  socklen_t peer_size = sizeof(peer);
-  if (getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &peer, &peer_size) != 0) {
-    errno = 0;
-    return;
+void CommandServer::Serve(int fd, uid_t uid) {
+  using fileindex::FrameStatus;
+  // A client that does not read its answer holds its own thread only so long.
+  const struct timeval send_timeout = {limits_.request_timeout_ms / 1000, (limits_.request_timeout_ms % 1000) * 1000};
+  setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &send_timeout, sizeof(send_timeout));
+  std::string request;
+  switch (fileindex::ReadFrameBounded(fd, limits_.max_request_bytes, limits_.request_timeout_ms, limits_.request_timeout_ms, &request,
+                                     limits_.request_timeout_ms)) {
+    case FrameStatus::kOk: break;
+    case FrameStatus::kTooLarge:
+      SendAnswer(fd, Failure(kErrorBadArgument, "The request is larger than " + std::to_string(limits_.max_request_bytes) + " bytes"));
+      return;
+    case FrameStatus::kIdle:
+    case FrameStatus::kTimeout:
+      SendAnswer(fd, Failure(kErrorBadArgument, "The request did not arrive within " + std::to_string(limits_.request_timeout_ms) + " ms"));
+      return;
+    default:  // the client went away: nobody to answer
+      errno = 0;
+      return;
   }
-  if (!WholeFrameArrived(fd)) {
-    errno = 0;
-    return;
+  std::string answer;
+  {
+    // Commands are run one at a time, as they always were.
+    std::lock_guard<std::mutex> guard(handler_mutex_);
+    answer = Answer(request, uid);
   }
-  try {
-    const std::string answer = Answer(fileindex::ReadFrame(fd), peer.uid);
-    fileindex::WriteFrame(fd, answer);
-  } catch (const Error& error) {
-    CORV_LOG("command connection dropped: %s", error.reason.c_str());
-  }
+  SendAnswer(fd, answer);
 }
 
 std::string CommandServer::Answer(const std::string& text, uid_t uid) {
@@ -169,6 +195,8 @@ std::string CommandServer::Answer(const std::string& text, uid_t uid) {
     return JsonToString(fileindex::FailureAnswer(error.code, error.reason));
   } catch (const std::exception& error) {
     return JsonToString(fileindex::FailureAnswer(kErrorUnexpected, error.what()));
+  } catch (...) {
+    return JsonToString(fileindex::FailureAnswer(kErrorUnexpected, "the command failed unexpectedly"));
   }
 }
 

@@ -48,7 +48,7 @@ int main(int argc, char** argv) {
 
   // The library's debug lines (one per queued event) only when asked for.
   corvlumex::fileindex::log_level = debug ? 7 : 6;
-  if (log_stderr) SetLogSink([](int, const std::string& line) { std::cerr << line << std::endl; });
+  if (log_stderr) LogToStderr("fileindexd");
   signal(SIGPIPE, SIG_IGN);
 
   WorkerOptions options;

@@ -79,7 +79,7 @@ void OpApplier::Guard(const std::string& what, const std::string& path, const st
     step();
   } catch (const Error& error) {
     if (IsBatchError(error)) throw;
-    progress_.Failed(share_);
+    progress_.Failed(share_, path, what + ": " + error.reason);
     CORV_LOG("%s of %s skipped: code=%d, reason=%s", what.c_str(), path.c_str(), error.code, error.reason.c_str());
   }
 }
@@ -99,11 +99,39 @@ void OpApplier::Apply(const fileindex::OP& op) {
   progress_.Done(share_);
 }
 
-void OpApplier::UpsertFile(const std::string& path, bool need_meta, bool settle) {
-  if (settle && !settle_.Admit(path, SettleTracker::Clock::now())) return;  // its turn comes later
+bool OpApplier::UpsertFile(const std::string& path, bool need_meta, bool settle) {
+  if (settle && !settle_.Admit(path, SettleTracker::Clock::now())) return false;  // its turn comes later
   Guard("upsert", path, [&] {
     elastic::IndexUpsert(share_, path, need_meta);
     progress_.Extracted(share_);
+  });
+  return true;
+}
+
+void OpApplier::ReachOtherNames(const std::string& path, bool attributes_only) {
+  struct stat st;
+  if (lstat(path.c_str(), &st) != 0 || S_ISDIR(st.st_mode) || st.st_nlink < 2) {
+    errno = 0;
+    return;
+  }
+  Guard("update of the other names of", path, [&] {
+    for (const std::string& other : elastic::IndexPathsOfFile(share_, st.st_dev, st.st_ino)) {
+      struct stat other_st;
+      const bool same_file = other != path && lstat(other.c_str(), &other_st) == 0 && other_st.st_dev == st.st_dev &&
+                             other_st.st_ino == st.st_ino;
+      errno = 0;
+      if (!same_file) continue;  // moved or replaced since: its own events say what became of it
+      const Verdict verdict = rules_.Judge(other, false);
+      if (!verdict.index) continue;
+      Guard(attributes_only ? "attribute update" : "upsert", other, [&] {
+        if (attributes_only) {
+          elastic::IndexAttr(share_, other);
+        } else {
+          elastic::IndexUpsert(share_, other, verdict.need_meta);
+        }
+        progress_.Extracted(share_);
+      });
+    }
   });
 }
 
@@ -133,14 +161,17 @@ bool OpApplier::Present(const std::string& path, Kind* kind, Verdict* verdict) {
 void OpApplier::Upsert(const std::string& path) {
   Kind kind;
   Verdict verdict;
-  if (Present(path, &kind, &verdict)) UpsertFile(path, verdict.need_meta, kind == Kind::kFile);
+  if (!Present(path, &kind, &verdict)) return;
+  if (UpsertFile(path, verdict.need_meta, kind == Kind::kFile) && kind == Kind::kFile) ReachOtherNames(path, false);
 }
 
 void OpApplier::UpsertSettled(const std::string& path) {
   const Kind kind = KindOf(path);
   if (kind == Kind::kMissing) return;  // its delete was (or will be) queued
   const Verdict verdict = rules_.Judge(path, kind == Kind::kDir);
-  if (verdict.index) UpsertFile(path, verdict.need_meta, false);
+  if (!verdict.index) return;
+  UpsertFile(path, verdict.need_meta, false);
+  if (kind == Kind::kFile) ReachOtherNames(path, false);
 }
 
 void OpApplier::Attr(const std::string& path) {
@@ -159,11 +190,27 @@ void OpApplier::Attr(const std::string& path) {
       progress_.Extracted(share_);
     }
   });
+  if (kind == Kind::kFile) ReachOtherNames(path, true);
 }
 
 void OpApplier::Delete(const std::string& path) {
   settle_.Forget(path);
+  DeleteDocument(path);
+}
+
+void OpApplier::DeleteDocument(const std::string& path) {
   Guard("delete", path, [&] { elastic::IndexDel(share_, path); });
+}
+
+void OpApplier::Refresh(const std::string& path) {
+  const Kind kind = KindOf(path);
+  if (kind == Kind::kMissing) {
+    DeleteDocument(path);
+    return;
+  }
+  if (kind == Kind::kDir) return;
+  const Verdict verdict = rules_.Judge(path, false);
+  if (verdict.index) UpsertFile(path, verdict.need_meta, false);
 }
 
 bool OpApplier::SameSettings(const std::string& a, const std::string& b) const {
@@ -202,12 +249,18 @@ void OpApplier::Rename(const std::string& from, const std::string& to) {
       }
     });
   }
+  // Documents still held under an old name the disk no longer has are
+  // ghosts: a rename cut short by a crash and replayed, or moves of a killed
+  // indexer's last request that the search daemon finished after it. No later
+  // event names that path again, so they go now.
+  const bool from_gone = KindOf(from) == Kind::kMissing;
+  if (from_gone) DeleteTree(from);
   if (kind == Kind::kMissing) {
     // Moved on again already; the event that moved it is queued behind this one.
     return;
   }
   if (!moved) {
-    DeleteTree(from);
+    if (!from_gone) DeleteTree(from);
     if (is_dir) {
       Reindex(to);
     } else {
@@ -279,8 +332,7 @@ void OpApplier::Resync(const std::vector<std::string>& roots, const std::string&
   for (const auto& [path, stamp] : indexed) {
     if (keep.count(path) != 0) continue;
     CheckInterrupt();
-    settle_.Forget(path);
-    Guard("delete", path, [&] { elastic::IndexDel(share_, path); });
+    Delete(path);
   }
 }
 
@@ -323,8 +375,7 @@ void OpApplier::UpdateCfg(const std::string& path, const Json::Value& changed) {
         work.push_back(Pending{entry.path, verdict.need_meta});
         continue;
       }
-      settle_.Forget(entry.path);
-      Guard("delete", entry.path, [&] { elastic::IndexDel(share_, entry.path); });
+      Delete(entry.path);
     }
     progress_.Done(share_);
   }

@@ -66,6 +66,11 @@ class OpApplier {
   void FullReindex();
   // A file whose settle interval has passed.
   void UpsertSettled(const std::string& path);
+  // A file named by a fresh event, ahead of its turn in the queue: stored,
+  // or its document deleted, by what the disk has now. Folders are left to
+  // their own operations, and the settle state to the in-order pass, so
+  // this may run on another thread beside that pass's applier.
+  void Refresh(const std::string& path);
 
  public:
   enum class Kind { kMissing, kFile, kDir };
@@ -79,7 +84,12 @@ class OpApplier {
   };
   // Runs one file's step; a per-file error is logged and counted.
   void Guard(const std::string& what, const std::string& path, const std::function<void()>& step);
-  void UpsertFile(const std::string& path, bool need_meta, bool settle);
+  // False when the settle interval deferred it.
+  bool UpsertFile(const std::string& path, bool need_meta, bool settle);
+  // A file with hard links changed through `path`: its other names that the
+  // index holds get the new document too (only its attributes when
+  // `attributes_only`), since no event names them.
+  void ReachOtherNames(const std::string& path, bool attributes_only);
   struct Pending {
     std::string path;
     bool need_meta = false;
@@ -88,6 +98,7 @@ class OpApplier {
   // as done. The first batch error or interruption stops them all and leaves.
   void UpsertMany(const std::vector<Pending>& work);
   void DeleteTree(const std::string& path);
+  void DeleteDocument(const std::string& path);
   // Walks `roots` and makes the documents below `index_prefix` match them.
   void Resync(const std::vector<std::string>& roots, const std::string& index_prefix);
   std::unordered_map<std::string, Stamp> LoadIndexed(const std::string& prefix);

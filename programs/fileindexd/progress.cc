@@ -1,5 +1,7 @@
 #include "programs/fileindexd/progress.h"
 
+#include <time.h>
+
 namespace corvlumex {
 namespace fileindexd {
 
@@ -32,9 +34,12 @@ void ProgressBoard::Done(const std::string& share, uint64_t count) {
   if (entry.todo < entry.done) entry.todo = entry.done;
 }
 
-void ProgressBoard::Failed(const std::string& share) {
+void ProgressBoard::Failed(const std::string& share, const std::string& path, const std::string& reason) {
   std::lock_guard<std::mutex> lock(mutex_);
-  ++shares_[share].total_failed;
+  Share& entry = shares_[share];
+  entry.failed.insert(path);
+  entry.failures.push_back({path, reason, static_cast<long long>(time(nullptr))});
+  if (entry.failures.size() > kKeptFailures) entry.failures.pop_front();
 }
 
 void ProgressBoard::Extracted(const std::string& share) {
@@ -73,7 +78,7 @@ Json::Value ProgressBoard::Snapshot() const {
     share["done"] = static_cast<Json::UInt64>(entry.done);
     share["todo"] = static_cast<Json::UInt64>(entry.todo);
     share["total_done"] = static_cast<Json::UInt64>(entry.total_done);
-    share["total_failed"] = static_cast<Json::UInt64>(entry.total_failed);
+    share["total_failed"] = static_cast<Json::UInt64>(entry.failed.size());
     share["total_extracted"] = static_cast<Json::UInt64>(entry.total_extracted);
     share["deferred"] = static_cast<Json::UInt64>(entry.deferred);
     double rate = 0;
@@ -86,6 +91,14 @@ Json::Value ProgressBoard::Snapshot() const {
     share["eta_seconds"] = rate > 0 ? static_cast<double>(entry.todo - entry.done) / rate : -1.0;
     share["last_commit_age_seconds"] =
         entry.committed ? std::chrono::duration<double>(now - entry.last_commit).count() : -1.0;
+    share["failed_files"] = Json::Value(Json::arrayValue);
+    for (const auto& failure : entry.failures) {
+      Json::Value item(Json::objectValue);
+      item["path"] = failure.path;
+      item["reason"] = failure.reason;
+      item["time"] = static_cast<Json::Int64>(failure.time);
+      share["failed_files"].append(item);
+    }
     out[name] = share;
   }
   return out;

@@ -6,8 +6,10 @@
 #include <json/json.h>
 
 #include <chrono>
+#include <deque>
 #include <map>
 #include <mutex>
+#include <set>
 #include <string>
 
 namespace corvlumex {
@@ -31,7 +33,12 @@ class ProgressBoard {
   // More files to do in this batch (a folder walk found them).
   void AddTodo(const std::string& share, uint64_t count);
   void Done(const std::string& share, uint64_t count = 1);
-  void Failed(const std::string& share);
+  // Indexing `path` failed. "total_failed" counts files, not attempts: a
+  // file that fails again on every retry counts once. The latest
+  // kKeptFailures of each share are kept (path, reason, when) for the
+  // administrators' list.
+  void Failed(const std::string& share, const std::string& path, const std::string& reason = "");
+  static constexpr size_t kKeptFailures = 100;
   // One file was extracted and stored (a full upsert or an attribute update).
   void Extracted(const std::string& share);
   void EndBatch(const std::string& share);
@@ -40,7 +47,7 @@ class ProgressBoard {
 
   // {"<share>": {"state", "detail", "done", "todo", "rate", "eta_seconds",
   //  "total_done", "total_failed", "total_extracted", "deferred",
-  //  "last_commit_age_seconds"}}.
+  //  "last_commit_age_seconds", "failed_files": [{"path", "reason", "time"}]}}.
   Json::Value Snapshot() const;
 
  private:
@@ -48,11 +55,17 @@ class ProgressBoard {
     std::string state = kStateIdle;
     std::string detail;
     uint64_t done = 0, todo = 0;
-    uint64_t total_done = 0, total_failed = 0, total_extracted = 0;
+    uint64_t total_done = 0, total_extracted = 0;
+    std::set<std::string> failed;
     size_t deferred = 0;
     Clock::time_point batch_start{};
     Clock::time_point last_commit{};
     bool committed = false;
+    struct Failure {
+      std::string path, reason;
+      long long time = 0;  // seconds since 1970
+    };
+    std::deque<Failure> failures;  // oldest first
   };
   mutable std::mutex mutex_;
   std::map<std::string, Share> shares_;

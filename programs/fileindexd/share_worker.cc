@@ -7,14 +7,19 @@
 #include "common/error.h"
 #include "common/file_util.h"
 #include "common/log.h"
+#include "common/sys.h"
 #include "fileindex/constants.h"
 #include "fileindex/custom_event.h"
+#include "fileindex/elastic/comm.h"
 #include "fileindex/elastic/elastic_control.h"
+#include "fileindex/elastic/schema.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/optree.h"
 #include "fileindex/queue_mgr.h"
 #include "fileindex/status_mgr.h"
+#include "programs/fileindexd/batch_mark.h"
+#include "programs/fileindexd/fresh_lane.h"
 #include "programs/fileindexd/index_rules.h"
 #include "programs/fileindexd/op_applier.h"
 #include "sdk/share.h"
@@ -33,7 +38,8 @@ long long Now() { return static_cast<long long>(time(nullptr)); }
 }  // namespace
 
 ShareWorker::ShareWorker(const std::string& share, WorkerOptions options, PauseState& pause, ProgressBoard& progress)
-    : share_(share), options_(options), pause_(pause), progress_(progress) {
+    : share_(share), options_(options), pause_(pause), progress_(progress),
+      suggestions_(options.suggestion_interval) {
   // An unknown share throws here (Error 800): no worker for it.
   queue_path_ = sdk::SDKShare(share).GetQueuePath();
   watch_ = std::make_unique<QueueWatch>(queue_path_, options_.fallback_poll);
@@ -59,6 +65,7 @@ void ShareWorker::CheckInterrupt() const {
 
 void ShareWorker::Run() {
   settle_->Load();
+  recovering_ = IsFileExist(queue_path_ + ".tmp");
   std::chrono::milliseconds backoff{0};
   while (!stopping_) {
     watch_->Arm();
@@ -99,7 +106,11 @@ void ShareWorker::Run() {
       OnFailure(Error(kErrorUnexpected, error.what()), backoff);
       continue;
     }
-    if (worked) continue;
+    if (worked) {
+      if (suggestions_.DueAfterWork(SuggestionSchedule::Clock::now())) RebuildSuggestions();
+      continue;
+    }
+    if (suggestions_.DueAtRest()) RebuildSuggestions();
     progress_.SetState(share_, kStateIdle);
     progress_.SetDeferred(share_, settle_->DeferredCount());
     const auto now = SettleTracker::Clock::now();
@@ -113,6 +124,18 @@ void ShareWorker::Run() {
     watch_->Wait(timeout);
   }
   progress_.SetState(share_, kStateStopped);
+}
+
+void ShareWorker::RebuildSuggestions() {
+  try {
+    fileindex::elastic::UpdateTermSuggestion(sdk::SDKShare(share_).GetDBName(),
+                                             {fileindex::elastic::kFieldSearchFileName});
+  } catch (const Error& error) {
+    // Suggestions are a convenience: the next round tries again.
+    CORV_LOG("suggestions of share %s not rebuilt: code=%d, reason=%s", share_.c_str(), error.code,
+             error.reason.c_str());
+  }
+  suggestions_.Rebuilt(SuggestionSchedule::Clock::now());
 }
 
 bool ShareWorker::IsVolumeFull(const Error& error) const {
@@ -144,7 +167,32 @@ void ShareWorker::OnFailure(const Error& error, std::chrono::milliseconds& backo
   }
   backoff = std::min(options_.retry_max, std::max(options_.retry_first, backoff * 2));
   progress_.SetState(share_, kStateRetrying, "code " + std::to_string(error.code) + ": " + error.reason);
-  watch_->Wait(backoff);
+  WaitToRetry(error, backoff);
+}
+
+void ShareWorker::WaitToRetry(const Error& error, std::chrono::milliseconds backoff) {
+  if (error.code != kErrorSearchRequest || fileindex::elastic::IsIndexReady(share_)) {
+    watch_->Wait(backoff);
+    return;
+  }
+  // The daemon is down or starting: asking costs nothing, so it is followed
+  // closely and the batch goes on as soon as it can take it.
+  const auto end = std::chrono::steady_clock::now() + backoff;
+  while (!stopping_ && std::chrono::steady_clock::now() < end) {
+    const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(end - std::chrono::steady_clock::now());
+    SleepFor(std::min(options_.reconnect_probe, left));
+    if (fileindex::elastic::IsIndexReady(share_)) return;
+  }
+}
+
+void ShareWorker::WaitUntilIndexReady() {
+  if (fileindex::elastic::IsIndexReady(share_)) return;
+  CORV_LOG("share %s waits for the search daemon to take its index", share_.c_str());
+  progress_.SetState(share_, kStateRetrying, "waiting for the search daemon");
+  do {
+    CheckInterrupt();
+    SleepFor(options_.reconnect_probe);
+  } while (!fileindex::elastic::IsIndexReady(share_));
 }
 
 bool ShareWorker::RunOnce() {
@@ -153,6 +201,7 @@ bool ShareWorker::RunOnce() {
   if (!folders.IsShareIndexed(share_) || (status & fileindex::kShareStatusPauseMask) != 0) {
     return false;  // the daemon stops this worker when told; nothing to do meanwhile
   }
+  WaitUntilIndexReady();
   const IndexRules rules(folders, sdk::SDKShare(share_).GetPath());
   OpApplier applier(share_, rules, progress_, *settle_);
   applier.SetInterruptCheck([this] { CheckInterrupt(); });
@@ -161,9 +210,10 @@ bool ShareWorker::RunOnce() {
 
   if (status & fileindex::kShareStatusNeedReindex) {
     progress_.StartBatch(share_, 1);
+    const pid_t daemon = LastSearchDaemonPid();
     applier.FullReindex();
     progress_.Done(share_);
-    fileindex::elastic::IndexCommit(share_);
+    CommitSince(daemon);
     fileindex::StatusMgr().UnsetShareStatus(share_, fileindex::kShareStatusNeedReindex);
     progress_.EndBatch(share_);
     worked = true;
@@ -177,23 +227,71 @@ bool ShareWorker::RunOnce() {
   std::vector<std::string> due = settle_->DueNow(now);
   if (!taken_over && due.empty()) return worked;
 
+  const BatchMark mark(queue.GetQueuePathTmp());
+  const size_t first = taken_over ? std::min(mark.Load(), ops.size()) : 0;
   progress_.StartBatch(share_, ops.size() + due.size());
-  for (const auto& op : ops) {
-    CheckInterrupt();
-    applier.Apply(*op);
+  if (first > 0) progress_.Done(share_, first);
+  {
+    // Fresh files of the live queue go ahead of the batch, on a lane of
+    // their own (with its own reading of the folders: the rules are not
+    // shared between threads).
+    const fileindex::FolderMgr lane_folders;
+    const IndexRules lane_rules(lane_folders, sdk::SDKShare(share_).GetPath());
+    OpApplier lane_applier(share_, lane_rules, progress_, *settle_);
+    FreshLane lane(share_, queue_path_, lane_applier, options_.fresh);
+    lane.Start();
+    ApplyInSlices(applier, ops, first, mark);
   }
+  const pid_t daemon = LastSearchDaemonPid();
   for (const std::string& path : due) {
     applier.UpsertSettled(path);
     progress_.Done(share_);
   }
-  fileindex::elastic::IndexCommit(share_);
+  CommitSince(daemon);
   settle_->Confirm(due, SettleTracker::Clock::now());
   // The deferred files must be on disk before the queue that named them goes.
   CORV_CHECK_THROW(!settle_->Save(), kErrorSaveJson, "Failed to save json: " + queue_path_ + kSettleSuffix);
-  if (taken_over) queue.DeleteTmp();
+  if (taken_over && recovering_) {
+    // The previous run died in the middle of this batch: what it sent last
+    // may have been half done (a rename of a large folder, finished by the
+    // search daemon after the indexer was gone), so the whole share is
+    // checked against the disk next; unchanged files are not extracted again.
+    CORV_LOG("share %s: a batch was left unfinished by the last run; the share is checked against the disk",
+             share_.c_str());
+    fileindex::StatusMgr().SetShareStatus(share_, fileindex::kShareStatusNeedReindex);
+  }
+  recovering_ = false;
+  if (taken_over) {
+    mark.Clear();
+    queue.DeleteTmp();
+  }
   progress_.EndBatch(share_);
   progress_.SetDeferred(share_, settle_->DeferredCount());
   return true;
+}
+
+void ShareWorker::ApplyInSlices(OpApplier& applier, const std::vector<std::shared_ptr<fileindex::OP>>& ops,
+                                size_t first, const BatchMark& mark) {
+  auto slice_end = std::chrono::steady_clock::now() + options_.slice;
+  pid_t daemon = LastSearchDaemonPid();
+  for (size_t i = first; i < ops.size(); ++i) {
+    CheckInterrupt();
+    applier.Apply(*ops[i]);
+    if (i + 1 < ops.size() && std::chrono::steady_clock::now() < slice_end) continue;
+    CommitSince(daemon);
+    // What the deferred list gained in this slice must survive its skipping.
+    if (settle_->Save()) mark.Save(i + 1);
+    slice_end = std::chrono::steady_clock::now() + options_.slice;
+    daemon = LastSearchDaemonPid();
+  }
+}
+
+void ShareWorker::CommitSince(pid_t daemon) {
+  fileindex::elastic::IndexCommit(share_);
+  // A daemon restarted between two requests answers the next one as if
+  // nothing happened, but the writes before were not committed and are gone.
+  CORV_CHECK_THROW(LastSearchDaemonPid() != daemon, kErrorSearchRequest,
+                   "corvelasticd restarted during the batch; it goes on from its last committed slice");
 }
 
 }  // namespace fileindexd

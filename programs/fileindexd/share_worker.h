@@ -5,18 +5,25 @@
 // and the extractions its settle tracker deferred.
 #pragma once
 
+#include <sys/types.h>
+
 #include <atomic>
 #include <chrono>
 #include <functional>
 #include <memory>
 #include <string>
 #include <thread>
+#include <vector>
 
 #include "common/error.h"
+#include "fileindex/optree.h"
+#include "programs/fileindexd/op_applier.h"
+#include "programs/fileindexd/fresh_lane.h"
 #include "programs/fileindexd/pause_state.h"
 #include "programs/fileindexd/progress.h"
 #include "programs/fileindexd/queue_watch.h"
 #include "programs/fileindexd/settle_tracker.h"
+#include "programs/fileindexd/suggestion_schedule.h"
 
 namespace corvlumex {
 namespace fileindexd {
@@ -25,8 +32,15 @@ struct WorkerOptions {
   std::chrono::milliseconds fallback_poll{250};  // when the queue's folder cannot be watched
   std::chrono::milliseconds retry_first{1000};    // back-off after a failed batch, doubling
   std::chrono::milliseconds retry_max{60000};
+  // While the search daemon refuses connections (stopped, restarting), it is
+  // asked this often whether it is back, whatever the back-off says.
+  std::chrono::milliseconds reconnect_probe{250};
+  // A batch is committed, and how far it got saved, after this much work.
+  std::chrono::milliseconds slice{1000};
+  FreshLaneOptions fresh;
   SettleOptions settle;
   unsigned walk_threads = 2;  // threads storing the files a folder walk finds
+  std::chrono::milliseconds suggestion_interval{std::chrono::minutes(5)};  // see suggestion_schedule.h
 };
 
 class ShareWorker {
@@ -49,9 +63,24 @@ class ShareWorker {
   bool RunOnce();
   void CheckInterrupt() const;
   void OnFailure(const Error& error, std::chrono::milliseconds& backoff);
+  // Waits out `backoff`, or less when the search daemon, which was not
+  // reachable, accepts connections again.
+  void WaitToRetry(const Error& error, std::chrono::milliseconds backoff);
+  // Commits; Error 913 when the search daemon that took the commit is not the
+  // one that answered at `daemon` (a restart lost the writes in between).
+  void CommitSince(pid_t daemon);
+  // Waits while the search daemon is down or still opening the share's index
+  // (after its restart), so that no request of a round meets its busy answer.
+  void WaitUntilIndexReady();
+  // Applies the taken-over queue's operations from `first` on, committing
+  // and saving how far it got after each slice of work.
+  void ApplyInSlices(OpApplier& applier, const std::vector<std::shared_ptr<fileindex::OP>>& ops, size_t first,
+                     const class BatchMark& mark);
   // A failure because the share's volume is full (the share is then marked
   // for a full reindex).
   bool IsVolumeFull(const Error& error) const;
+  // Rebuilds the share's name suggestions; a failure is logged, not fatal.
+  void RebuildSuggestions();
 
   std::string share_;
   WorkerOptions options_;
@@ -60,8 +89,12 @@ class ShareWorker {
   std::string queue_path_;
   std::unique_ptr<QueueWatch> watch_;
   std::unique_ptr<SettleTracker> settle_;
+  SuggestionSchedule suggestions_;
   std::atomic<bool> stopping_{false};
   std::atomic<bool> finished_{false};
+  // A taken-over queue was left by an earlier run (a crash or a stop in the
+  // middle of it): once it is applied, the share is checked against the disk.
+  bool recovering_ = false;
   std::thread thread_;
 };
 

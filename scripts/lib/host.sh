@@ -3,7 +3,8 @@
 # default) with their systemd units, FOLDER becomes a share in
 # /etc/corvlumex/shares.json, and the units are started.
 
-HOST_UNITS=(corvelasticd.service corvnotifyd.service corvcontentextractd.service pkg-CorvLumex-fileindexd.service)
+HOST_UNITS=(corvelasticd.service corvnotifyd.service corvcontentextractd.service pkg-CorvLumex-fileindexd.service
+  corvspotlightd.service)
 
 host_register_share() {  # name, directory
   local registry=/etc/corvlumex/shares.json

@@ -1,5 +1,5 @@
 # Shell helpers shared by scripts/run and the end-to-end figures in
-# bench/system/: build the programs, start and stop the three daemons in a
+# bench/system/: build the programs, start and stop the daemons in a
 # sandbox root, wait for their sockets. Source it; it sets no options.
 #
 # Inputs (set before calling):
@@ -8,8 +8,8 @@
 #   CORVLUMEX_ROOT   the sandbox root; the daemons' logs and pid files go
 #                    to $CORVLUMEX_ROOT/var/log/corvlumex and .../var/run
 
-SYSTEM_PROGRAMS=(corvelasticd corvnotifyd fileindexd)
-SYSTEM_TARGETS=(corvelasticd corvnotifyd fileindexd fileindex_cli corvcontentextractd corvvxmnotify)
+SYSTEM_PROGRAMS=(corvelasticd corvnotifyd fileindexd corvspotlightd)
+SYSTEM_TARGETS=(corvelasticd corvnotifyd fileindexd fileindex_cli corvcontentextractd corvvxmnotify corvspotlightd fileindex-web)
 
 system_build() {  # builds only what is needed, reusing an existing build folder
   local build="${FILEINDEX_BUILD:-$FILEINDEX_SRC/build}"
@@ -32,7 +32,7 @@ system_build() {  # builds only what is needed, reusing an existing build folder
     grep -E ': (fatal )?error: ' "$log" | tail -20 >&2 || true
     return 1
   fi
-  for target in fileindexd fileindex corvelasticd corvnotifyd corvcontentextractd corvvxmnotify; do
+  for target in fileindexd fileindex corvelasticd corvnotifyd corvcontentextractd corvvxmnotify corvspotlightd fileindex-web; do
     [ -x "$(system_program "$target")" ] || { echo "build failed: $target is missing" >&2; return 1; }
   done
 }
@@ -63,7 +63,7 @@ system_running() {  # program name -> true when its recorded pid is alive
   [ -f "$pid_file" ] && kill -0 "$(cat "$pid_file")" 2>/dev/null
 }
 
-system_start() {  # starts the three daemons in the sandbox root (those not running yet)
+system_start() {  # starts the daemons in the sandbox root (those not running yet)
   local logs; logs="$(system_log_dir)"
   mkdir -p "$logs" "$CORVLUMEX_ROOT/var/run" "$CORVLUMEX_ROOT/etc/corvlumex/monitor.d" "$CORVLUMEX_ROOT/tmp" \
     "$CORVLUMEX_ROOT/var/packages/CorvLumex/etc"
@@ -77,6 +77,9 @@ system_start() {  # starts the three daemons in the sandbox root (those not runn
     system_running "$program" && continue
     case "$program" in
       corvelasticd) args=(--log-stderr) ;;
+      # Samba's Spotlight back end asks it over loopback HTTP; in a sandbox
+      # any free port (the log names it), FILEINDEX_SPOTLIGHT_PORT to choose.
+      corvspotlightd) args=(--log-stderr --port "${FILEINDEX_SPOTLIGHT_PORT:-0}") ;;
       *) args=(--foreground) ;;
     esac
     nohup "$(system_program "$program")" "${args[@]}" >> "$logs/$program.log" 2>&1 < /dev/null &
@@ -88,7 +91,7 @@ system_start() {  # starts the three daemons in the sandbox root (those not runn
 
 system_stop() {  # stops the daemons started by system_start (SIGTERM, then SIGKILL after 10 s)
   local program pid pid_file
-  for program in fileindexd corvnotifyd corvelasticd; do
+  for program in fileindex-web corvspotlightd fileindexd corvnotifyd corvelasticd; do
     pid_file="$(system_pid_file "$program")"
     [ -f "$pid_file" ] || continue
     pid="$(cat "$pid_file")"
@@ -142,4 +145,21 @@ system_add_share() {  # directory -> prints the share's name
 system_write_share() {  # name, directory: writes a one-share registry
   mkdir -p "$CORVLUMEX_ROOT/etc/corvlumex"
   printf '[{"name": "%s", "path": "%s"}]\n' "$1" "$2" > "$CORVLUMEX_ROOT/etc/corvlumex/shares.json"
+}
+
+system_web_link_file() { echo "$CORVLUMEX_ROOT/var/run/fileindex-web.sign-in"; }
+
+system_web_start() {  # port: starts the web daemon (pages from the source tree) and waits for its sign-in link
+  local logs link; logs="$(system_log_dir)"; link="$(system_web_link_file)"
+  system_running fileindex-web && return 0
+  rm -f "$link"
+  nohup "$(system_program fileindex-web)" --port "$1" --web-root "$FILEINDEX_SRC/web" \
+    --sign-in-link-file "$link" >> "$logs/fileindex-web.log" 2>&1 < /dev/null &
+  echo $! > "$(system_pid_file fileindex-web)"
+  local deadline=$((SECONDS + 20))
+  while [ ! -s "$link" ]; do
+    system_running fileindex-web || { tail -3 "$logs/fileindex-web.log" >&2; return 1; }
+    [ $SECONDS -lt $deadline ] || { echo "timed out waiting for fileindex-web" >&2; return 1; }
+    sleep 0.1
+  done
 }

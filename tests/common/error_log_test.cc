@@ -1,6 +1,10 @@
 #include <gtest/gtest.h>
 
 #include <cerrno>
+#include <chrono>
+#include <cstdlib>
+#include <ctime>
+#include <string>
 
 #include "common/error.h"
 #include "common/log.h"
@@ -73,6 +77,33 @@ TEST(LogTest, PlainAndFunctionLinesFollowTheErrnoRule) {
   EXPECT_NE(lines[0].find("error_log_test.cc:"), std::string::npos);
   EXPECT_NE(lines[0].find(" Remove share music from folder mgr"), std::string::npos);
   EXPECT_NE(lines[1].find("Failed [KLIBServiceStart(x)] [err: Permission denied]"), std::string::npos) << lines[1];
+}
+
+// Time stamps of log lines written to files: ISO 8601, local time to the
+// millisecond, with the offset from UTC (POSIX time-zone strings, so no
+// time-zone data is needed).
+TEST(LogTest, TimeStampsAreIso8601LocalTimeWithTheirOffset) {
+  const char* saved = getenv("TZ");
+  const std::string previous = saved ? saved : "";
+  struct Case {
+    const char* tz;
+    long long millis;
+    const char* stamp;
+  };
+  const Case cases[] = {
+      {"UTC0", 1250, "1970-01-01T00:00:01.250+00:00"},
+      {"IST-5:30", 1800000000007LL, "2027-01-15T13:30:00.007+05:30"},
+      {"EST5", 1800000000999LL, "2027-01-15T03:00:00.999-05:00"},
+  };
+  for (const Case& c : cases) {
+    setenv("TZ", c.tz, 1);
+    tzset();
+    EXPECT_EQ(IsoTimeStamp(std::chrono::system_clock::time_point(std::chrono::milliseconds(c.millis))), c.stamp)
+        << c.tz;
+  }
+  if (saved) setenv("TZ", previous.c_str(), 1);
+  else unsetenv("TZ");
+  tzset();
 }
 
 TEST(LogTest, LogLevelStartsAtDebug) { EXPECT_EQ(fileindex::log_level, 7); }

@@ -11,7 +11,7 @@
 #include "common/error.h"
 #include "common/json_util.h"
 #include "fileindex/communication.h"
-#include "programs/corvelasticd/request_frame.h"
+#include "fileindex/frame_reader.h"
 
 namespace corvlumex {
 namespace elasticd_test {
@@ -27,19 +27,6 @@ Json::Value Data(const std::string& text) {
   Json::Value value;
   EXPECT_TRUE(JsonFromString(value, text)) << text;
   return value;
-}
-
-int ConnectTo(const std::string& path) {
-  const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  sockaddr_un address;
-  memset(&address, 0, sizeof(address));
-  address.sun_family = AF_UNIX;
-  strncpy(address.sun_path, path.c_str(), sizeof(address.sun_path) - 1);
-  if (connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)) != 0) {
-    close(fd);
-    return -1;
-  }
-  return fd;
 }
 
 Json::Value LibraryMappings() {
@@ -112,30 +99,6 @@ int Daemon::Terminate() {
   return status;
 }
 
-std::string Frame(const std::string& text) {
-  const uint32_t length = static_cast<uint32_t>(text.size() + 1);
-  std::string frame(reinterpret_cast<const char*>(&length), sizeof(length));
-  frame += text;
-  frame += '\0';
-  return frame;
-}
-
-std::string SendRaw(const std::string& socket, const std::string& bytes) {
-  // The daemon may answer and hang up before a refused request is fully sent.
-  signal(SIGPIPE, SIG_IGN);
-  const int fd = ConnectTo(socket);
-  if (fd < 0) throw std::runtime_error("cannot connect to " + socket);
-  try {
-    if (!bytes.empty()) fileindex::BufferWrite(fd, static_cast<unsigned int>(bytes.size()), reinterpret_cast<const unsigned char*>(bytes.data()));
-  } catch (const Error&) {
-    // Hung up early: its answer, if any, is still waiting to be read.
-  }
-  std::string answer;
-  const elasticd::FrameStatus status = elasticd::ReadRequestFrame(fd, 1u << 30, 20000, 20000, &answer);
-  close(fd);
-  return status == elasticd::FrameStatus::kOk ? answer : std::string();
-}
-
 Json::Value Exchange(int fd, const Json::Value& request) {
   signal(SIGPIPE, SIG_IGN);
   try {
@@ -145,7 +108,7 @@ Json::Value Exchange(int fd, const Json::Value& request) {
   }
   std::string text;
   Json::Value answer;
-  if (elasticd::ReadRequestFrame(fd, 1u << 30, 20000, 20000, &text) != elasticd::FrameStatus::kOk || !JsonFromString(answer, text)) {
+  if (fileindex::ReadFrameBounded(fd, 1u << 30, 20000, 20000, &text) != fileindex::FrameStatus::kOk || !JsonFromString(answer, text)) {
     throw std::runtime_error("no JSON answer: \"" + text + "\"");
   }
   return answer;

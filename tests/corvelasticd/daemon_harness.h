@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "tests/support/child_process.h"
+#include "tests/support/frame_client.h"
 #include "tests/support/log_capture.h"
 
 namespace corvlumex {
@@ -47,18 +48,17 @@ class Daemon {
   std::unique_ptr<testing_support::ChildProcess> process_;
 };
 
-// A connection to the socket (-1 when refused), and one request/answer on it.
-int ConnectTo(const std::string& socket);
+using testing_support::ConnectTo;
+using testing_support::Frame;
+using testing_support::SendRaw;
+
+// One request/answer on a connection.
 Json::Value Exchange(int fd, const Json::Value& request);
 
 // One request on a fresh connection; the parsed answer.
 Json::Value Send(const std::string& socket, const Json::Value& request);
-// Raw bytes in, raw answer text out ("" when the daemon closed without answering).
-std::string SendRaw(const std::string& socket, const std::string& bytes);
 // {"command": command, "data": data}
 Json::Value Command(const std::string& socket, const std::string& command, const Json::Value& data);
-// A frame of `text` (length with the trailing NUL, text, NUL).
-std::string Frame(const std::string& text);
 
 // The doc_ids of a search answer, in order.
 std::vector<std::string> HitIds(const Json::Value& answer);

@@ -42,8 +42,27 @@ TEST(AnalyzeTest, KeywordValuesStayWholeWithoutBlanks) {
 
 TEST(AnalyzeTest, StandardSplitsOnPunctuationAndCjkCharacters) {
   EXPECT_EQ(Tokens(Analyzer::kStandard, "AC-3 decoder_v2, \xC3\x89t\xC3\xA9!"),
-            std::vector<std::string>({"ac", "3", "decoder_v2", "ete"}));
+            std::vector<std::string>({"ac", "3", "decoder_v2", "decoder", "v2", "ete"}));
   EXPECT_EQ(Tokens(Analyzer::kStandard, "\xE6\x9D\xB1\xE4\xBA\xAC"), std::vector<std::string>({"\xE6\x9D\xB1", "\xE4\xBA\xAC"}));
+}
+
+TEST(AnalyzeTest, JoinedAndCamelCaseWordsGiveTheWholeWordThenEachPart) {
+  const struct {
+    const char* text;
+    std::vector<std::string> tokens;
+  } cases[] = {
+      {"pthread_mutex_lock", {"pthread_mutex_lock", "pthread", "mutex", "lock"}},
+      {"readFileSync", {"readfilesync", "read", "file", "sync"}},
+      {"XMLParser", {"xmlparser", "xml", "parser"}},
+      {"utf8Decode", {"utf8decode", "utf8", "decode"}},
+      {"__init__", {"__init__", "init"}},
+      {"IPv6 iPhone", {"ipv6", "iphone", "i", "phone"}},
+      {"plain Words UPPER", {"plain", "words", "upper"}},
+      {"foo_bar e-mail C++", {"foo_bar", "foo", "bar", "e", "mail", "c"}},
+  };
+  for (const auto& c : cases) EXPECT_EQ(Tokens(Analyzer::kStandard, c.text), c.tokens) << c.text;
+  // Names' words ("white space" fields) are not split.
+  EXPECT_EQ(Tokens(Analyzer::kWhitespace, "read_me.txt"), std::vector<std::string>({"read_me.txt"}));
 }
 
 TEST(AnalyzeTest, WhiteSpaceKeepsPunctuationInsideTokens) {

@@ -4,11 +4,13 @@
 
 #include <chrono>
 #include <string>
+#include <vector>
 
 #include "common/json_util.h"
 #include "fileindex/event.h"
 #include "programs/corvnotifyd/crash_backoff.h"
 #include "programs/corvnotifyd/event_line.h"
+#include "programs/corvnotifyd/loss_advice.h"
 #include "programs/corvnotifyd/monitor_config.h"
 #include "tests/support/log_capture.h"
 
@@ -112,6 +114,36 @@ Json::Value Parse(const std::string& text) {
   Json::Value value;
   EXPECT_TRUE(JsonFromString(value, text)) << text;
   return value;
+}
+
+// The advice quotes the limit the kernel applied, and proposes a value from
+// it; a sysctl raised since is named as such, not as the limit reached.
+TEST(LossAdviceTest, QuotesTheLimitInForceAndWhatToDo) {
+  struct Case {
+    LossKind kind;
+    long in_force, now;
+    std::vector<std::string> says, never;
+  };
+  const Case cases[] = {
+      {LossKind::kKernelOverflow, 16384, 16384,
+       {"overflowed at fs.inotify.max_queued_events=16384,", "sysctl -w fs.inotify.max_queued_events=65536",
+        "restart corvnotifyd"},
+       {"raised"}},
+      {LossKind::kKernelOverflow, 16384, 100000,
+       {"overflowed at fs.inotify.max_queued_events=16384,", "raised to 100000 since", "restarted"},
+       {"max_queued_events=100000", "sysctl -w"}},
+      {LossKind::kKernelOverflow, 16384, 8192, {"max_queued_events=16384,", "=65536"}, {"8192"}},
+      {LossKind::kKernelOverflow, -1, -1, {"max_queued_events (value unknown)", "max_queued_events=65536"}, {"-1"}},
+      {LossKind::kNoWatches, 8192, 8192,
+       {"no inotify watch left at fs.inotify.max_user_watches=8192,", "sysctl -w fs.inotify.max_user_watches=16384"},
+       {"raised"}},
+      {LossKind::kNoWatches, 8192, 524288, {"max_user_watches=8192,", "raised to 524288 since"}, {"sysctl -w"}},
+  };
+  for (const Case& c : cases) {
+    const std::string advice = LossAdvice(c.kind, c.in_force, c.now);
+    for (const std::string& text : c.says) EXPECT_NE(advice.find(text), std::string::npos) << text << " in " << advice;
+    for (const std::string& text : c.never) EXPECT_EQ(advice.find(text), std::string::npos) << text << " in " << advice;
+  }
 }
 
 TEST(MonitorConfigTest, ReadsQueueFoldersMaskAndIgnoreNames) {

@@ -93,8 +93,19 @@ std::unique_ptr<ChildProcess> NotifydSandbox::Run(const std::vector<std::string>
 }
 
 std::unique_ptr<ChildProcess> NotifydSandbox::Start(const std::map<std::string, std::string>& env) const {
+  // The log is appended to: an earlier run's line does not count.
+  const auto runs = [this] {
+    const std::string log = ReadFileText(log_path());
+    size_t count = 0;
+    for (size_t at = log.find("watching as configured"); at != std::string::npos;
+         at = log.find("watching as configured", at + 1)) {
+      ++count;
+    }
+    return count;
+  };
+  const size_t before = runs();
   auto process = Run({"--foreground"}, env);
-  EXPECT_TRUE(WaitForLog("watching as configured")) << process->Log();
+  EXPECT_TRUE(WaitUntil([&] { return runs() > before; })) << process->Log();
   return process;
 }
 

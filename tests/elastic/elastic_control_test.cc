@@ -92,6 +92,29 @@ TEST_F(ElasticControlTest, IndexIdIsThePrefixAndTheShareNameUnchanged) {
   EXPECT_EQ(GetFileIndexID(""), "fileindex_");
 }
 
+// The look whether a restarted daemon can take the share's requests: one
+// "index_list", never the busy retry's sleep.
+TEST_F(ElasticControlTest, AnIndexIsReadyUnlessTheDaemonIsBusyOrStillOpeningIt) {
+  const struct {
+    const char* name;
+    FakeAnswer answer;
+    bool ready;
+  } cases[] = {
+      {"opening", FakeAnswer::Success(JsonOf(R"([{"id": "fileindex_music", "state": "opening"}])")), false},
+      {"busy", FakeAnswer::Failure(1401, "opening"), false},
+      {"ready", FakeAnswer::Success(JsonOf(R"([{"id": "fileindex_other", "state": "opening"},
+                                                {"id": "fileindex_music", "state": "ready"}])")), true},
+      {"not listed", FakeAnswer::Success(JsonOf("[]")), true},
+      {"another failure", FakeAnswer::Failure(2000, "bad request"), true},
+  };
+  for (const auto& c : cases) {
+    daemon_.Enqueue(c.answer);
+    EXPECT_EQ(IsIndexReady("music"), c.ready) << c.name;
+    EXPECT_EQ(daemon_.Requests().back(), JsonOf(R"({"command": "index_list"})")) << c.name;
+  }
+  EXPECT_TRUE(sleeps_.Sleeps().empty());
+}
+
 TEST_F(ElasticControlTest, ShareIndexCommandsCarryTheirEnvelopes) {
   const struct {
     std::function<void()> run;

@@ -26,12 +26,14 @@ const std::vector<std::string> kFields = {
     "CORVMDAperture", "CORVMDResolutionWidthDPI", "CORVMDResolutionHeightDPI", "CORVMDMediaTypes", "CORVMDParent",
     "CORVMDExtension", "CORVMDTextContent", "CORVMDKeywords", "CORVMDFinderLabel", "CORVMDGroupId",
     "CORVMDFinderOpenDate", "CORVMDLogicalSize", "CORVMDPhysicalSize", "CORVMDDateAdded", "CORVMDSearchFileName",
-    "CORVMDStarRating", "_CORVMDUserTags", "CORVMDSpotlightBoost"};
+    "CORVMDStarRating", "_CORVMDUserTags", "CORVMDSpotlightBoost", "CORVMDFSFileID",
+    // Added after the original set: marks a file whose content could not be read.
+    "CORVMDExtractionFailed", "CORVMDExtractionError"};
 
 // What differs from the defaults, by kind: the type, the analyzer, and
 // whether the field is left out of the catch-all "_all".
 const std::map<std::string, std::vector<std::string>> kTypes = {
-    {"bool", {"CORVMDIsDir"}},
+    {"bool", {"CORVMDIsDir", "CORVMDExtractionFailed"}},
     {"double", {"CORVMDDurationSecond"}},
     {"int", {"CORVMDFSSize", "CORVMDFSContentChangeDate", "CORVMDAttributeChangeDate", "CORVMDFSCreationDate",
              "CORVMDContentModificationDate", "CORVMDLastUsedDate", "CORVMDContentCreationDate", "CORVMDAudioTrackNumber",
@@ -46,12 +48,14 @@ const std::map<std::string, std::vector<std::string>> kTypes = {
 const std::map<std::string, std::vector<std::string>> kAnalyzers = {
     {"keyword", {"CORVMDPath", "CORVMDFSName", "CORVMDPrivilege", "CORVMDOwnerUserID", "CORVMDOwnerGroupID",
                  "CORVMDIdentifier", "CORVMDExposureTimeString", "CORVMDAperture", "CORVMDMediaTypes", "CORVMDParent",
-                 "CORVMDExtension", "CORVMDGroupId", "CORVMDStarRating"}},
+                 "CORVMDExtension", "CORVMDGroupId", "CORVMDStarRating", "CORVMDFSFileID",
+                 "CORVMDExtractionError"}},
     {"white space", {"CORVMDAuthors", "CORVMDCreator", "CORVMDComposer", "CORVMDCodecs", "CORVMDAcquisitionMake",
                      "CORVMDAcquisitionModel", "CORVMDSearchFileName", "CORVMDSpotlightBoost"}}};
 const std::vector<std::string> kNotInAll = {"CORVMDPath", "CORVMDFSName", "CORVMDPrivilege", "CORVMDIsDir",
                                             "CORVMDOwnerUserID", "CORVMDOwnerGroupID", "CORVMDIdentifier",
-                                            "CORVMDParent", "CORVMDExtension"};
+                                            "CORVMDParent", "CORVMDExtension", "CORVMDFSFileID",
+                                            "CORVMDExtractionFailed", "CORVMDExtractionError"};
 
 bool Has(const std::vector<std::string>& names, const std::string& name) {
   return std::find(names.begin(), names.end(), name) != names.end();

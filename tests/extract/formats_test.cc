@@ -22,6 +22,7 @@ using testing_support::MakePdf;
 using testing_support::RunTool;
 using testing_support::SandboxRoot;
 using testing_support::WriteBytes;
+using testing_support::WriteCompressed;
 
 class FormatsTest : public ::testing::Test {
  protected:
@@ -34,7 +35,7 @@ class FormatsTest : public ::testing::Test {
     EXPECT_GE(fd, 0) << name;
     Json::Value fields;
     try {
-      fields = ExtractContent(fd, name, need_meta);
+      fields = ExtractContent(fd, name, need_meta, text_cap_);
     } catch (...) {
       close(fd);
       throw;
@@ -44,6 +45,7 @@ class FormatsTest : public ::testing::Test {
   }
 
   SandboxRoot root_{false};
+  size_t text_cap_ = kTextContentCap;
 };
 
 TEST_F(FormatsTest, PlainTextInOtherEncodingsBecomesUtf8) {
@@ -65,9 +67,36 @@ TEST_F(FormatsTest, TextWithoutKnownExtensionIsReadByItsMediaType) {
   EXPECT_NE("", binary[kFieldMediaTypes].asString());
 }
 
-TEST_F(FormatsTest, TextIsCappedAtOneMebibyte) {
-  WriteBytes(PathOf("big.txt"), std::string(3 * kTextContentCap, 'x'));
-  EXPECT_EQ(kTextContentCap, Extract("big.txt")[kFieldTextContent].asString().size());
+TEST_F(FormatsTest, TextIsCappedAtTheSettingWhoseDefaultKeepsLongFilesWhole) {
+  WriteBytes(PathOf("long.txt"), std::string(3u << 20, 'x'));
+  EXPECT_EQ(3u << 20, Extract("long.txt")[kFieldTextContent].asString().size());
+  text_cap_ = 1000;
+  EXPECT_EQ(1000u, Extract("long.txt")[kFieldTextContent].asString().size());
+}
+
+TEST_F(FormatsTest, TextIsTypedByNameOrClearSignatureNotByAGuessOfMarkup) {
+  const struct {
+    const char* name;
+    const char* content;
+    const char* text;
+  } cases[] = {
+      // Sources whose names the extractor knows, and a Perl module libmagic calls JavaScript.
+      {"Parser.pm", "package Parser;\nuse strict;\n# returns <b>bold</b> text\nsub new { return bless {}, shift; }\n1;",
+       "returns <b>bold</b> text"},
+      {"unit.pas", "unit Demo;\n{ <html> in a comment }\ninterface\nprocedure Hello;\nimplementation\nend.",
+       "<html> in a comment"},
+      // No known extension: HTML only with its signature, else plain text.
+      {"NOTES", "Write <b>bold</b> in <i>pages</i>; a <p> starts a paragraph.\nSecond line.", "a <p> starts a paragraph."},
+      // libmagic calls this HTML for its tags; an HTML parser would drop the words in <head>.
+      {"DemoUnit", "unit Demo;\n{ <head> remark </head> }\ninterface\nprocedure Hello;\n", "{ <head> remark </head> }"},
+      {"page", "<!DOCTYPE html><html><body><p>real page</p></body></html>", "real page"},
+  };
+  for (const auto& c : cases) {
+    WriteBytes(PathOf(c.name), c.content);
+    const std::string text = Extract(c.name)[kFieldTextContent].asString();
+    EXPECT_NE(text.find(c.text), std::string::npos) << c.name << ": " << text;
+  }
+  EXPECT_EQ(Extract("page")[kFieldTextContent].asString(), "real page");
 }
 
 TEST_F(FormatsTest, HtmlKeepsTextAndHeadFieldsNotScripts) {
@@ -80,6 +109,43 @@ TEST_F(FormatsTest, HtmlKeepsTextAndHeadFieldsNotScripts) {
   EXPECT_EQ("Caf\xC3\xA9 page", fields[kFieldTitle].asString());
   EXPECT_EQ("Ann Lee", fields[kFieldAuthors].asString());
   EXPECT_EQ("About coffee", fields[kFieldDescription].asString());
+}
+
+TEST_F(FormatsTest, HtmlKeepsNoscriptAndTextAfterTheEnd) {
+  WriteBytes(PathOf("late.html"),
+             "<html><body><p>inside</p><noscript>enable scripts</noscript></body></html>\n<p>after the end</p> tail");
+  const std::string text = Extract("late.html")[kFieldTextContent].asString();
+  for (const char* words : {"inside", "enable scripts", "after the end", "tail"}) {
+    EXPECT_NE(text.find(words), std::string::npos) << words << " in " << text;
+  }
+}
+
+TEST_F(FormatsTest, SingleCompressedFilesAndManPagesGiveTheirText) {
+  const std::string page =
+      ".\\\" a comment\n.TH LS 1 \"2024\"\n.SH NAME\nls \\- list directory contents\n.SH DESCRIPTION\n"
+      "List information about the \\fBFILEs\\fR (the current \\fIdirectory\\fP by default).\n.TP\n.B \\-a\n"
+      "do not ignore entries starting with .\n.sp 2\n";
+  const char* page_words = "list directory contents";
+  WriteBytes(PathOf("ls.1"), page);
+  for (const char* suffix : {"gz", "bz2", "xz", "zst"}) {
+    SCOPED_TRACE(suffix);
+    WriteCompressed(PathOf(std::string("notes.txt.") + suffix), suffix, "saffron rice, caf\xC3\xA9 cr\xC3\xA8me");
+    EXPECT_EQ("saffron rice, caf\xC3\xA9 cr\xC3\xA8me", Extract(std::string("notes.txt.") + suffix)[kFieldTextContent].asString());
+    WriteCompressed(PathOf(std::string("ls.1.") + suffix), suffix, page);
+    const std::string text = Extract(std::string("ls.1.") + suffix)[kFieldTextContent].asString();
+    EXPECT_NE(text.find(page_words), std::string::npos) << text;
+    EXPECT_NE(text.find("FILEs (the current directory by default)"), std::string::npos) << text;
+    EXPECT_EQ(text.find(".TH"), std::string::npos) << text;
+    EXPECT_EQ(text.find("fB"), std::string::npos) << text;
+    EXPECT_EQ(text.find("a comment"), std::string::npos) << text;
+  }
+  EXPECT_EQ(Extract("ls.1")[kFieldTextContent].asString(), Extract("ls.1.gz")[kFieldTextContent].asString());
+  // An archive inside (.tar.gz) is no text: only the name and status are kept.
+  WriteCompressed(PathOf("bundle.tar.gz"), "gz", std::string("ustar\0\0\0binary", 14));
+  EXPECT_FALSE(Extract("bundle.tar.gz").isMember(kFieldTextContent));
+  // Garbage under a compressed name fails as any broken file does.
+  WriteBytes(PathOf("broken.gz"), "not gzip at all");
+  EXPECT_THROW(Extract("broken.gz"), std::exception);
 }
 
 TEST_F(FormatsTest, XmlKeepsValuesApartAndNeverFetchesEntities) {

@@ -62,6 +62,27 @@ void MakePdf(const std::string& path, const std::vector<std::string>& pages, con
   WriteBytes(path, out);
 }
 
+// `data` compressed by libarchive's writer into `path` with the filter of
+// `suffix` (gz, bz2, xz, zst), as the compression tools would write it.
+void WriteCompressed(const std::string& path, const std::string& suffix, const std::string& data) {
+  struct archive* writer = archive_write_new();
+  if (suffix == "gz") archive_write_add_filter_gzip(writer);
+  if (suffix == "bz2") archive_write_add_filter_bzip2(writer);
+  if (suffix == "xz") archive_write_add_filter_xz(writer);
+  if (suffix == "zst") archive_write_add_filter_zstd(writer);
+  archive_write_set_format_raw(writer);
+  ASSERT_EQ(ARCHIVE_OK, archive_write_open_filename(writer, path.c_str())) << archive_error_string(writer);
+  struct archive_entry* entry = archive_entry_new();
+  archive_entry_set_pathname(entry, "data");
+  archive_entry_set_filetype(entry, AE_IFREG);
+  archive_entry_set_size(entry, static_cast<la_int64_t>(data.size()));
+  ASSERT_EQ(ARCHIVE_OK, archive_write_header(writer, entry)) << archive_error_string(writer);
+  ASSERT_EQ(static_cast<la_ssize_t>(data.size()), archive_write_data(writer, data.data(), data.size()));
+  archive_entry_free(entry);
+  archive_write_close(writer);
+  archive_write_free(writer);
+}
+
 void MakeZip(const std::string& path, const std::map<std::string, std::string>& parts) {
   struct archive* archive = archive_write_new();
   archive_write_set_format_zip(archive);

@@ -20,6 +20,8 @@ void MakePdf(const std::string& path, const std::vector<std::string>& pages, con
 
 // A zip container with the given parts (name -> content), deflated.
 void MakeZip(const std::string& path, const std::map<std::string, std::string>& parts);
+// `data` compressed into `path` with the filter of `suffix` (gz, bz2, xz, zst).
+void WriteCompressed(const std::string& path, const std::string& suffix, const std::string& data);
 
 // Minimal documents of each office format holding `paragraphs`, with title and author.
 void MakeOffice(const std::string& path, const std::string& format, const std::vector<std::string>& paragraphs,

@@ -3,6 +3,7 @@
 // next file always served.
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sys/socket.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -12,10 +13,15 @@
 #include <vector>
 
 #include "common/error.h"
+#include "common/json_util.h"
+#include "fileindex/frame_reader.h"
 #include "platform/linux/extract/document_fields.h"
 #include "platform/linux/extract/worker_client.h"
+#include "platform/linux/extract/worker_protocol.h"
 #include "platform/linux/linux_platform.h"
 #include "tests/extract/samples.h"
+#include "tests/support/child_process.h"
+#include "tests/support/frame_client.h"
 #include "tests/support/log_capture.h"
 
 namespace corvlumex {
@@ -29,6 +35,8 @@ using testing_support::RunTool;
 using testing_support::SandboxRoot;
 using testing_support::Truncate;
 using testing_support::WriteBytes;
+using testing_support::Frame;
+using testing_support::WriteCompressed;
 
 class WorkerTest : public ::testing::Test {
  protected:
@@ -57,16 +65,15 @@ class WorkerTest : public ::testing::Test {
     return document;
   }
 
-  // The reason of the Error a parse gives; fails the test when it succeeds.
+  // The reason a file's content could not be read. The file still gets its
+  // document, with the file-system fields and the failure, so it stays
+  // findable; fails the test when the content was read.
   std::string FailureOf(const std::string& name) {
-    try {
-      Parse(name);
-    } catch (const Error& error) {
-      EXPECT_EQ(kErrorParseDocument, error.code);
-      return error.reason;
-    }
-    ADD_FAILURE() << name << " was expected to fail";
-    return std::string();
+    const Json::Value document = Parse(name);
+    EXPECT_EQ(PathOf(name), document[kFieldPath].asString());
+    EXPECT_TRUE(document[kFieldExtractionFailed].asBool()) << name << " was expected to fail";
+    EXPECT_FALSE(document.isMember(kFieldTextContent)) << name;
+    return document[kFieldExtractionError].asString();
   }
 
   // Switches the worker's behaviour for the workers started from now on.
@@ -229,6 +236,79 @@ TEST_F(WorkerTest, AMemoryHungryParserHitsTheLimit) {
   EXPECT_NE(std::string::npos, reason.find("out of memory (the worker may use 256 MiB)")) << reason;
 }
 
+// The worker's own reading of requests, spoken to directly as the library
+// does: a bad request is answered and the next one served; a cut one ends
+// the conversation at once, never with a worker spinning on a closed socket.
+TEST_F(WorkerTest, BadRequestsAreAnsweredAndACutOneEndsTheWorkerCleanly) {
+  WriteBytes(PathOf("doc.txt"), "plain words");
+  int ends[2];
+  ASSERT_EQ(0, socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends));
+  testing_support::ChildProcess worker(FindWorkerProgram(), {"--worker"}, PathOf("worker.log"), {}, ends[1]);
+  close(ends[1]);
+  const int library = ends[0];
+  const auto ask = [&](bool with_file, const std::string& frame) {
+    const int file = open(PathOf("doc.txt").c_str(), O_RDONLY | O_CLOEXEC);
+    if (with_file) {
+      EXPECT_TRUE(SendDescriptor(library, file));
+    } else {
+      EXPECT_EQ(1, write(library, "F", 1));  // the marker byte alone
+    }
+    close(file);
+    EXPECT_EQ(static_cast<ssize_t>(frame.size()), write(library, frame.data(), frame.size()));
+    std::string text;
+    Json::Value reply;
+    if (fileindex::ReadFrameBounded(library, kMaxReplyBytes, 20000, 20000, &text) != fileindex::FrameStatus::kOk ||
+        !JsonFromString(reply, text)) {
+      ADD_FAILURE() << "no reply to " << frame << "; " << testing_support::ReadFileText(PathOf("worker.log"));
+    }
+    return reply;
+  };
+  const std::string good = Frame(R"({"name": ")" + PathOf("doc.txt") + R"(", "need_meta": false})");
+  const struct {
+    const char* what;
+    bool with_file;
+    std::string frame;
+    const char* error;
+  } cases[] = {
+      {"not JSON", true, Frame("{not json"), "not JSON"},
+      {"nesting past the JSON reader's limit", true, Frame(std::string(1001, '[') + std::string(1001, ']')), "not JSON"},
+      {"a name that is an array", true, Frame(R"({"name": ["x"], "need_meta": false})"), "must be"},
+      {"no descriptor with the request", false, good, "no file descriptor"},
+  };
+  for (const auto& c : cases) {
+    const Json::Value reply = ask(c.with_file, c.frame);
+    EXPECT_FALSE(reply["ok"].asBool()) << c.what;
+    EXPECT_NE(reply["error"].asString().find(c.error), std::string::npos) << c.what << ": " << reply["error"].asString();
+    const Json::Value served = ask(true, good);
+    EXPECT_EQ("plain words", served["fields"][kFieldTextContent].asString()) << "after " << c.what;
+  }
+  const int file = open(PathOf("doc.txt").c_str(), O_RDONLY | O_CLOEXEC);
+  ASSERT_TRUE(SendDescriptor(library, file));
+  close(file);
+  ASSERT_EQ(7, write(library, good.data(), 7));
+  shutdown(library, SHUT_WR);
+  EXPECT_TRUE(testing_support::PollUntil([&] { return !worker.Running(); }, std::chrono::seconds(20)));
+  EXPECT_EQ(1, worker.exit_status());
+  close(library);
+}
+
+TEST_F(WorkerTest, ACompressionBombIsCutNotFollowed) {
+#if defined(__SANITIZE_ADDRESS__)
+  GTEST_SKIP() << "the sanitizer build runs the worker without an address-space limit";
+#endif
+  // 512 MiB of text in a worker that may use 256 MiB: unpacking it whole
+  // would kill the worker; cut at the text limit, the text comes through.
+  WriteCompressed(PathOf("bomb.txt.zst"), "zst", std::string(512u << 20, 'x'));
+  setenv("CORVLUMEX_EXTRACT_MEMORY_MB", "256", 1);
+  setenv("CORVLUMEX_EXTRACT_TEXT_MB", "1", 1);
+  StopIdleExtractWorkers();
+  const Json::Value document = Parse("bomb.txt.zst");
+  unsetenv("CORVLUMEX_EXTRACT_MEMORY_MB");
+  unsetenv("CORVLUMEX_EXTRACT_TEXT_MB");
+  EXPECT_FALSE(document.isMember(kFieldExtractionFailed)) << document[kFieldExtractionError].asString();
+  EXPECT_EQ(1u << 20, document[kFieldTextContent].asString().size());
+}
+
 TEST_F(WorkerTest, TheWorkerIsConfined) {
   WriteBytes(PathOf("a.txt"), "alpha");
   UseHook("probe");
@@ -251,17 +331,19 @@ TEST_F(WorkerTest, UnreadableFileIsAnErrorNamingTheCause) {
   if (as_root) {
     ASSERT_EQ(0, seteuid(65534));
   }
-  std::string reason;
-  try {
-    Parse("secret.txt");
-  } catch (const Error& error) {
-    reason = error.reason;
-  }
+  const std::string reason = FailureOf("secret.txt");
   if (as_root) {
     ASSERT_EQ(0, seteuid(0));
   }
   EXPECT_NE(std::string::npos, reason.find("cannot open " + PathOf("secret.txt") + ": Permission denied")) << reason;
-  EXPECT_NE(std::string::npos, FailureOf("missing.txt").find("No such file or directory"));
+  // A file that is gone has no document at all.
+  try {
+    Parse("missing.txt");
+    ADD_FAILURE() << "missing.txt gave a document";
+  } catch (const Error& error) {
+    EXPECT_EQ(kErrorParseDocument, error.code);
+    EXPECT_NE(std::string::npos, error.reason.find("No such file or directory")) << error.reason;
+  }
 }
 
 TEST_F(WorkerTest, LinksPipesAndFoldersAreNotOpened) {

@@ -6,6 +6,7 @@
 #include "common/json_util.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/status_mgr.h"
+#include "platform/platform.h"
 #include "tests/mgmt/mgmt_test_base.h"
 
 namespace corvlumex {
@@ -50,11 +51,14 @@ TEST_F(FolderDeleteTest, LastFolderOfAShareTakesItsIndexAndDataAlong) {
   const std::vector<Json::Value> commands = NewDaemonCommands();
   ASSERT_EQ(commands.size(), 1u);
   EXPECT_EQ(JsonToString(commands[0]["data"]), "{\"is_upsert\":false,\"share_name\":\"photo\"}");
-  EXPECT_TRUE(NewServiceRequests().empty());  // music is still indexed
+  // music is still indexed; samba re-reads that photo has no Spotlight now.
+  EXPECT_THAT(NewServiceRequests(), ElementsAre("reload smbd.service"));
+  EXPECT_EQ(platform::Current()->SMBIsEnableSpotlight(), 1);
+  Mark();
 
   FolderDelete(JsonList({"/music"}));
   EXPECT_THAT(sandbox_.SavedPaths(), ElementsAre());
-  EXPECT_THAT(NewServiceRequests(), ElementsAre("restart smbd.service", "--no-block stop corvcontentextractd.service",
+  EXPECT_THAT(NewServiceRequests(), ElementsAre("reload smbd.service", "--no-block stop corvcontentextractd.service",
                                                 "stop pkg-CorvLumex-fileindexd.service"));
 }
 

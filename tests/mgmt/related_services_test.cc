@@ -25,7 +25,7 @@ class RelatedServicesTest : public testing_support::MgmtTest {
 
 TEST_F(RelatedServicesTest, EnableStartsEverythingAndSwitchesSpotlightOnlyOnce) {
   SetupRelatedServices(true);
-  EXPECT_THAT(NewServiceRequests(), ElementsAre("restart smbd.service", "start corvcontentextractd.service",
+  EXPECT_THAT(NewServiceRequests(), ElementsAre("reload smbd.service", "start corvcontentextractd.service",
                                                 "start pkg-CorvLumex-fileindexd.service"));
   Mark();
   SetupRelatedServices(true);  // Spotlight already on: samba is not restarted again
@@ -35,7 +35,7 @@ TEST_F(RelatedServicesTest, EnableStartsEverythingAndSwitchesSpotlightOnlyOnce) 
   SetupRelatedServices(false);
   SetupRelatedServices(false);  // already off: no second restart
   EXPECT_THAT(NewServiceRequests(),
-              ElementsAre("restart smbd.service", kStopExtract, kStopIndexer, kStopExtract, kStopIndexer));
+              ElementsAre("reload smbd.service", kStopExtract, kStopIndexer, kStopExtract, kStopIndexer));
 }
 
 TEST_F(RelatedServicesTest, FailuresAreLoggedAndEveryStepStillRuns) {
@@ -70,7 +70,7 @@ TEST_F(RelatedServicesTest, PrepareServicesFollowsTheFolderFile) {
   WriteFolders({});
   Mark();
   PrepareServices();
-  EXPECT_THAT(NewServiceRequests(), ElementsAre("restart smbd.service", kStopExtract, kStopIndexer));
+  EXPECT_THAT(NewServiceRequests(), ElementsAre("reload smbd.service", kStopExtract, kStopIndexer));
 }
 
 TEST_F(RelatedServicesTest, MonitorConfigurationListsTheShareFoldersOnly) {

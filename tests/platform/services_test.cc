@@ -62,7 +62,7 @@ TEST_F(ServicesTest, InASandboxRequestsAreOnlyRecorded) {
   EXPECT_EQ(RequestLog(),
             "start corvcontentextractd.service\n"
             "--no-block stop corvcontentextractd.service\n"
-            "restart smbd.service\n"
+            "reload smbd.service\n"  // samba is never restarted: that drops every SMB client
             "start pkg-CorvLumex-fileindexd.service\n"
             "stop pkg-CorvLumex-fileindexd.service\n");
   EXPECT_LT(platform_.ServicectlStart("pkg-CorvLumex-fileindexd", 7), 0);
@@ -84,6 +84,24 @@ TEST_F(ServicesTest, TheConfiguredCommandCarriesTheRequest) {
   EXPECT_LT(platform_.ServiceStop("samba", true), 0);
   EXPECT_EQ(LastError().code, kPlatformErrService);
   EXPECT_NE(LastError().message.find("status 3"), std::string::npos) << LastError().message;
+}
+
+TEST_F(ServicesTest, SambaIsReloadedNeverRestarted) {
+  // With systemd's command (a real host), every smbd process is told to
+  // re-read its configuration; a restart would drop every SMB client.
+  root_.WriteFile("etc/corvlumex/service_command", "/bin/systemctl\n");
+  const std::string smbcontrol = root_.WriteFile("bin/smbcontrol", "#!/bin/sh\necho \"smbcontrol $@\" >> " +
+                                                                       root_.path() + "/asked\n");
+  chmod(smbcontrol.c_str(), 0755);
+  const std::string old_path = getenv("PATH") != nullptr ? getenv("PATH") : "/usr/bin:/bin";
+  setenv("PATH", (root_.path() + "/bin:" + old_path).c_str(), 1);
+  EXPECT_EQ(platform_.ServiceRestart("samba"), 0);
+  setenv("PATH", old_path.c_str(), 1);
+  EXPECT_EQ(ReadAll(root_.path() + "/asked"), "smbcontrol smbd reload-config\n");
+  // Through an administrator's own service command it is a reload too.
+  ScopedEnv command("CORVLUMEX_SERVICE_COMMAND", RecordingCommand(0));
+  EXPECT_EQ(platform_.ServiceRestart("samba"), 0);
+  EXPECT_EQ(ReadAll(root_.path() + "/asked"), "smbcontrol smbd reload-config\nreload smbd.service\n");
 }
 
 TEST_F(ServicesTest, ExecRunsWithoutAShell) {
@@ -133,12 +151,21 @@ TEST_F(ServicesTest, SpotlightIsASambaIncludeFile) {
   EXPECT_EQ(platform_.SMBIsEnableSpotlight(), 0);
   ASSERT_EQ(platform_.SMBSetSpotlight(true), 0);
   const std::string include = root_.path() + "/etc/samba/corvlumex-spotlight.conf";
-  EXPECT_NE(ReadAll(include).find("[global]\n\tspotlight = yes\n"), std::string::npos);
+  EXPECT_NE(ReadAll(include).find("[global]\n\tspotlight backend = elasticsearch\n"), std::string::npos);
   EXPECT_EQ(platform_.SMBIsEnableSpotlight(), 1);
+  // The indexed shares, with their index names; a change is reported once.
+  EXPECT_EQ(platform_.SMBSetSpotlightShares({"photo", "music", "a]b"}), 1);
+  EXPECT_EQ(platform_.SMBSetSpotlightShares({"music", "photo"}), 0);
+  EXPECT_NE(ReadAll(include).find("[photo]\n\tspotlight = yes\n\tspotlight backend = elasticsearch\n"
+                                  "\telasticsearch:index = fileindex_photo\n"),
+            std::string::npos);
+  EXPECT_EQ(ReadAll(include).find("a]b"), std::string::npos);
+  // Off keeps the shares, with Spotlight off there too.
   ASSERT_EQ(platform_.SMBSetSpotlight(false), 0);
   EXPECT_EQ(platform_.SMBIsEnableSpotlight(), 0);
-  root_.WriteFile("etc/samba/corvlumex-spotlight.conf", "[global]\n  Spotlight =  Yes\n");
-  EXPECT_EQ(platform_.SMBIsEnableSpotlight(), 1);
+  EXPECT_NE(ReadAll(include).find("[music]\n\tspotlight = no\n"), std::string::npos);
+  ASSERT_EQ(platform_.SMBSetSpotlight(true), 0);
+  EXPECT_NE(ReadAll(include).find("[music]\n\tspotlight = yes\n"), std::string::npos);
 }
 
 class MonitorQueueTest : public ServicesTest {

@@ -148,6 +148,24 @@ TEST_F(QueueMgrTest, ReindexCoversThePathAndWhatIsBelowIt) {
   EXPECT_TRUE(mgr.IsFullPathHasReindex("/v/s/dir/f"));
 }
 
+// A crash marker in either file means the share's events were lost and it
+// is (or will be) checked against the disk; other events do not.
+TEST_F(QueueMgrTest, LostEventsAreACrashMarkerInTheLiveOrTheTakenOverQueue) {
+  QueueMgr mgr(queue_);
+  EXPECT_FALSE(mgr.HasLostEvents());
+  Write(queue_, Line(kEventCreate, "/v/s/a") + Line(kEventReindex, "/v/s", "", true));
+  EXPECT_FALSE(mgr.HasLostEvents());
+  Append(queue_, Line(kEventQueueCrash, "/v/s", "", true));
+  EXPECT_TRUE(mgr.HasLostEvents());
+  mgr.PrepareTmpQueue();
+  Write(queue_, Line(kEventDelete, "/v/s/a"));
+  EXPECT_TRUE(mgr.HasLostEvents()) << "the taken-over queue still holds it";
+  mgr.DeleteTmp();
+  EXPECT_FALSE(mgr.HasLostEvents());
+  Write(queue_, Line(kEventQueueCrash | kEventCreate, "/v/s/b"));
+  EXPECT_TRUE(mgr.HasLostEvents());
+}
+
 TEST_F(QueueMgrTest, AMalformedLineFailsTheScan) {
   QueueMgr mgr(queue_);
   Write(queue_, Line(kEventCreate, "/v/s/a") + "\n" + Line(kEventCreate, "/v/s/dir/f"));

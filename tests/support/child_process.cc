@@ -42,7 +42,7 @@ bool PollUntil(const std::function<bool()>& condition, std::chrono::milliseconds
 }
 
 ChildProcess::ChildProcess(const std::string& program, const std::vector<std::string>& args,
-                           const std::string& log_path, const std::map<std::string, std::string>& env)
+                           const std::string& log_path, const std::map<std::string, std::string>& env, int stdin_fd)
     : log_path_(log_path) {
   std::vector<std::string> words{program};
   words.insert(words.end(), args.begin(), args.end());
@@ -54,6 +54,7 @@ ChildProcess::ChildProcess(const std::string& program, const std::vector<std::st
   const int log = open(log_path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
   dup2(log, STDOUT_FILENO);
   dup2(log, STDERR_FILENO);
+  if (stdin_fd >= 0) dup2(stdin_fd, STDIN_FILENO);
   std::vector<char*> argv;
   for (std::string& word : words) argv.push_back(&word[0]);
   argv.push_back(nullptr);
@@ -62,6 +63,10 @@ ChildProcess::ChildProcess(const std::string& program, const std::vector<std::st
 }
 
 ChildProcess::~ChildProcess() { Stop(SIGKILL); }
+
+void ChildProcess::Signal(int signal) {
+  if (pid_ > 0) kill(pid_, signal);
+}
 
 int ChildProcess::Stop(int signal) {
   if (pid_ <= 0) return -1;
@@ -74,7 +79,7 @@ int ChildProcess::Wait() {
   int status = 0;
   waitpid(pid_, &status, 0);
   pid_ = -1;
-  return StatusOf(status);
+  return exit_status_ = StatusOf(status);
 }
 
 bool ChildProcess::Running() {
@@ -82,6 +87,7 @@ bool ChildProcess::Running() {
   int status = 0;
   if (waitpid(pid_, &status, WNOHANG) != pid_) return true;
   pid_ = -1;
+  exit_status_ = StatusOf(status);
   return false;
 }
 

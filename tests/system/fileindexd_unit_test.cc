@@ -1,22 +1,33 @@
 // The parts of fileindexd on their own: the settle tracker, the indexing
 // rules, the folder walk, the command answers and the progress board.
 #include <gtest/gtest.h>
+#include <grp.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <filesystem>
 #include <fstream>
+#include <functional>
+#include <memory>
+#include <stdexcept>
+#include <thread>
 
 #include "common/error.h"
 #include "common/file_util.h"
 #include "common/json_util.h"
 #include "fileindex/folder_mgr.h"
+#include "programs/fileindexd/batch_mark.h"
 #include "programs/fileindexd/command_server.h"
 #include "programs/fileindexd/folder_walker.h"
 #include "programs/fileindexd/index_rules.h"
 #include "programs/fileindexd/progress.h"
 #include "programs/fileindexd/settle_tracker.h"
+#include "fileindex/frame_reader.h"
+#include "tests/support/child_process.h"
+#include "tests/support/frame_client.h"
+#include "programs/fileindexd/suggestion_schedule.h"
 #include "tests/support/log_capture.h"
 
 namespace corvlumex {
@@ -167,6 +178,120 @@ TEST(FolderWalkerTest, ListsTheTreeWithoutEnteringLinksOrExcludedFolders) {
   ASSERT_EQ(WalkFolder(top + "/a/b/f.txt").size(), 1u);  // a file is its own walk
 }
 
+// The command socket served for real on a private socket, with limits a
+// loaded test machine cannot reach by accident.
+class CommandSocketTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    CommandLimits limits;
+    limits.request_timeout_ms = 60000;
+    limits.max_connections = 8;
+    server_ = std::make_unique<CommandServer>(
+        socket_, [](const std::string& type, const Json::Value&) {
+          if (type == "boom") throw std::logic_error("not a library error");
+          if (type != "status") throw Error(kErrorBadArgument, "Unknown command: " + type);
+          return Json::Value(Json::objectValue);
+        },
+        [](const std::string&) { return true; }, limits);
+    server_->Listen();
+    thread_ = std::thread([this] { server_->Run(); });
+  }
+  void TearDown() override {
+    server_->Stop();
+    thread_.join();
+  }
+  // The answer's error code; 0 for success, -1 for no answer.
+  int CodeOf(const std::string& bytes) {
+    Json::Value answer;
+    if (!JsonFromString(answer, testing_support::SendRaw(socket_, bytes))) return -1;
+    return answer["success"].asBool() ? 0 : answer["error"]["code"].asInt();
+  }
+
+  SandboxRoot root_;
+  std::string socket_ = root_.path() + "/fileindexd.sock";
+  std::unique_ptr<CommandServer> server_;
+  std::thread thread_;
+};
+
+TEST_F(CommandSocketTest, HostileFramesAreAnsweredAndNoClientHoldsUpAnother) {
+  using testing_support::Frame;
+  const std::string status = Frame(R"({"type": "status"})");
+  const uint32_t huge = 0xFFFFFFF0u;
+  const struct {
+    const char* what;
+    std::string bytes;
+    int code;
+  } cases[] = {
+      {"arrays nested past the JSON reader's limit", Frame(std::string(1001, '[') + std::string(1001, ']')), 120},
+      {"a length of 4 GiB", std::string(reinterpret_cast<const char*>(&huge), 4), 120},
+      {"an empty frame", std::string(4, '\0'), 120},
+      {"a type that is an array", Frame(R"({"type": ["status"]})"), 120},
+      {"not UTF-8", Frame("{\"type\": \"\xff\xfe\"}"), 120},
+      {"a handler that throws something else than an Error", Frame(R"({"type": "boom"})"), 9999},
+      // More than a socket buffer holds: it never arrives whole before it is read.
+      {"a request of 600 KB", Frame(R"({"type": "status", "data": ")" + std::string(600000, 'x') + R"("})"), 0},
+      {"a frame cut short", status.substr(0, 7), -1},
+  };
+  for (const auto& c : cases) {
+    EXPECT_EQ(CodeOf(c.bytes), c.code) << c.what;
+    EXPECT_EQ(CodeOf(status), 0) << "after " << c.what;
+  }
+  // Clients that send nothing or half a request hold only their own connection:
+  // the others are answered meanwhile, and so are they once they finish.
+  std::vector<int> slow;
+  for (int i = 0; i < 4; ++i) {
+    slow.push_back(testing_support::ConnectTo(socket_));
+    ASSERT_GE(slow.back(), 0);
+  }
+  ASSERT_EQ(write(slow[0], status.data(), 6), 6);
+  EXPECT_EQ(CodeOf(status), 0);
+  ASSERT_EQ(write(slow[0], status.data() + 6, status.size() - 6), static_cast<ssize_t>(status.size() - 6));
+  std::string answer;
+  EXPECT_EQ(fileindex::ReadFrameBounded(slow[0], 1u << 20, 20000, 20000, &answer), fileindex::FrameStatus::kOk);
+  EXPECT_NE(answer.find("\"success\":true"), std::string::npos) << answer;
+  for (const int fd : slow) close(fd);
+}
+
+TEST_F(CommandSocketTest, AnotherUserCannotTakeEveryConnection) {
+  if (geteuid() != 0) GTEST_SKIP() << "needs root to connect as another user";
+  chmod(root_.path().c_str(), 0755);
+  const std::string status = testing_support::Frame(R"({"type": "status"})");
+  int told[2], done[2];
+  ASSERT_EQ(0, pipe(told));
+  ASSERT_EQ(0, pipe(done));
+  const pid_t child = fork();
+  if (child == 0) {
+    // As nobody: its own share of connections held open, and one more.
+    close(told[0]);
+    close(done[1]);
+    if (setgroups(0, nullptr) != 0 || setgid(65534) != 0 || setuid(65534) != 0) _exit(3);
+    std::vector<int> held;
+    for (int i = 0; i < 8; ++i) held.push_back(testing_support::ConnectTo(socket_));
+    std::string refused;
+    try {
+      refused = testing_support::SendRaw(socket_, status);
+    } catch (const std::exception& error) {
+      refused = error.what();
+    }
+    if (write(told[1], refused.data(), refused.size()) < 0) _exit(4);
+    close(told[1]);
+    char byte;
+    if (read(done[0], &byte, 1) < 0) _exit(5);
+    _exit(0);
+  }
+  close(told[1]);
+  close(done[0]);
+  std::string refused;
+  char buffer[4096];
+  for (ssize_t n; (n = read(told[0], buffer, sizeof(buffer))) > 0;) refused.append(buffer, static_cast<size_t>(n));
+  EXPECT_NE(refused.find("try again later"), std::string::npos) << refused;
+  // Root is served meanwhile.
+  EXPECT_EQ(CodeOf(status), 0);
+  close(done[1]);
+  close(told[0]);
+  waitpid(child, nullptr, 0);
+}
+
 TEST(CommandServerTest, AnswersCarryTheCodeAndRefuseChangesFromOtherUsers) {
   std::vector<std::string> seen;
   CommandServer server(
@@ -200,12 +325,54 @@ TEST(CommandServerTest, AnswersCarryTheCodeAndRefuseChangesFromOtherUsers) {
   EXPECT_EQ(std::count(seen.begin(), seen.end(), "resume"), 0);
 }
 
+// How far a batch got is trusted only for the very file it was saved for.
+TEST(BatchMarkTest, ACountHoldsForItsOwnBatchFileOnly) {
+  SandboxRoot root;
+  const std::string batch = root.WriteFile("queue.tmp", "line 1\nline 2\n");
+  const BatchMark mark(batch);
+  EXPECT_EQ(mark.Load(), 0u);  // none saved
+  ASSERT_TRUE(mark.Save(5));
+  EXPECT_EQ(mark.Load(), 5u);
+  const struct {
+    const char* name;
+    std::function<void()> change;
+  } cases[] = {
+      {"grown", [&] { std::ofstream(batch, std::ios::app) << "line 3\n"; }},
+      {"replaced", [&] { root.WriteFile("queue.tmp", "another batch\n"); }},
+      {"gone", [&] { unlink(batch.c_str()); }},
+  };
+  for (const auto& c : cases) {
+    root.WriteFile("queue.tmp", "line 1\nline 2\n");
+    ASSERT_TRUE(mark.Save(5));
+    c.change();
+    EXPECT_EQ(mark.Load(), 0u) << c.name;
+  }
+  root.WriteFile("queue.tmp", "line 1\nline 2\n");
+  ASSERT_TRUE(mark.Save(2));
+  mark.Clear();
+  EXPECT_EQ(mark.Load(), 0u);
+  EXPECT_FALSE(IsFileExist(batch + ".applied"));
+// The administrators' list of files that could not be indexed keeps the
+// latest ones only, so a share full of broken files cannot grow the daemon.
+TEST(ProgressBoardTest, KeepsTheLatestFailedFilesWithTheirReasons) {
+  ProgressBoard board;
+  for (size_t i = 0; i < ProgressBoard::kKeptFailures + 5; ++i) {
+    board.Failed("music", "/volume1/music/" + std::to_string(i) + ".mp3", "upsert: damaged");
+  }
+  const Json::Value snapshot = board.Snapshot()["music"];
+  EXPECT_EQ(snapshot["total_failed"].asUInt64(), ProgressBoard::kKeptFailures + 5);
+  ASSERT_EQ(snapshot["failed_files"].size(), ProgressBoard::kKeptFailures);
+  EXPECT_EQ(snapshot["failed_files"][0]["path"].asString(), "/volume1/music/5.mp3");
+  EXPECT_EQ(snapshot["failed_files"][static_cast<int>(ProgressBoard::kKeptFailures) - 1]["reason"].asString(), "upsert: damaged");
+}
+
 TEST(ProgressBoardTest, CountsPerShareAndResetsAtTheEndOfABatch) {
   ProgressBoard board;
   board.StartBatch("music", 10);
   board.Done("music", 4);
   board.AddTodo("music", 5);
-  board.Failed("music");
+  board.Failed("music", "/v/music/a.mp3");
+  board.Failed("music", "/v/music/a.mp3");  // a retry of the same file
   board.Extracted("music");
   Json::Value snapshot = board.Snapshot();
   EXPECT_EQ(snapshot["music"]["state"].asString(), "indexing");
@@ -222,6 +389,30 @@ TEST(ProgressBoardTest, CountsPerShareAndResetsAtTheEndOfABatch) {
   EXPECT_EQ(snapshot["music"]["eta_seconds"].asDouble(), -1.0);
   board.Remove("music");
   EXPECT_FALSE(board.Snapshot().isMember("music"));
+}
+
+
+TEST(SuggestionScheduleTest, AtMostOncePerIntervalWhileWorkingAndOnceAtRest) {
+  using Clock = SuggestionSchedule::Clock;
+  using std::chrono::minutes;
+  SuggestionSchedule schedule(minutes(5));
+  const Clock::time_point t0 = Clock::now();
+  EXPECT_FALSE(schedule.DueAtRest());  // nothing indexed yet
+  // A long round: commits every minute; a rebuild after 5 minutes, not before.
+  const struct {
+    int minute;
+    bool due;
+  } commits[] = {{0, false}, {1, false}, {4, false}, {5, true}, {6, false}, {9, false}, {10, true}};
+  for (const auto& commit : commits) {
+    const bool due = schedule.DueAfterWork(t0 + minutes(commit.minute));
+    EXPECT_EQ(due, commit.due) << "minute " << commit.minute;
+    if (due) schedule.Rebuilt(t0 + minutes(commit.minute));
+  }
+  EXPECT_FALSE(schedule.DueAtRest());  // the last commit's rebuild covers it
+  EXPECT_FALSE(schedule.DueAfterWork(t0 + minutes(11)));
+  EXPECT_TRUE(schedule.DueAtRest());  // the end of the round brings the last files in
+  schedule.Rebuilt(t0 + minutes(11));
+  EXPECT_FALSE(schedule.DueAtRest());  // and only once
 }
 
 }  // namespace

@@ -2,15 +2,19 @@
 // search daemon; extraction is a stand-in platform answer.
 #include <gtest/gtest.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <filesystem>
+#include <fstream>
+#include <functional>
 #include <memory>
 
 #include "common/error.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/optree.h"
 #include "platform/linux/linux_platform.h"
+#include "programs/fileindexd/fresh_lane.h"
 #include "programs/fileindexd/index_rules.h"
 #include "programs/fileindexd/op_applier.h"
 #include "programs/fileindexd/progress.h"
@@ -101,6 +105,119 @@ TEST_F(OpApplierTest, ARenameWithoutAnOldDocumentIsReadFromDisk) {
   applier_->Rename(Docs("old.c"), Docs("new.c"));
   EXPECT_EQ(Sent(), (Lines{"document_set_by_id " + Docs("old.c"), "document_del_by_id " + Docs("old.c"),
                                   "document_del_by_query " + Docs("old.c") + "/", "document_upsert_by_id " + Docs("new.c")}));
+}
+
+// After a crash a rename is applied again over what its first run already
+// moved, or its target has moved on: whatever the index still holds under an
+// old name that is gone from disk is removed, whether the move found a document.
+TEST_F(OpApplierTest, ARenameWhoseSourceIsGoneRemovesWhatIsLeftUnderIt) {
+  root_.WriteFile("volume1/share/docs/C.c", "x");
+  Json::Value below(Json::arrayValue);
+  below.append(Json::Value(Json::objectValue));
+  below[0]["CORVMDPath"] = Docs("B/f.c");
+  below[0]["CORVMDFSName"] = "f.c";
+  below[0]["CORVMDParent"] = Docs("B");
+  const std::string set = "document_set_by_id " + Docs("B");
+  const std::string listed = "document_get_by_query " + Docs("B") + "/";
+  const std::string compound = " ";  // carries no command of its own
+  const std::string del = "document_del_by_id " + Docs("B");
+  const std::string del_below = "document_del_by_query " + Docs("B") + "/";
+  struct Case {
+    const char* name;
+    const char* to;
+    bool old_document;  // B's own document is still there to move
+    Lines expected;
+  };
+  const std::vector<Case> cases = {
+      {"target gone, no old document", "gone", false, Lines{set, del, del_below}},
+      {"target gone, old document moved", "gone", true, Lines{set, listed, compound, del, del_below}},
+      {"target there, old document moved", "C.c", true, Lines{set, listed, compound, del, del_below}},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    const size_t before = daemon_.Requests().size();
+    if (c.old_document) {
+      daemon_.Enqueue(FakeAnswer::Success(Json::Value(Json::objectValue)));
+      daemon_.Enqueue(FakeAnswer::Success(below));
+    } else {
+      daemon_.Enqueue(FakeAnswer::Failure(2020, "No document with the id"));
+    }
+    applier_->Rename(Docs("B"), Docs(c.to));
+    const Lines sent = Sent();
+    EXPECT_EQ(Lines(sent.begin() + before, sent.end()), c.expected);
+  }
+}
+
+// A file with three names, changed through one: the others the index holds
+// get the new document (attributes only for an attribute change); a name
+// that is no longer this file is left to its own events.
+TEST_F(OpApplierTest, AChangeThroughOneHardLinkReachesItsOtherNames) {
+  root_.WriteFile("volume1/share/docs/a.c", "x");
+  root_.WriteFile("volume1/share/docs/other.c", "another file");
+  ASSERT_EQ(link(Docs("a.c").c_str(), Docs("b.c").c_str()), 0);
+  ASSERT_EQ(link(Docs("a.c").c_str(), Docs("c.c").c_str()), 0);
+  Json::Value names(Json::arrayValue);
+  for (const char* name : {"a.c", "b.c", "c.c", "other.c"}) {
+    Json::Value doc(Json::objectValue);
+    doc["CORVMDPath"] = Docs(name);
+    names.append(doc);
+  }
+  struct Case {
+    const char* name;
+    std::function<void()> apply;
+    std::string command;
+  };
+  const std::vector<Case> cases = {
+      {"upsert", [&] { applier_->Upsert(Docs("a.c")); }, "document_upsert_by_id "},
+      {"attributes", [&] { applier_->Attr(Docs("a.c")); }, "document_set_by_id "},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    const size_t before = daemon_.Requests().size();
+    daemon_.Enqueue(FakeAnswer::Success(Json::Value(Json::objectValue)));
+    daemon_.Enqueue(FakeAnswer::Success(names));
+    c.apply();
+    const Lines sent = Sent();
+    EXPECT_EQ(Lines(sent.begin() + before, sent.end()),
+              (Lines{c.command + Docs("a.c"), "document_get_by_query ", c.command + Docs("b.c"), c.command + Docs("c.c")}));
+  }
+  // The query asks for the file's identity, which every stored document carries.
+  const Json::Value query = daemon_.Requests()[1]["data"]["query"]["qsl"]["term"]["CORVMDFSFileID"];
+  EXPECT_TRUE(query.isString() && !query.asString().empty()) << daemon_.Requests()[1];
+  EXPECT_EQ(daemon_.Requests()[0]["data"]["data"]["CORVMDFSFileID"], query);
+}
+
+// The fresh lane reads what the notifier appended to the live queue: the
+// files of a folder with few new lines are stored (or their documents
+// deleted) and committed; bulk folders, renames and folders wait for the
+// in-order pass; a file is refreshed again only when it changed.
+TEST_F(OpApplierTest, TheFreshLaneStoresTheFilesOfSmallGroupsOnly) {
+  const std::string queue = root_.path() + "/fileindex.queue";
+  const auto line = [](int event, const std::string& path, bool is_dir = false) {
+    return R"({"event": )" + std::to_string(event) + R"(, "is_dir": )" + (is_dir ? "true" : "false") +
+           R"(, "path": ")" + path + "\"}\n";
+  };
+  root_.WriteFile("volume1/share/docs/new.c", "fresh");
+  root_.MakeDir("volume1/share/docs/bulk");
+  std::string lines = line(0x40, Docs("new.c")) + line(0x80, Docs("gone.c")) + line(0x40, Docs("bulk"), true) +
+                      R"({"event": 256, "path": ")" + Docs("moved.c") + R"(", "path_old": ")" + Docs("was.c") + "\"}\n";
+  for (int i = 0; i < 9; ++i) {
+    root_.WriteFile("volume1/share/docs/bulk/f" + std::to_string(i) + ".c", "bulk");
+    lines += line(0x40, Docs("bulk/f" + std::to_string(i) + ".c"));
+  }
+  root_.WriteFile("fileindex.queue", lines + R"({"event": 2, "path": ")" + Docs("new"));
+  FreshLane lane("share", queue, *applier_, FreshLaneOptions());
+  EXPECT_EQ(lane.Look(), 2u);
+  EXPECT_EQ(Sent(), (Lines{"document_upsert_by_id " + Docs("new.c"), "document_del_by_id " + Docs("gone.c"), "commit "}));
+
+  // The half line, completed, names the same unchanged file: nothing to do.
+  std::ofstream(queue, std::ios::app) << ".c\"}\n" << line(0x2, Docs("new.c"));
+  EXPECT_EQ(lane.Look(), 0u);
+  // Changed since: stored again.
+  root_.WriteFile("volume1/share/docs/new.c", "fresher and longer");
+  std::ofstream(queue, std::ios::app) << line(0x2, Docs("new.c"));
+  EXPECT_EQ(lane.Look(), 1u);
+  EXPECT_EQ(daemon_.Requests().size(), 5u);
 }
 
 TEST_F(OpApplierTest, ARenameIntoAHiddenFolderRemovesTheDocuments) {

@@ -52,6 +52,25 @@ class SystemChangesTest : public ::testing::Test {
   SystemSandbox box_;
 };
 
+// A file with three names: a change through one of them reaches the others,
+// which no event names.
+TEST_F(SystemChangesTest, AChangeThroughOneHardLinkReachesEveryName) {
+  const std::string a = box_.Path("docs/linked.txt"), b = box_.Path("docs/reports/second.txt"),
+                    c = box_.Path("docs/reports/2026/third.txt");
+  WriteText(a, "pelican");
+  ASSERT_EQ(link(a.c_str(), b.c_str()), 0);
+  ASSERT_EQ(link(a.c_str(), c.c_str()), 0);
+  ASSERT_EQ(box_.Converge(Docs()), "");
+  EXPECT_TRUE(Finds("pelican", {a, b, c}));
+
+  WriteText(b, "cormorant");  // truncates and rewrites the one file
+  EXPECT_TRUE(Finds("cormorant", {a, b, c}));
+  EXPECT_TRUE(Finds("pelican", {}));
+  ASSERT_EQ(chmod(c.c_str(), 0600), 0);
+  EXPECT_TRUE(PollUntil([&] { return box_.SearchTerm("CORVMDPrivilege", "-rw-------") == std::set<std::string>{a, b, c}; }, std::chrono::seconds(30)))
+      << box_.Logs();
+}
+
 TEST_F(SystemChangesTest, CreateModifyAttributeAndDeleteOfFiles) {
   WriteText(box_.Path("docs/new.txt"), "quince marmalade");
   ASSERT_EQ(box_.Converge(Docs()), "");

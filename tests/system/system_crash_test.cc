@@ -7,12 +7,17 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <filesystem>
+#include <algorithm>
 #include <cstdlib>
+#include <filesystem>
+#include <thread>
 
+#include "common/file_util.h"
 #include "common/json_util.h"
+#include "fileindex/elastic/elastic_control.h"
 #include "fileindex/communication.h"
 #include "fileindex/status_mgr.h"
+#include "tests/system/cli_runner.h"
 #include "tests/system/system_harness.h"
 
 namespace corvlumex {
@@ -61,6 +66,127 @@ TEST(SystemCrashTest, KillDuringALargeBatchThenRestartConverges) {
   ASSERT_EQ(box.Converge(box.DiskPaths("bulk"), std::chrono::seconds(120)), "");
 }
 
+// Moves the documents at `from` to `to` the way a rename does, one request
+// per document, as far as `count` of the folder's files (the folder's own
+// first): the state a killed indexer leaves in the middle of a rename.
+void MoveDocuments(const std::string& from, const std::string& to, int count) {
+  for (int i = -1; i < count; ++i) {
+    const std::string name = i < 0 ? "" : "/f" + std::to_string(i) + ".txt";
+    Json::Value req(Json::objectValue);
+    req["command"] = "document_set_by_id";
+    req["data"]["id"] = fileindex::elastic::GetFileIndexID("share");
+    req["data"]["doc_id"] = from + name;
+    req["data"]["data"]["CORVMDPath"] = to + name;
+    req["data"]["data"]["CORVMDParent"] = i < 0 ? Dirname(to) : to;
+    fileindex::elastic::SendRequestNoResult(req);
+  }
+  Json::Value commit(Json::objectValue);
+  commit["command"] = "commit";
+  commit["data"]["id"] = fileindex::elastic::GetFileIndexID("share");
+  fileindex::elastic::SendRequestNoResult(commit);
+}
+
+// The indexer dies while it moves the documents of a large folder, and the
+// folder moves on again before it is back: the taken-over queue holds the
+// first rename, the live one the second. Nothing may stay under a name the
+// disk no longer has.
+TEST(SystemCrashTest, AFolderRenameCutShortByACrashLeavesNoGhosts) {
+  SystemSandbox box;
+  constexpr int kFiles = 400;
+  fs::create_directories(box.Path("big/A"));
+  for (int i = 0; i < kFiles; ++i) WriteText(box.Path("big/A/f" + std::to_string(i) + ".txt"), "moved " + std::to_string(i));
+  box.StartAll();
+  box.AddFolder("big");
+  ASSERT_EQ(box.Converge(box.DiskPaths("big"), std::chrono::seconds(60)), "");
+
+  box.StopIndexer(SIGKILL);
+  const std::string queue = box.Path("@eaDir/fileindex.queue");
+  ASSERT_EQ(rename(box.Path("big/A").c_str(), box.Path("big/B").c_str()), 0);
+  ASSERT_TRUE(PollUntil([&] { return ReadFileText(queue).find("/big/B") != std::string::npos; }, std::chrono::seconds(10)));
+  // What the dead indexer had done: taken the queue over, moved half.
+  ASSERT_EQ(rename(queue.c_str(), (queue + ".tmp").c_str()), 0);
+  MoveDocuments(box.Path("big/A"), box.Path("big/B"), kFiles / 2);
+  ASSERT_EQ(rename(box.Path("big/B").c_str(), box.Path("big/C").c_str()), 0);
+  ASSERT_TRUE(PollUntil([&] { return ReadFileText(queue).find("/big/C") != std::string::npos; }, std::chrono::seconds(10)));
+  box.StartIndexer();
+  ASSERT_EQ(box.Converge(box.DiskPaths("big"), std::chrono::seconds(60)), "");
+}
+
+// Files written into `relative` while indexing is paused, so that they make
+// one batch when it resumes; returns once the batch is under way.
+void StartABulkBatch(SystemSandbox& box, const std::string& relative, int files) {
+  fileindex::StatusMgr().Pause(0);
+  for (int i = 0; i < files; ++i) WriteText(box.Path(relative + "/f" + std::to_string(i) + ".txt"), "bulk " + std::to_string(i));
+  const std::string last = "f" + std::to_string(files - 1) + ".txt";
+  ASSERT_TRUE(PollUntil([&] { return ReadFileText(box.Path("@eaDir/fileindex.queue")).find(last) != std::string::npos; },
+                        std::chrono::seconds(30)));
+  fileindex::StatusMgr().Resume();
+  ASSERT_TRUE(MidBatch(box)) << box.Logs();
+}
+
+size_t CountBelow(const std::set<std::string>& paths, const std::string& folder) {
+  return std::count_if(paths.begin(), paths.end(), [&](const std::string& path) { return path.rfind(folder + "/", 0) == 0; });
+}
+
+uint64_t TotalExtracted(SystemSandbox& box) {
+  Json::Value status;
+  JsonFromString(status, box.IndexerStatus());
+  return status["shares"]["share"]["total_extracted"].asUInt64();
+}
+
+// Starts the daemons with the folder /share/<folder> (and `extra`, below it)
+// created, added and indexed.
+void StartWithFolder(SystemSandbox& box, const std::string& folder, const std::string& extra = "") {
+  fs::create_directories(box.Path(folder));
+  if (!extra.empty()) fs::create_directories(box.Path(folder + "/" + extra));
+  box.StartAll();
+  box.AddFolder(folder);
+  ASSERT_EQ(box.Converge(box.DiskPaths(folder)), "");
+}
+
+TEST(SystemCrashTest, AFileWrittenDuringABulkBatchIsSearchableBeforeTheBatchEnds) {
+  SystemSandbox box;
+  StartWithFolder(box, "top", "bulk");
+  fs::create_directories(box.Path("top/inbox"));
+
+  constexpr int kBulk = 3000;
+  StartABulkBatch(box, "top/bulk", kBulk);
+  WriteText(box.Path("top/inbox/fresh.txt"), "a zebrafinch arrived");
+  ASSERT_TRUE(PollUntil([&] { return box.Search("zebrafinch").size() == 1; }, std::chrono::seconds(120))) << box.Logs();
+  // It did not wait for the bulk batch to end.
+  EXPECT_LT(CountBelow(box.IndexedPaths(), box.Path("top/bulk")), static_cast<size_t>(kBulk));
+  ASSERT_EQ(box.Converge(box.DiskPaths("top"), std::chrono::seconds(120)), "");
+}
+
+// The search daemon dies in the middle of a large batch: what was committed
+// before is not done again, and the indexer follows the restarted daemon at
+// once instead of after its grown back-off.
+TEST(SystemCrashTest, ASearchDaemonRestartCostsOnlyTheUncommittedSlice) {
+  SystemSandbox box;
+  StartWithFolder(box, "bulk");
+  constexpr int kBulk = 3000;
+  StartABulkBatch(box, "bulk", kBulk);
+  ASSERT_TRUE(PollUntil([&] { return TotalExtracted(box) >= kBulk / 2; }, std::chrono::seconds(120))) << box.Logs();
+  box.StopSearchDaemon(SIGKILL);
+  const uint64_t extracted_at_kill = TotalExtracted(box);
+  box.StartSearchDaemon();
+  ASSERT_EQ(box.Converge(box.DiskPaths("bulk"), std::chrono::seconds(120)), "");
+  // Whole batch again would be kBulk + extracted_at_kill.
+  EXPECT_LT(TotalExtracted(box), kBulk + extracted_at_kill / 2) << extracted_at_kill;
+}
+
+TEST(SystemCrashTest, TheIndexerFollowsARestartedSearchDaemonWithinItsBackOff) {
+  SystemSandbox box;
+  StartWithFolder(box, "docs");
+  box.StopSearchDaemon(SIGKILL);
+  WriteText(box.Path("docs/late.txt"), "written while searching was down");
+  // The indexer's attempts fail and its back-off grows: 1, 2, 4, 8, then 16 s.
+  std::this_thread::sleep_for(std::chrono::seconds(17));
+  box.StartSearchDaemon();
+  // The next attempt of the back-off alone would come some 14 s from here.
+  ASSERT_EQ(box.Converge(box.DiskPaths("docs"), std::chrono::seconds(10)), "") << box.Logs();
+}
+
 TEST(SystemCrashTest, LostNotificationsLeadToAFullReindexThatConverges) {
   const long limit = std::atol(ReadFileText("/proc/sys/fs/inotify/max_queued_events").c_str());
   if (limit <= 0 || limit > 1000000) GTEST_SKIP() << "kernel queue limit unusable: " << limit;
@@ -88,6 +214,62 @@ TEST(SystemCrashTest, LostNotificationsLeadToAFullReindexThatConverges) {
   EXPECT_EQ(box.Search("nobody listened").size(), 1u);
   // It was the queue's crash marker, not the events, that brought the index back.
   EXPECT_NE(box.indexer().Log().find("Queue crashed"), std::string::npos) << box.Logs();
+}
+
+bool StatusSays(const std::string& text) { return RunCli({"status"}).out.find(text) != std::string::npos; }
+
+// Files the indexer extracted and stored since it started.
+uint64_t Extracted(SystemSandbox& box) {
+  Json::Value status;
+  if (!JsonFromString(status, box.IndexerStatus())) return 0;
+  return status["shares"]["share"]["total_extracted"].asUInt64();
+}
+
+// While the notifier is down nobody sees a change: status says so, and its
+// next start has each share checked against the disk, which brings back
+// everything made, changed and deleted meanwhile.
+TEST(SystemCrashTest, ChangesWhileTheNotifierIsDownAreFoundWhenItStartsAgain) {
+  SystemSandbox box;
+  fs::create_directories(box.Path("docs/keep"));
+  WriteText(box.Path("docs/keep/old.txt"), "an old file");
+  fs::create_directories(box.Path("docs/stable"));
+  for (int i = 0; i < 30; ++i) WriteText(box.Path("docs/stable/s" + std::to_string(i) + ".txt"), "unchanged");
+  box.StartAll();
+  box.AddFolder("docs");
+  ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
+  const std::string missed = "against the disk: changes may have been missed";
+  EXPECT_TRUE(StatusSays("corvnotifyd: running\n")) << RunCli({"status"}).out;
+
+  int round = 0;
+  for (const int stop_signal : {SIGKILL, SIGTERM}) {
+    const std::string tag = std::to_string(++round);
+    const uint64_t extracted_before = Extracted(box);
+    box.StopNotifier(stop_signal);
+    EXPECT_TRUE(StatusSays("corvnotifyd: NOT RUNNING (start it with systemctl start corvnotifyd): changes on disk "
+                           "are not seen now"))
+        << RunCli({"status"}).out;
+    fs::create_directories(box.Path("docs/new" + tag));
+    for (int i = 0; i < 20; ++i) {
+      WriteText(box.Path("docs/new" + tag + "/f" + std::to_string(i) + ".txt"), "unseen" + tag + " marmalade");
+    }
+    fs::remove_all(box.Path(round == 1 ? "docs/keep" : "docs/new1"));
+    // Held back, so the pending check can be seen in status before it runs.
+    fileindex::StatusMgr().Pause(0);
+    box.StartNotifier();
+    EXPECT_TRUE(PollUntil([&] { return StatusSays("share: waiting to be checked " + missed); },
+                          std::chrono::seconds(30)))
+        << RunCli({"status"}).out << box.Logs();
+    fileindex::StatusMgr().Resume();
+    ASSERT_EQ(box.Converge(box.DiskPaths("docs"), std::chrono::seconds(60)), "") << box.Logs();
+    EXPECT_EQ(box.Search("unseen" + tag).size(), 20u);
+    EXPECT_TRUE(PollUntil([&] { return !StatusSays(missed); }, std::chrono::seconds(30)))
+        << RunCli({"status"}).out;
+    EXPECT_TRUE(StatusSays("corvnotifyd: running\n"));
+    // The check is cheap: the 20 new files and their folders are extracted,
+    // the 30 unchanged files are not extracted again.
+    EXPECT_GE(Extracted(box) - extracted_before, 20u);
+    EXPECT_LE(Extracted(box) - extracted_before, 25u);
+  }
 }
 
 // Fills the volume holding `path` with one file until it is full.

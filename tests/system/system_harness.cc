@@ -69,10 +69,27 @@ void SystemSandbox::InstallNoticeTool(const std::string& log_path) {
 
 void SystemSandbox::StartAll(const std::vector<std::string>& indexer_args,
                              const std::map<std::string, std::string>& notifier_env) {
+  StartSearchDaemon();
+  notifier_env_ = notifier_env;
+  StartNotifier();
+  StartIndexer(indexer_args);
+}
+
+void SystemSandbox::StartNotifier() { notifier_ = Launch("corvnotifyd", {"--foreground"}, notifier_env_); }
+
+void SystemSandbox::StopNotifier(int signal) {
+  notifier_->Stop(signal);
+  notifier_.reset();
+}
+
+void SystemSandbox::StartSearchDaemon() {
   search_daemon_ = Launch("corvelasticd", {"--log-stderr"});
   if (!WaitForSocket(root() + "/var/run/corvelasticd.sock")) throw Error(kErrorSystem, "corvelasticd did not start");
-  notifier_ = Launch("corvnotifyd", {"--foreground"}, notifier_env);
-  StartIndexer(indexer_args);
+}
+
+void SystemSandbox::StopSearchDaemon(int signal) {
+  search_daemon_->Stop(signal);
+  search_daemon_.reset();
 }
 
 void SystemSandbox::StartIndexer(const std::vector<std::string>& args) {

@@ -38,9 +38,16 @@ class SystemSandbox {
   void StartAll(const std::vector<std::string>& indexer_args = {},
                 const std::map<std::string, std::string>& notifier_env = {});
   void StartIndexer(const std::vector<std::string>& args = {});
+  // corvelasticd alone (after StopSearchDaemon), and its kill -9 (or another signal).
+  void StartSearchDaemon();
+  void StopSearchDaemon(int signal);
   // kill -9 (or another signal) of fileindexd.
   void StopIndexer(int signal);
   ChildProcess& indexer() { return *indexer_; }
+  // corvnotifyd started again (with the environment StartAll gave it), and
+  // stopped with a signal (SIGTERM, or SIGKILL).
+  void StartNotifier();
+  void StopNotifier(int signal);
   std::string Logs() const;
 
   // FolderAdd of /share/<relative> (relative may be empty: the whole share)
@@ -82,6 +89,7 @@ class SystemSandbox {
   std::unique_ptr<ChildProcess> notifier_;
   std::unique_ptr<ChildProcess> indexer_;
   std::vector<std::string> indexer_args_;
+  std::map<std::string, std::string> notifier_env_;
 };
 
 // Writes `content` to `path` (created or truncated).

@@ -63,6 +63,31 @@ TEST(SystemRecoveryTest, CommandLineFoldersSearchAndPausesOfTheIndexerAndOfAShar
   ASSERT_TRUE(JsonFromString(page, by_name.out)) << by_name.out;
   ASSERT_EQ(page["hits"].size(), 1u);
   EXPECT_EQ(page["hits"][0]["fields"]["CORVMDPath"].asString(), box.Path("docs/menu2.txt"));
+  // Words as separate arguments, options before or after them; a phrase keeps its order.
+  for (const std::vector<std::string>& args :
+       {std::vector<std::string>{"--json", "search", "--share", "share", "saffron", "paella"},
+        std::vector<std::string>{"--json", "search", "saffron", "paella", "--share", "share"},
+        std::vector<std::string>{"--json", "search", "\"saffron paella\""}}) {
+    CliResult words = RunCli(args);
+    ASSERT_TRUE(JsonFromString(page, words.out)) << words.out << words.err;
+    ASSERT_EQ(page["hits"].size(), 1u) << words.out;
+    EXPECT_EQ(page["hits"][0]["fields"]["CORVMDPath"].asString(), box.Path("docs/menu.txt"));
+  }
+  ASSERT_TRUE(JsonFromString(page, RunCli({"--json", "search", "\"paella saffron\""}).out));
+  EXPECT_EQ(page["total"].asInt(), 0);
+  CliResult unparsable = RunCli({"search", "(saffron"});
+  EXPECT_NE(unparsable.status, 0);
+  EXPECT_NE(unparsable.err.find("never closed"), std::string::npos) << unparsable.err;
+  // The indexer keeps the name suggestions current by itself.
+  ASSERT_TRUE(PollUntil([&] { return RunCli({"suggest", "men"}).out.find("menu") != std::string::npos; },
+                        std::chrono::seconds(30)));
+  // A file whose content cannot be read is still found by name, and listed with the reason.
+  WriteText(box.Path("docs/broken.pdf"), "%PDF-1.4 not really a PDF");
+  ASSERT_TRUE(PollUntil([&] { return box.Search("broken").size() == 1; }, std::chrono::seconds(30)));
+  CliResult failed = RunCli({"failed"});
+  EXPECT_EQ(failed.status, 0) << failed.err;
+  EXPECT_NE(failed.out.find(box.Path("docs/broken.pdf")), std::string::npos) << failed.out;
+  EXPECT_NE(failed.out.find("1 file(s)"), std::string::npos) << failed.out;
   CliResult other_share = RunCli({"search", "saffron", "--share", "nosuch"});
   EXPECT_NE(other_share.status, 0);
   EXPECT_NE(other_share.err.find("fileindex: error 2010"), std::string::npos) << other_share.err;

@@ -40,7 +40,7 @@ TEST(FileTypeTest, UnknownIsFour) {
 
 TEST(FileTypeTest, CategoriesAreDisjointSortedAndLowerCase) {
   std::set<std::string> seen;
-  for (const char* category : {"document", "audio", "video", "image"}) {
+  for (const char* category : {"document", "audio", "video", "photo"}) {
     FileType type = kFileTypeUnknown;
     ASSERT_TRUE(GetFileTypeByCategory(category, &type)) << category;
     EXPECT_STREQ(FileTypeName(type), category);

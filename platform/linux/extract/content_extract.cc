@@ -10,6 +10,7 @@
 
 #include "common/error.h"
 #include "common/json_util.h"
+#include "platform/linux/extract/document_fields.h"
 #include "platform/linux/extract/file_fields.h"
 #include "platform/linux/extract/worker_client.h"
 #include "platform/linux/linux_platform.h"
@@ -40,6 +41,11 @@ class OpenFile {
   int fd_;
 };
 
+void MarkFailed(const std::string& reason, Json::Value& fields) {
+  fields[extract::kFieldExtractionFailed] = true;
+  fields[extract::kFieldExtractionError] = reason;
+}
+
 }  // namespace
 
 void LinuxPlatform::ParseFile(const std::string& path, const Json::Value& options, Json::Value& document) {
@@ -54,13 +60,20 @@ void LinuxPlatform::ParseFile(const std::string& path, const Json::Value& option
   // Only a regular file's own bytes are read: a link's target may lie outside
   // the share, and a device or a pipe is no document.
   if (S_ISREG(status.mode) && status.size > 0) {
-    const OpenFile file(open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
-    if (file.fd() < 0) FailWithErrno("cannot open", path);
-    struct stat opened;
-    if (fstat(file.fd(), &opened) != 0) FailWithErrno("cannot read the status of", path);
-    if (!S_ISREG(opened.st_mode)) throw Error(kErrorParseDocument, "no longer a regular file: " + path);
-    const Json::Value content = extract::ExtractInWorker(file.fd(), path, need_meta);
-    for (const std::string& name : content.getMemberNames()) fields[name] = content[name];
+    try {
+      const OpenFile file(open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+      if (file.fd() < 0) FailWithErrno("cannot open", path);
+      struct stat opened;
+      if (fstat(file.fd(), &opened) != 0) FailWithErrno("cannot read the status of", path);
+      if (!S_ISREG(opened.st_mode)) throw Error(kErrorParseDocument, "no longer a regular file: " + path);
+      const Json::Value content = extract::ExtractInWorker(file.fd(), path, need_meta);
+      for (const std::string& name : content.getMemberNames()) fields[name] = content[name];
+    } catch (const Error& error) {
+      // The file exists: it stays findable by everything but its content.
+      MarkFailed(error.reason.empty() ? error.what() : error.reason, fields);
+    } catch (const std::exception& error) {
+      MarkFailed(error.what(), fields);
+    }
   }
   document = fields;
 }

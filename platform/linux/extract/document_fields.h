@@ -28,6 +28,11 @@ constexpr const char kFieldFSSize[] = "CORVMDFSSize";
 constexpr const char kFieldLogicalSize[] = "CORVMDLogicalSize";
 constexpr const char kFieldPhysicalSize[] = "CORVMDPhysicalSize";
 constexpr const char kFieldContentChangeDate[] = "CORVMDFSContentChangeDate";
+// Set when the file's content could not be read (parse error, time-out,
+// crash): the document then holds the file-system fields only, so the file
+// stays findable by name, path and metadata, and the reason is kept.
+constexpr const char kFieldExtractionFailed[] = "CORVMDExtractionFailed";
+constexpr const char kFieldExtractionError[] = "CORVMDExtractionError";
 constexpr const char kFieldAttributeChangeDate[] = "CORVMDAttributeChangeDate";
 constexpr const char kFieldCreationDate[] = "CORVMDFSCreationDate";
 constexpr const char kFieldLastUsedDate[] = "CORVMDLastUsedDate";

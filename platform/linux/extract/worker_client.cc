@@ -125,12 +125,14 @@ class WorkerProcess {
     return std::unique_ptr<WorkerProcess>(new WorkerProcess(pid, ends[0]));
   }
 
-  Json::Value Ask(int fd, const std::string& path, bool need_meta, std::chrono::milliseconds timeout) {
+  Json::Value Ask(int fd, const std::string& path, bool need_meta, const ExtractLimits& limits) {
+    const std::chrono::milliseconds timeout = limits.timeout;
     ++used_;
     broken_ = true;  // until a whole, well-formed reply has arrived
     Json::Value request(Json::objectValue);
     request["name"] = Basename(path);
     request["need_meta"] = need_meta;
+    request["text_cap"] = static_cast<Json::UInt64>(limits.text_cap);
     if (!SendDescriptor(socket_, fd) || !WriteFrameQuietly(socket_, JsonToString(request))) {
       Fail(std::string("the extraction worker is gone: ") + strerror(errno));
     }
@@ -138,7 +140,7 @@ class WorkerProcess {
     uint32_t length = 0;
     const ssize_t peeked = recv(socket_, &length, sizeof(length), MSG_PEEK | MSG_WAITALL);
     if (peeked != static_cast<ssize_t>(sizeof(length))) Fail(DeathReason());
-    if (length > kMaxReplyBytes) Fail("the extraction worker sent " + std::to_string(length) + " bytes");
+    if (length > MaxReplyBytes(limits.text_cap)) Fail("the extraction worker sent " + std::to_string(length) + " bytes");
     Json::Value reply;
     try {
       if (!JsonFromString(reply, fileindex::ReadFrame(socket_)) || !reply.isObject()) {
@@ -248,6 +250,9 @@ ExtractLimits CurrentExtractLimits() {
   limits.timeout = std::chrono::milliseconds(
       EnvNumber("CORVLUMEX_EXTRACT_TIMEOUT_MS", limits.timeout.count(), 1, 24L * 3600 * 1000));
   limits.memory_mb = static_cast<unsigned int>(EnvNumber("CORVLUMEX_EXTRACT_MEMORY_MB", limits.memory_mb, 64, 1 << 20));
+  limits.text_cap = static_cast<size_t>(EnvNumber("CORVLUMEX_EXTRACT_TEXT_MB", static_cast<long>(limits.text_cap >> 20), 1,
+                                                  kMaxTextCapMb))
+                    << 20;
   return limits;
 }
 
@@ -277,7 +282,7 @@ Json::Value ExtractInWorker(int fd, const std::string& path, bool need_meta) {
   std::unique_ptr<WorkerProcess> worker = AcquireWorker(limits);
   Json::Value fields;
   try {
-    fields = worker->Ask(fd, path, need_meta, limits.timeout);
+    fields = worker->Ask(fd, path, need_meta, limits);
   } catch (const Error& error) {
     CORV_LOG("content extraction of %s failed: %s", path.c_str(), error.reason.c_str());
     ReleaseWorker(std::move(worker), limits);

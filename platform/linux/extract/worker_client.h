@@ -9,6 +9,8 @@
 #include <chrono>
 #include <string>
 
+#include "platform/linux/extract/parsers/text_sink.h"
+
 namespace corvlumex {
 namespace platform {
 namespace extract {
@@ -17,10 +19,12 @@ struct ExtractLimits {
   std::chrono::milliseconds timeout{20000};  // wall-clock time per file
   unsigned int memory_mb = 1024;             // address space of a worker
   int files_per_worker = 256;                // a worker is replaced after this many files
+  size_t text_cap = kTextContentCap;         // text content kept per file, bytes of UTF-8
 };
 
-// The defaults, changed by CORVLUMEX_EXTRACT_TIMEOUT_MS and
-// CORVLUMEX_EXTRACT_MEMORY_MB (read at each call; bad values are ignored).
+// The defaults, changed by CORVLUMEX_EXTRACT_TIMEOUT_MS,
+// CORVLUMEX_EXTRACT_MEMORY_MB and CORVLUMEX_EXTRACT_TEXT_MB (read at each
+// call; bad values are ignored).
 ExtractLimits CurrentExtractLimits();
 
 // The worker program: $CORVLUMEX_EXTRACT_WORKER, else the one built in

@@ -16,15 +16,22 @@
 #include "common/json_util.h"
 #include "common/log.h"
 #include "fileindex/communication.h"
+#include "fileindex/frame_reader.h"
 #include "platform/linux/extract/parsers/extract_content.h"
 #include "platform/linux/extract/parsers/file_bytes.h"
 #include "platform/linux/extract/parsers/formats.h"
+#include "platform/linux/extract/parsers/text_sink.h"
 #include "platform/linux/extract/worker_protocol.h"
 
 namespace corvlumex {
 namespace platform {
 namespace extract {
 namespace {
+
+// A request names one file: a path and a flag.
+constexpr size_t kMaxRequestBytes = 64u << 10;
+// The library sends the request right after the descriptor.
+constexpr int kRequestWaitMs = 10000;
 
 // Test-only misbehaviour, so the tests can show what the indexer does when a
 // parser loops, crashes or eats memory without needing such a file:
@@ -85,23 +92,48 @@ void RunTestHook(const WorkerLimits& limits) {
   }
 }
 
+Json::Value Failure(const std::string& reason) {
+  Json::Value reply(Json::objectValue);
+  reply["ok"] = false;
+  reply["error"] = reason;
+  return reply;
+}
+
+// The text cap the request asks for; the default when it names none, and
+// never more than the largest setting (the reply must fit a frame).
+size_t TextCap(const Json::Value& request) {
+  const Json::Value& cap = request["text_cap"];
+  if (!cap.isUInt64() || cap.asUInt64() == 0) return kTextContentCap;
+  return static_cast<size_t>(std::min<Json::UInt64>(cap.asUInt64(), static_cast<Json::UInt64>(kMaxTextCapMb) << 20));
+}
+
 Json::Value Answer(int fd, const Json::Value& request, const WorkerLimits& limits) {
+  if (fd < 0) return Failure("the request carried no file descriptor");
+  if (!request.isObject() || !request["name"].isString() || !(request["need_meta"].isNull() || request["need_meta"].isBool())) {
+    return Failure("the request must be {\"name\": string, \"need_meta\": bool}");
+  }
   Json::Value reply(Json::objectValue);
   try {
     RunTestHook(limits);
-    reply["fields"] = ExtractContent(fd, request["name"].asString(), request["need_meta"].asBool());
+    reply["fields"] = ExtractContent(fd, request["name"].asString(), request["need_meta"].asBool(), TextCap(request));
     reply["ok"] = true;
   } catch (const std::bad_alloc&) {
-    reply["ok"] = false;
-    reply["error"] = "out of memory (the worker may use " + std::to_string(limits.memory_mb) + " MiB)";
+    reply = Failure("out of memory (the worker may use " + std::to_string(limits.memory_mb) + " MiB)");
   } catch (const std::exception& error) {
-    reply["ok"] = false;
-    reply["error"] = error.what();
+    reply = Failure(error.what());
   } catch (...) {
-    reply["ok"] = false;
-    reply["error"] = "the parser failed";
+    reply = Failure("the parser failed");
   }
   return reply;
+}
+
+bool SendReply(int socket, const Json::Value& reply) {
+  try {
+    fileindex::WriteFrame(socket, JsonToString(reply));
+    return true;
+  } catch (const Error&) {
+    return false;
+  }
 }
 
 }  // namespace
@@ -121,25 +153,31 @@ int RunWorker(int socket, const WorkerLimits& limits) {
   }
   for (;;) {
     const int fd = ReceiveDescriptor(socket);
-    if (fd < 0) return errno == 0 ? 0 : 1;
+    // The end of the stream is the library letting the worker go.
+    if (fd < 0 && errno == 0) return 0;
+    // A marker byte without a descriptor still precedes a request: it is
+    // read and answered, so the conversation stays in step.
+    if (fd < 0 && errno != EPROTO) return 1;
+    errno = 0;
+    std::string text;
+    const fileindex::FrameStatus status =
+        fileindex::ReadFrameBounded(socket, kMaxRequestBytes, kRequestWaitMs, kRequestWaitMs, &text);
+    if (status != fileindex::FrameStatus::kOk) {
+      if (fd >= 0) close(fd);
+      // Cut, late or oversized: where the next request begins is unknown.
+      if (status == fileindex::FrameStatus::kTooLarge) SendReply(socket, Failure("the request is larger than " + std::to_string(kMaxRequestBytes) + " bytes"));
+      return 1;
+    }
     Json::Value request;
-    try {
-      if (!JsonFromString(request, fileindex::ReadFrame(socket)) || !request.isObject()) {
-        close(fd);
-        return 1;
-      }
-    } catch (const Error&) {
-      close(fd);
-      return 1;
+    Json::Value reply;
+    if (!JsonFromString(request, text)) {
+      reply = Failure("the request is not JSON");
+    } else {
+      RenewCpuAllowance(limits);
+      reply = Answer(fd, request, limits);
     }
-    RenewCpuAllowance(limits);
-    const Json::Value reply = Answer(fd, request, limits);
-    close(fd);
-    try {
-      fileindex::WriteFrame(socket, JsonToString(reply));
-    } catch (const Error&) {
-      return 1;
-    }
+    if (fd >= 0) close(fd);
+    if (!SendReply(socket, reply)) return 1;
   }
 }
 

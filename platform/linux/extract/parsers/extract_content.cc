@@ -3,6 +3,7 @@
 #include <magic.h>
 #include <unistd.h>
 
+#include <cctype>
 #include <map>
 
 #include "common/file_util.h"
@@ -10,13 +11,14 @@
 #include "platform/linux/extract/parsers/file_bytes.h"
 #include "platform/linux/extract/parsers/formats.h"
 #include "platform/linux/extract/parsers/text_sink.h"
+#include "platform/linux/extract/parsers/troff_text.h"
 
 namespace corvlumex {
 namespace platform {
 namespace extract {
 namespace {
 
-enum class Family { kText, kHtml, kXml, kPdf, kOffice, kAudio, kPhoto, kVideo };
+enum class Family { kText, kHtml, kXml, kPdf, kOffice, kAudio, kPhoto, kVideo, kManPage, kCompressed };
 
 struct Format {
   Family family;
@@ -29,11 +31,23 @@ const std::map<std::string, Format>& FormatsByExtension() {
     for (const char* ext : {"txt", "text", "log", "md", "markdown", "rst", "csv", "tsv", "json", "yaml", "yml",
                             "ini", "conf", "cfg", "toml", "tex", "srt", "vtt", "sub", "nfo", "c", "h", "cc", "cpp",
                             "cxx", "hpp", "hh", "java", "py", "sh", "bash", "js", "ts", "css", "go", "rs", "rb",
-                            "pl", "php", "sql", "lua", "swift", "kt", "cs", "properties", "diff", "patch"}) {
+                            "pl", "php", "sql", "lua", "swift", "kt", "cs", "properties", "diff", "patch",
+                            // More source code and plain-text formats whose content libmagic may take for
+                            // something else (a Perl module for JavaScript, a Pascal unit for HTML).
+                            "pm", "pod", "t", "pas", "pp", "dpr", "inc", "el", "lisp", "scm", "hs", "ml", "mli",
+                            "tcl", "awk", "m4", "cmake", "mk", "mak", "am", "ac", "in", "vim", "r", "f", "f90",
+                            "for", "adb", "ads", "d", "nim", "zig", "dart", "scala", "groovy", "gradle", "erl",
+                            "hrl", "ex", "exs", "clj", "jsx", "tsx", "mjs", "cjs", "vue", "scss", "less", "sass",
+                            "po", "pot", "texi", "texinfo", "asm", "s", "bat", "ps1", "cmd", "y", "l", "proto",
+                            "hxx", "ipp", "tcc", "inl", "m", "mm", "jl", "pyi", "pyx", "rake",
+                            "gemspec", "cabal", "bib", "sty", "cls", "dtx", "ltx", "adoc", "asciidoc", "org",
+                            "license", "changelog", "readme", "news", "todo", "authors", "copying", "install"}) {
       (*table)[ext] = {Family::kText, OfficeFormat::kDocx};
     }
     for (const char* ext : {"html", "htm", "xhtml", "shtml"}) (*table)[ext] = {Family::kHtml, OfficeFormat::kDocx};
     for (const char* ext : {"xml", "svg", "rss", "atom", "plist"}) (*table)[ext] = {Family::kXml, OfficeFormat::kDocx};
+    for (const char* ext : {"gz", "bz2", "xz", "zst"}) (*table)[ext] = {Family::kCompressed, OfficeFormat::kDocx};
+    for (const char* ext : {"man", "roff", "troff", "mdoc"}) (*table)[ext] = {Family::kManPage, OfficeFormat::kDocx};
     (*table)["pdf"] = {Family::kPdf, OfficeFormat::kDocx};
     (*table)["docx"] = {Family::kOffice, OfficeFormat::kDocx};
     (*table)["docm"] = {Family::kOffice, OfficeFormat::kDocx};
@@ -79,18 +93,47 @@ std::string MediaType(int fd) {
 
 bool StartsWith(const std::string& text, const char* head) { return text.rfind(head, 0) == 0; }
 
+// The start of the content after a byte-order mark and blanks, lower-cased.
+std::string Signature(int fd) {
+  std::string head = ReadHead(fd, 512);
+  lseek(fd, 0, SEEK_SET);
+  size_t start = StartsWith(head, "\xEF\xBB\xBF") ? 3 : 0;
+  while (start < head.size() && isspace(static_cast<unsigned char>(head[start]))) ++start;
+  head = head.substr(start, 64);
+  for (char& c : head) c = static_cast<char>(tolower(static_cast<unsigned char>(c)));
+  return head;
+}
+
+// Text that libmagic names by the language it guesses (a Perl module as
+// JavaScript, a shell script): still text to index.
+bool IsProgramText(const std::string& type) {
+  for (const char* word : {"script", "json", "perl", "php", "ruby", "python", "x-tex", "x-awk", "x-m4", "troff"}) {
+    if (type.find(word) != std::string::npos) return true;
+  }
+  return false;
+}
+
 // The family for a name whose extension we do not know, from the content.
-bool FamilyByMediaType(const std::string& type, Format* format) {
+// Markup is parsed as markup only on a clear signature: libmagic calls many
+// sources HTML for a tag in a comment, and an HTML parser then drops half
+// their words; anything else textual is read as plain text.
+bool FamilyByContent(int fd, const std::string& type, Format* format) {
   if (type == "application/pdf") {
     *format = {Family::kPdf, OfficeFormat::kDocx};
-  } else if (type == "text/html") {
+    return true;
+  }
+  if (!StartsWith(type, "text/") && !IsProgramText(type)) return false;
+  if (type == "text/troff") {
+    *format = {Family::kManPage, OfficeFormat::kDocx};
+    return true;
+  }
+  const std::string signature = Signature(fd);
+  if (StartsWith(signature, "<!doctype html") || StartsWith(signature, "<html")) {
     *format = {Family::kHtml, OfficeFormat::kDocx};
-  } else if (type == "text/xml") {
+  } else if (StartsWith(signature, "<?xml")) {
     *format = {Family::kXml, OfficeFormat::kDocx};
-  } else if (StartsWith(type, "text/")) {
-    *format = {Family::kText, OfficeFormat::kDocx};
   } else {
-    return false;
+    *format = {Family::kText, OfficeFormat::kDocx};
   }
   return true;
 }
@@ -113,7 +156,7 @@ void InitContentDetection() {
   Magic() = magic;
 }
 
-Json::Value ExtractContent(int fd, const std::string& name, bool need_meta) {
+Json::Value ExtractContent(int fd, const std::string& name, bool need_meta, size_t text_cap) {
   Json::Value fields(Json::objectValue);
   const std::string media_type = MediaType(fd);
   if (!media_type.empty()) fields[kFieldMediaTypes] = media_type;
@@ -122,11 +165,13 @@ Json::Value ExtractContent(int fd, const std::string& name, bool need_meta) {
   const auto known = FormatsByExtension().find(GetFileExtension(name, true));
   if (known != FormatsByExtension().end()) {
     format = known->second;
-  } else if (!FamilyByMediaType(media_type, &format)) {
+  } else if (IsManPageName(name)) {
+    format = {Family::kManPage, OfficeFormat::kDocx};
+  } else if (!FamilyByContent(fd, media_type, &format)) {
     return fields;  // a file we have nothing to read from: its name and status suffice
   }
 
-  TextSink text;
+  TextSink text(text_cap);
   switch (format.family) {
     case Family::kText:
       ExtractPlainText(fd, text);
@@ -136,6 +181,13 @@ Json::Value ExtractContent(int fd, const std::string& name, bool need_meta) {
       break;
     case Family::kXml:
       ExtractXml(fd, text);
+      break;
+    case Family::kManPage:
+      ExtractManPage(fd, text);
+      break;
+    case Family::kCompressed:
+      lseek(fd, 0, SEEK_SET);
+      ExtractCompressed(fd, name.substr(0, name.rfind('.')), text);
       break;
     case Family::kPdf:
       ExtractPdf(fd, text, fields);

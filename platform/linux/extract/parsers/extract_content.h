@@ -19,8 +19,9 @@ void InitContentDetection();
 // The content fields of the regular file open on `fd`. The text of a
 // document always; the audio, photo and video fields with `need_meta`.
 // Throws std::exception (ExtractError with a clear message, or a library's
-// own) when the file cannot be understood.
-Json::Value ExtractContent(int fd, const std::string& name, bool need_meta);
+// own) when the file cannot be understood. At most `text_cap` bytes of text
+// are kept.
+Json::Value ExtractContent(int fd, const std::string& name, bool need_meta, size_t text_cap);
 
 }  // namespace extract
 }  // namespace platform

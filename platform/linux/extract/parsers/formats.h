@@ -18,6 +18,11 @@ enum class OfficeFormat { kDocx, kXlsx, kPptx, kOdt, kOds, kOdp, kEpub };
 void ExtractPlainText(int fd, TextSink& text);
 void ExtractHtml(int fd, TextSink& text, Json::Value& fields);
 void ExtractXml(int fd, TextSink& text);
+// A manual page's troff source, as its readable text.
+void ExtractManPage(int fd, TextSink& text);
+// The text inside a single compressed file whose name without the
+// compression suffix is `inner_name`: plain text, or a manual page.
+void ExtractCompressed(int fd, const std::string& inner_name, TextSink& text);
 void ExtractPdf(int fd, TextSink& text, Json::Value& fields);
 void ExtractOffice(int fd, OfficeFormat format, TextSink& text, Json::Value& fields);
 void ExtractAudio(int fd, const std::string& name, Json::Value& fields);

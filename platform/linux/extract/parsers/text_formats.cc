@@ -3,6 +3,7 @@
 #include <libxml/HTMLparser.h>
 #include <libxml/parser.h>
 
+#include <algorithm>
 #include <memory>
 
 #include "platform/linux/extract/document_fields.h"
@@ -10,6 +11,7 @@
 #include "platform/linux/extract/parsers/file_bytes.h"
 #include "platform/linux/extract/parsers/formats.h"
 #include "platform/linux/extract/parsers/text_sink.h"
+#include "platform/linux/extract/parsers/troff_text.h"
 #include "platform/linux/extract/parsers/xml_text.h"
 
 namespace corvlumex {
@@ -19,9 +21,9 @@ namespace {
 
 // Input read for a text file: enough for the text cap in any encoding
 // (UTF-16 takes two bytes a character, most CJK encodings up to three).
-constexpr size_t kTextInputCap = 4 * kTextContentCap;
+size_t TextInputCap(const TextSink& text) { return 4 * text.cap(); }
 // Markup carries much more than its text; a page beyond this is cut.
-constexpr size_t kMarkupInputCap = 32u << 20;
+size_t MarkupInputCap(const TextSink& text) { return std::max<size_t>(32u << 20, TextInputCap(text)); }
 
 std::string ReadAsUtf8(int fd, size_t limit) {
   std::string utf8;
@@ -62,10 +64,12 @@ void SetIfPresent(Json::Value& fields, const char* field, const std::string& val
 
 }  // namespace
 
-void ExtractPlainText(int fd, TextSink& text) { text.Append(ReadAsUtf8(fd, kTextInputCap)); }
+void ExtractPlainText(int fd, TextSink& text) { text.Append(ReadAsUtf8(fd, TextInputCap(text))); }
+
+void ExtractManPage(int fd, TextSink& text) { AppendTroffText(ReadAsUtf8(fd, TextInputCap(text)), text); }
 
 void ExtractHtml(int fd, TextSink& text, Json::Value& fields) {
-  const std::string utf8 = ReadAsUtf8(fd, kMarkupInputCap);
+  const std::string utf8 = ReadAsUtf8(fd, MarkupInputCap(text));
   std::unique_ptr<xmlDoc, XmlDocFree> doc(
       htmlReadMemory(utf8.data(), static_cast<int>(utf8.size()), nullptr, "UTF-8", SafeHtmlOptions()));
   if (!doc) throw ExtractError("not an HTML document");
@@ -75,12 +79,16 @@ void ExtractHtml(int fd, TextSink& text, Json::Value& fields) {
   SetIfPresent(fields, kFieldDescription, MetaContent(root, "description"));
   SetIfPresent(fields, kFieldAuthors, MetaContent(root, "author"));
   SetIfPresent(fields, kFieldKeywords, MetaContent(root, "keywords"));
-  CollectText(root, kHtmlBlocks, "script style head noscript template", text);
+  // From the document node, not the root element: a page may carry text
+  // after its </html>, and the parser leaves that beside the root. A
+  // <noscript> holds what most readers see (the text for those without
+  // scripts), so it is kept.
+  CollectText(reinterpret_cast<const xmlNode*>(doc.get()), kHtmlBlocks, "script style head template", text);
 }
 
 void ExtractXml(int fd, TextSink& text) {
   // The XML declaration names the encoding; the parser converts by itself.
-  const std::string bytes = ReadHead(fd, kMarkupInputCap);
+  const std::string bytes = ReadHead(fd, MarkupInputCap(text));
   std::unique_ptr<xmlDoc, XmlDocFree> doc(
       xmlReadMemory(bytes.data(), static_cast<int>(bytes.size()), nullptr, nullptr, SafeXmlOptions()));
   if (!doc || xmlDocGetRootElement(doc.get()) == nullptr) throw ExtractError("not a well-formed XML document");

@@ -10,8 +10,12 @@ namespace corvlumex {
 namespace platform {
 namespace extract {
 
-// The text content kept per document: 1 MiB of UTF-8.
-constexpr size_t kTextContentCap = 1u << 20;
+// The text content kept per document by default: 8 MiB of UTF-8 (long
+// manuals and source files run past 1 MiB); CORVLUMEX_EXTRACT_TEXT_MB
+// changes it (worker_client.h).
+constexpr size_t kTextContentCap = 8u << 20;
+// The largest text cap a setting may ask for, in MiB.
+constexpr long kMaxTextCapMb = 64;
 
 class TextSink {
  public:
@@ -28,6 +32,7 @@ class TextSink {
   void Space();
 
   bool full() const { return full_; }
+  size_t cap() const { return cap_; }
   const std::string& text() const { return text_; }
   // The text without blanks and line breaks at either end.
   std::string Trimmed() const;

@@ -1,17 +1,12 @@
-#include "programs/fileindex/daemon_client.h"
+#include "programs/frontend/daemon_client.h"
 
 #include <sys/socket.h>
-#include <sys/stat.h>
-#include <sys/sysmacros.h>
 #include <sys/un.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
-#include <filesystem>
-#include <fstream>
-#include <sstream>
 
 #include "common/error.h"
 #include "common/json_util.h"
@@ -19,13 +14,11 @@
 #include "fileindex/communication.h"
 #include "fileindex/constants.h"
 #include "fileindex/elastic/comm.h"
+#include "platform/linux/notifier_presence.h"
 
 namespace corvlumex {
-namespace cli {
+namespace frontend {
 namespace {
-
-// The notifier's configuration folder, which it keeps locked while it runs.
-constexpr char kNotifierConfigDir[] = "/etc/corvlumex/monitor.d";
 
 // A connected socket to `path`, or -1 with errno set.
 int Connect(const std::string& path) {
@@ -55,61 +48,6 @@ bool Answers(const std::string& socket_path) {
   return true;
 }
 
-// Read from /proc/locks, so that asking never takes the lock itself (a
-// notifier starting at that moment would find it taken and give up).
-bool SomeoneLocks(const std::string& path) {
-  struct stat info;
-  if (stat(path.c_str(), &info) != 0) return false;
-  std::ostringstream id;
-  id << std::hex;
-  id.width(2);
-  id.fill('0');
-  id << major(info.st_dev) << ":";
-  id.width(2);
-  id << minor(info.st_dev) << ":" << std::dec << info.st_ino;
-  std::ifstream locks("/proc/locks");
-  std::string line;
-  while (std::getline(locks, line)) {
-    std::istringstream words(line);
-    std::string word;
-    while (words >> word) {
-      if (word == id.str()) return true;
-    }
-  }
-  return false;
-}
-
-// The sandbox root a process runs under ("" for none); false when its
-// environment cannot be read (another user's process).
-bool RootOfProcess(const std::string& pid, std::string& root) {
-  std::ifstream environ("/proc/" + pid + "/environ", std::ios::binary);
-  if (!environ) return false;
-  std::string entry;
-  root.clear();
-  while (std::getline(environ, entry, '\0')) {
-    if (entry.compare(0, 15, "CORVLUMEX_ROOT=") == 0) root = entry.substr(15);
-  }
-  return true;
-}
-
-// A process named `name` that runs under this command line's sandbox root
-// (or may: one whose environment cannot be read counts).
-bool ProcessRuns(const std::string& name) {
-  const char* own = getenv("CORVLUMEX_ROOT");
-  const std::string own_root = own == nullptr ? "" : own;
-  std::error_code error;
-  for (const auto& entry : std::filesystem::directory_iterator("/proc", error)) {
-    const std::string pid = entry.path().filename().string();
-    if (pid.find_first_not_of("0123456789") != std::string::npos) continue;
-    std::ifstream comm("/proc/" + pid + "/comm");
-    std::string command;
-    if (!std::getline(comm, command) || command != name) continue;
-    std::string root;
-    if (!RootOfProcess(pid, root) || root == own_root) return true;
-  }
-  return false;
-}
-
 const char* UnitName(Daemon daemon) {
   switch (daemon) {
     case Daemon::kIndexer: return "pkg-CorvLumex-fileindexd";
@@ -134,9 +72,9 @@ bool DaemonRunning(Daemon daemon) {
   switch (daemon) {
     case Daemon::kIndexer: return Answers(SysPath(fileindex::kFileIndexDaemonSocketPath));
     case Daemon::kSearch: return Answers(ElasticSocketPath());
-    // The notifier locks its configuration folder only when the folder
-    // existed at its start; before the first folder is added it does not.
-    case Daemon::kNotifier: return SomeoneLocks(SysPath(kNotifierConfigDir)) || ProcessRuns("corvnotifyd");
+    // A notifier whose presence cannot be probed is not reported down.
+    case Daemon::kNotifier:
+      return platform::ProbeNotifier(platform::NotifierConfigDir()) != platform::NotifierState::kNotRunning;
   }
   return false;
 }
@@ -182,5 +120,5 @@ Json::Value AskDaemon(const std::string& type, const Json::Value& data) {
   return answer["data"];
 }
 
-}  // namespace cli
+}  // namespace frontend
 }  // namespace corvlumex

@@ -1,4 +1,4 @@
-// The command line's view of the three daemons: whether each one runs (told
+// The front ends' view of the three daemons: whether each one runs (told
 // at once, without the library's waits for a daemon still starting), the
 // command that starts it, and fileindexd's answers (the library's
 // SendCommandToDaemon drops them; "status" needs them).
@@ -9,15 +9,15 @@
 #include <string>
 
 namespace corvlumex {
-namespace cli {
+namespace frontend {
 
 enum class Daemon { kIndexer, kSearch, kNotifier };
 
 // "fileindexd", "corvelasticd", "corvnotifyd".
 const char* DaemonName(Daemon daemon);
 // True when the daemon answers on its socket (fileindexd, corvelasticd) or
-// holds its configuration lock or runs under this sandbox root
-// (corvnotifyd). Never waits.
+// holds its presence lock on its configuration folder (corvnotifyd; one
+// that cannot be probed counts as running). Never waits.
 bool DaemonRunning(Daemon daemon);
 // What starts it: FILEINDEX_START_COMMAND when set (the run command's
 // wrapper sets it to its own start command), else the systemd unit.
@@ -32,5 +32,5 @@ void RequireRunning(Daemon daemon, const std::string& consequence = "");
 // code and message when it refuses the command.
 Json::Value AskDaemon(const std::string& type, const Json::Value& data);
 
-}  // namespace cli
+}  // namespace frontend
 }  // namespace corvlumex
