@@ -91,7 +91,16 @@ int main(int argc, char** argv) {
             strerror(errno));
     return 1;
   }
-  if (flock(config_lock, LOCK_EX | LOCK_NB) != 0) {
+  // The one-notifier lock is taken on a file only this daemon's user can
+  // open: a lock on the folder itself (readable by every local user) could be
+  // taken by anyone, and would keep the notifier from ever starting.
+  const std::string instance_path = options.config_dir + "/.corvnotifyd.lock";
+  const int instance_lock = open(instance_path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
+  if (instance_lock < 0) {
+    fprintf(stderr, "corvnotifyd: cannot open its lock file %s: %s\n", instance_path.c_str(), strerror(errno));
+    return 1;
+  }
+  if (flock(instance_lock, LOCK_EX | LOCK_NB) != 0) {
     fprintf(stderr, "corvnotifyd: another corvnotifyd already watches as configured in %s\n",
             options.config_dir.c_str());
     return 1;

@@ -2,6 +2,7 @@
 // for each kind of change a user makes.
 #include <fcntl.h>
 #include <signal.h>
+#include <sys/file.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -68,7 +69,13 @@ class NotifydTest : public ::testing::Test {
 };
 
 TEST_F(NotifydTest, FileChangesBecomeOneLineEachAndALargeCopyOneModify) {
+  // Any local user can open the configuration folder and lock it: that must
+  // not keep the notifier from starting.
+  std::filesystem::create_directories(box_.config_dir());
+  const int folder = open(box_.config_dir().c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  ASSERT_EQ(0, flock(folder, LOCK_EX | LOCK_NB));
   auto daemon = box_.Start();
+  close(folder);
   // A second notifier on the same configuration would write every line twice.
   auto second = box_.Run({"--foreground"});
   EXPECT_TRUE(box_.WaitForLog("another corvnotifyd already watches as configured in"));

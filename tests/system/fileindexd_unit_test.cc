@@ -352,6 +352,8 @@ TEST(BatchMarkTest, ACountHoldsForItsOwnBatchFileOnly) {
   mark.Clear();
   EXPECT_EQ(mark.Load(), 0u);
   EXPECT_FALSE(IsFileExist(batch + ".applied"));
+}
+
 // The administrators' list of files that could not be indexed keeps the
 // latest ones only, so a share full of broken files cannot grow the daemon.
 TEST(ProgressBoardTest, KeepsTheLatestFailedFilesWithTheirReasons) {
