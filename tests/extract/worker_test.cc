@@ -257,7 +257,7 @@ TEST_F(WorkerTest, BadRequestsAreAnsweredAndACutOneEndsTheWorkerCleanly) {
     EXPECT_EQ(static_cast<ssize_t>(frame.size()), write(library, frame.data(), frame.size()));
     std::string text;
     Json::Value reply;
-    if (fileindex::ReadFrameBounded(library, kMaxReplyBytes, 20000, 20000, &text) != fileindex::FrameStatus::kOk ||
+    if (fileindex::ReadFrameBounded(library, MaxReplyBytes(kTextContentCap), 20000, 20000, &text) != fileindex::FrameStatus::kOk ||
         !JsonFromString(reply, text)) {
       ADD_FAILURE() << "no reply to " << frame << "; " << testing_support::ReadFileText(PathOf("worker.log"));
     }
