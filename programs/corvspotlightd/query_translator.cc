@@ -182,8 +182,8 @@ FieldTable FieldTable::FromMappings(const Json::Value& mappings) {
   const Json::Value& defaults = mappings["default"];
   const Json::Value& properties = mappings["properties"];
   for (const std::string& name : properties.getMemberNames()) {
-    const Json::Value& spec = properties[name];
-    auto setting = [&](const char* key) { return spec.get(key, defaults.get(key, "")).asString(); };
+    const Json::Value& mapping = properties[name];
+    auto setting = [&](const char* key) { return mapping.get(key, defaults.get(key, "")).asString(); };
     const std::string type = setting("type");
     FieldKind kind = FieldKind::kText;
     if (type == "int" || type == "double") {
@@ -197,7 +197,7 @@ FieldTable FieldTable::FromMappings(const Json::Value& mappings) {
     } else if (setting("analyzer") == "keyword") {
       kind = FieldKind::kKeyword;
     }
-    for (const Json::Value& step : spec["preprocess"]) {
+    for (const Json::Value& step : mapping["preprocess"]) {
       if (step.asString() == "ngram") table.fragment_field_ = name;
     }
     table.kinds_[name] = kind;

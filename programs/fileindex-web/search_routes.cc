@@ -86,32 +86,32 @@ Json::Value HitOut(const Json::Value& hit) {
 void Search(const httplib::Request& request, httplib::Response& response, WebContext& context) {
   const Session session = RequireSession(request, context);
   CheckParams(request.params, {"q", "share", "category", "modified_from", "modified_to", "size_min", "size_max", "from", "size"});
-  frontend::SearchSpec spec;
+  frontend::SearchParams params;
   const std::string words = Param(request.params, "q").value_or("");
-  spec.qsl = QueryFromText(words);
-  spec.shares = SharesParam(request.params);
-  spec.category = Param(request.params, "category").value_or("");
-  if (!spec.category.empty() && spec.category != "document" && spec.category != "audio" && spec.category != "video" &&
-      spec.category != "image") {
+  params.qsl = QueryFromText(words);
+  params.shares = SharesParam(request.params);
+  params.category = Param(request.params, "category").value_or("");
+  if (!params.category.empty() && params.category != "document" && params.category != "audio" && params.category != "video" &&
+      params.category != "image") {
     throw ApiError(400, "\"category\" must be document, audio, video or image", "choose one of the categories");
   }
   constexpr long long kFar = 1LL << 52;
-  spec.modified_from = IntegerParam(request.params, "modified_from", 0, kFar);
-  spec.modified_to = IntegerParam(request.params, "modified_to", 0, kFar);
-  spec.size_min = IntegerParam(request.params, "size_min", 0, kFar);
-  spec.size_max = IntegerParam(request.params, "size_max", 0, kFar);
-  spec.from = static_cast<unsigned>(IntegerParam(request.params, "from", 0, 10000).value_or(0));
-  spec.size = static_cast<unsigned>(IntegerParam(request.params, "size", 1, 100).value_or(20));
-  spec.highlight = true;
-  spec.highlight_pre = kMarkStart;
-  spec.highlight_post = kMarkEnd;
-  spec.track_total = false;
-  spec.as_user = session.user;
-  const Json::Value data = AskSearchDaemon(frontend::SearchRequest(spec));
+  params.modified_from = IntegerParam(request.params, "modified_from", 0, kFar);
+  params.modified_to = IntegerParam(request.params, "modified_to", 0, kFar);
+  params.size_min = IntegerParam(request.params, "size_min", 0, kFar);
+  params.size_max = IntegerParam(request.params, "size_max", 0, kFar);
+  params.from = static_cast<unsigned>(IntegerParam(request.params, "from", 0, 10000).value_or(0));
+  params.size = static_cast<unsigned>(IntegerParam(request.params, "size", 1, 100).value_or(20));
+  params.highlight = true;
+  params.highlight_pre = kMarkStart;
+  params.highlight_post = kMarkEnd;
+  params.track_total = false;
+  params.as_user = session.user;
+  const Json::Value data = AskSearchDaemon(frontend::SearchRequest(params));
   Json::Value out(Json::objectValue);
   out["total"] = data["total"];
   out["total_exact"] = data["total_exact"];
-  out["from"] = spec.from;
+  out["from"] = params.from;
   out["hits"] = Json::Value(Json::arrayValue);
   for (const Json::Value& hit : data["hits"]) out["hits"].append(HitOut(hit));
   ReplyJson(response, out);

@@ -89,27 +89,27 @@ Json::Value SearchRequest(const SearchArgs& args) {
   // `search 'saffron rice'` mean the same.
   std::string text;
   for (const std::string& word : args.words) text += (text.empty() ? "" : " ") + word;
-  frontend::SearchSpec spec;
+  frontend::SearchParams params;
   try {
-    spec.qsl = fileindex::UserQueryToSearch(text)["qsl"];
+    params.qsl = fileindex::UserQueryToSearch(text)["qsl"];
   } catch (const fileindex::UserQuerySyntaxError& error) {
     throw Error(kErrorBadArgument, std::string(error.what()) + " (the syntax: docs/search.md)");
   }
-  if (args.name) spec.qsl = NamesOnly(spec.qsl);
-  if (args.content) spec.qsl = ContentOnly(spec.qsl);
-  spec.shares = args.shares;
-  spec.category = args.type;
-  spec.from = args.from;
-  spec.size = args.size;
+  if (args.name) params.qsl = NamesOnly(params.qsl);
+  if (args.content) params.qsl = ContentOnly(params.qsl);
+  params.shares = args.shares;
+  params.category = args.type;
+  params.from = args.from;
+  params.size = args.size;
   if (!args.name) {
     // Matched words in bold on a terminal (unless NO_COLOR), in [brackets] otherwise.
     const bool tty = UseColour();
-    spec.highlight = true;
-    spec.highlight_size = 80;
-    spec.highlight_pre = tty ? kBoldOn : "[";
-    spec.highlight_post = tty ? kBoldOff : "]";
+    params.highlight = true;
+    params.highlight_size = 80;
+    params.highlight_pre = tty ? kBoldOn : "[";
+    params.highlight_post = tty ? kBoldOff : "]";
   }
-  return frontend::SearchRequest(spec);
+  return frontend::SearchRequest(params);
 }
 
 void PrintHits(const SearchArgs& args, const Json::Value& result) {

@@ -31,38 +31,38 @@ Json::Value IndexIds(const std::vector<std::string>& shares) {
   return ids;
 }
 
-Json::Value SearchRequest(const SearchSpec& spec) {
+Json::Value SearchRequest(const SearchParams& params) {
   Json::Value filters(Json::arrayValue);
-  if (!spec.category.empty()) {
+  if (!params.category.empty()) {
     Json::Value extensions(Json::arrayValue);
-    for (const std::string& ext : fileindex::GetExtensionsByCategory(spec.category)) extensions.append(ext);
+    for (const std::string& ext : fileindex::GetExtensionsByCategory(params.category)) extensions.append(ext);
     Json::Value terms(Json::objectValue);
     terms["terms"][elastic::kFieldExtension] = extensions;
     filters.append(terms);
   }
-  if (spec.modified_from || spec.modified_to) filters.append(Range("CORVMDFSContentChangeDate", spec.modified_from, spec.modified_to));
-  if (spec.size_min || spec.size_max) filters.append(Range("CORVMDFSSize", spec.size_min, spec.size_max));
+  if (params.modified_from || params.modified_to) filters.append(Range("CORVMDFSContentChangeDate", params.modified_from, params.modified_to));
+  if (params.size_min || params.size_max) filters.append(Range("CORVMDFSSize", params.size_min, params.size_max));
 
-  Json::Value qsl = spec.qsl;
+  Json::Value qsl = params.qsl;
   if (!filters.empty()) {
     Json::Value combined(Json::objectValue);
-    if (!spec.qsl.isNull()) combined["bool"]["must"].append(spec.qsl);
+    if (!params.qsl.isNull()) combined["bool"]["must"].append(params.qsl);
     combined["bool"]["filter"] = filters;
     qsl = combined;
   }
   Json::Value data(Json::objectValue);
-  if (!spec.shares.empty()) data["ids"] = IndexIds(spec.shares);
+  if (!params.shares.empty()) data["ids"] = IndexIds(params.shares);
   if (!qsl.isNull()) data["query"]["qsl"] = qsl;
-  data["from"] = spec.from;
-  data["size"] = spec.size;
-  data["track_total"] = spec.track_total;
+  data["from"] = params.from;
+  data["size"] = params.size;
+  data["track_total"] = params.track_total;
   for (const std::string& field : HitFields()) data["load_field"].append(field);
-  if (spec.highlight) {
-    data["highlight"]["size"] = static_cast<Json::UInt64>(spec.highlight_size);
-    data["highlight"]["pre"] = spec.highlight_pre;
-    data["highlight"]["post"] = spec.highlight_post;
+  if (params.highlight) {
+    data["highlight"]["size"] = static_cast<Json::UInt64>(params.highlight_size);
+    data["highlight"]["pre"] = params.highlight_pre;
+    data["highlight"]["post"] = params.highlight_post;
   }
-  if (!spec.as_user.empty()) data["as_user"] = spec.as_user;
+  if (!params.as_user.empty()) data["as_user"] = params.as_user;
   Json::Value request(Json::objectValue);
   request["command"] = "search";
   request["data"] = data;

@@ -13,7 +13,7 @@
 namespace corvlumex {
 namespace frontend {
 
-struct SearchSpec {
+struct SearchParams {
   Json::Value qsl;                     // the words as a clause; null: everything
   std::vector<std::string> shares;     // none: every indexed share
   std::string category;                // "document", "audio", "video", "image" or empty
@@ -30,7 +30,7 @@ struct SearchSpec {
 // The fields each hit carries back: path, folder flag, size, modification time.
 const std::vector<std::string>& HitFields();
 
-Json::Value SearchRequest(const SearchSpec& spec);
+Json::Value SearchRequest(const SearchParams& params);
 
 // "/share/dir": "fileindex_share" ids of the shares, for "ids".
 Json::Value IndexIds(const std::vector<std::string>& shares);

@@ -63,7 +63,7 @@ Json::Value IndexBytes(const std::string& share) {
 // Documents in the share's index, as a search counts them; null when the
 // search daemon cannot say.
 Json::Value DocumentCount(const std::string& share) {
-  SearchSpec count;
+  SearchParams count;
   count.shares = {share};
   count.size = 0;
   try {
