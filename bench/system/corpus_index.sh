@@ -42,15 +42,17 @@ indexer="$(cat "$(system_pid_file fileindexd)")"
 # Resident memory of the daemons and of the indexer's extraction workers
 # (its children), summed at each sample; the largest sum is the peak.
 sample_memory() {
-  local peak=0 total pid
+  local peak=0 total pid kib
   while :; do
     total=0
     for pid in "${daemons[@]}" $(pgrep -P "$indexer" || true); do
-      total=$((total + $(awk '/^VmRSS/ {print $2}' "/proc/$pid/status" 2>/dev/null || echo 0)))
+      # A worker may end between the listing and the reading.
+      kib=$(awk '/^VmRSS/ {print $2}' "/proc/$pid/status" 2>/dev/null || true)
+      total=$((total + ${kib:-0}))
     done
     if [ "$total" -gt "$peak" ]; then peak=$total; echo "$peak" > "$SCRATCH/memory_peak"; fi
     for pid in $(pgrep -P "$indexer" || true); do
-      kib=$(awk '/VmHWM/ {print $2}' "/proc/$pid/status" 2>/dev/null || echo 0)
+      kib=$(awk '/VmHWM/ {print $2}' "/proc/$pid/status" 2>/dev/null || true)
       [ "${kib:-0}" -gt "$(cat "$SCRATCH/worker_peak" 2>/dev/null || echo 0)" ] && echo "$kib" > "$SCRATCH/worker_peak"
     done
     sleep 0.2

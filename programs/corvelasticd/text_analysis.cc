@@ -38,7 +38,9 @@ bool IsCjkCharacter(int32_t cp) {
 }
 
 bool IsWordCharacter(int32_t cp) {
-  if (cp == '_') return true;
+  // ASCII, most of any text, without the table: its letters and digits are
+  // its only characters of the categories below.
+  if (cp < 0x80) return cp == '_' || (cp >= '0' && cp <= '9') || ((cp | 0x20) >= 'a' && (cp | 0x20) <= 'z');
   switch (utf8proc_category(cp)) {
     case UTF8PROC_CATEGORY_LU: case UTF8PROC_CATEGORY_LL: case UTF8PROC_CATEGORY_LT:
     case UTF8PROC_CATEGORY_LM: case UTF8PROC_CATEGORY_LO:
@@ -60,6 +62,11 @@ bool IsBlank(int32_t cp) {
 // Next code point at `pos`; an invalid byte is returned as a code point of
 // its own (negative) and consumes one byte, so no input stops the scan.
 int32_t NextCodePoint(std::string_view text, size_t* pos) {
+  const unsigned char first = static_cast<unsigned char>(text[*pos]);
+  if (first < 0x80) {
+    *pos += 1;
+    return first;
+  }
   utf8proc_int32_t cp = 0;
   const auto* start = reinterpret_cast<const utf8proc_uint8_t*>(text.data() + *pos);
   const utf8proc_ssize_t used = utf8proc_iterate(start, static_cast<utf8proc_ssize_t>(text.size() - *pos), &cp);

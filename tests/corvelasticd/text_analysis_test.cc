@@ -1,5 +1,6 @@
 // Folding and tokenizing: the rules every stored value and every query go through.
 #include <gtest/gtest.h>
+#include <utf8proc.h>
 
 #include "programs/corvelasticd/daemon_error.h"
 #include "programs/corvelasticd/index_schema.h"
@@ -33,6 +34,28 @@ TEST(FoldTest, DecomposedAndPrecomposedFormsMeetOtherMarksAndBadBytesAreKept) {
       {std::string("AB\xFF\xFE" "C", 5), FoldMode::kSearch, std::string("ab\xFF\xFE" "c", 5)},
   };
   for (const auto& c : cases) EXPECT_EQ(Fold(c.text, c.mode), c.folded) << c.text;
+}
+
+// ASCII is split without the Unicode table; each character must still be
+// a word character exactly when its category says so (letters, marks, numbers).
+TEST(AnalyzeTest, EveryAsciiCharacterJoinsOrSplitsWordsByItsUnicodeCategory) {
+  for (int c = 1; c < 0x80; ++c) {
+    const utf8proc_category_t category = utf8proc_category(c);
+    const bool word = c == '_' || (category >= UTF8PROC_CATEGORY_LU && category <= UTF8PROC_CATEGORY_NO);
+    const std::string text = std::string("ab") + static_cast<char>(c) + "cd";
+    const std::vector<std::string> tokens = Tokens(Analyzer::kStandard, text);
+    if (c == '_') {
+      EXPECT_EQ(tokens, std::vector<std::string>({"ab_cd", "ab", "cd"}));
+    } else if (word) {
+      const char lower = static_cast<char>(c >= 'A' && c <= 'Z' ? c + 32 : c);
+      // A capital after a small letter starts a camelCase part.
+      std::vector<std::string> whole = {std::string("ab") + lower + "cd"};
+      if (c >= 'A' && c <= 'Z') whole.insert(whole.end(), {"ab", std::string(1, lower) + "cd"});
+      EXPECT_EQ(tokens, whole) << c;
+    } else {
+      EXPECT_EQ(tokens, std::vector<std::string>({"ab", "cd"})) << c;
+    }
+  }
 }
 
 TEST(AnalyzeTest, KeywordValuesStayWholeWithoutBlanks) {
