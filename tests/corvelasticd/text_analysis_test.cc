@@ -58,6 +58,35 @@ TEST(AnalyzeTest, EveryAsciiCharacterJoinsOrSplitsWordsByItsUnicodeCategory) {
   }
 }
 
+// The index is handed each field's tokens joined by blanks; the joined form
+// made without a string per token must be that exactly, appended to what
+// the field's earlier values gave.
+TEST(AnalyzeTest, JoinedTokensAreTheTokensJoinedByBlanks) {
+  const struct {
+    Analyzer analyzer;
+    std::string text;
+  } cases[] = {
+      {Analyzer::kStandard, "readFileSync of pthread_mutex_lock, XMLParser 42"},
+      {Analyzer::kStandard, "Caf\xC3\xA9 na\xC3\xAFve \xE6\x9D\xB1\xE4\xBA\xAC"},
+      {Analyzer::kStandard, "a \xCC\x81 B\xCC\x81" "c"},  // a lone mark folds to nothing
+      {Analyzer::kWhitespace, "  Two  WORDS\there "},
+      {Analyzer::kKeyword, "My File.TXT"},
+      {Analyzer::kStandard, " ,;. "},
+  };
+  for (const auto& c : cases) {
+    for (const std::string& before : {std::string(), std::string("earlier")}) {
+      std::string expected = before;
+      for (const std::string& token : Tokens(c.analyzer, c.text)) {
+        if (!expected.empty()) expected += ' ';
+        expected += token;
+      }
+      std::string joined = before;
+      EXPECT_EQ(AnalyzeJoined(c.analyzer, c.text, &joined), !Tokens(c.analyzer, c.text).empty()) << c.text;
+      EXPECT_EQ(joined, expected) << c.text;
+    }
+  }
+}
+
 TEST(AnalyzeTest, KeywordValuesStayWholeWithoutBlanks) {
   EXPECT_EQ(Tokens(Analyzer::kKeyword, "My File.TXT"), std::vector<std::string>({"my\x1F" "file.txt"}));
   EXPECT_TRUE(Tokens(Analyzer::kKeyword, "").empty());
