@@ -5,10 +5,12 @@
 #include <gtest/gtest.h>
 #include <unistd.h>
 
+#include "common/file_util.h"
 #include "platform/linux/extract/document_fields.h"
 #include "platform/linux/extract/parsers/extract_content.h"
 #include "platform/linux/extract/parsers/formats.h"
 #include "platform/linux/extract/parsers/text_sink.h"
+#include "platform/linux/extract/plain_text.h"
 #include "tests/extract/samples.h"
 #include "tests/support/log_capture.h"
 
@@ -65,6 +67,45 @@ TEST_F(FormatsTest, TextWithoutKnownExtensionIsReadByItsMediaType) {
   const Json::Value binary = Extract("blob.bin");
   EXPECT_FALSE(binary.isMember(kFieldTextContent));
   EXPECT_NE("", binary[kFieldMediaTypes].asString());
+}
+
+// Plain text the indexer reads itself must give the very text the worker
+// would; whatever needs an encoding guess or a parser is left to the worker.
+TEST_F(FormatsTest, PlainTextReadInProcessGivesTheWorkersTextOrIsLeftToIt) {
+  const struct {
+    const char* name;
+    std::string bytes;
+    bool in_process;
+  } cases[] = {
+      {"notes.txt", "  Caf\xC3\xA9 cr\xC3\xA8me\r\n\tsecond\x01line\x7F end \n", true},
+      {"marked.md", "\xEF\xBB\xBF# Title\nbody \xFF broken", true},
+      {"cut.h", "int x; // \xE2\x82", true},
+      {"Upper.PM", "package Upper; 1;", true},
+      {"blank.c", " \n\t\n", true},
+      {"latin.txt", "Caf\xE9 cr\xE8me", false},
+      {"wide.txt", std::string("\xFF\xFEw\0i\0", 6), false},
+      {"zero.txt", std::string("text\0more", 9), false},
+      {"page.html", "<html><body>words</body></html>", false},
+      {"README", "no extension: the worker's media type decides", false},
+      {"big.txt", std::string(kInProcessTextBytes + 1, 'x'), false},
+  };
+  for (const auto& c : cases) {
+    WriteBytes(PathOf(c.name), c.bytes);
+    const int fd = open(PathOf(c.name).c_str(), O_RDONLY | O_CLOEXEC);
+    ASSERT_GE(fd, 0) << c.name;
+    Json::Value fields(Json::objectValue);
+    const bool read = ReadPlainTextInProcess(fd, PathOf(c.name), c.bytes.size(), text_cap_, fields);
+    close(fd);
+    EXPECT_EQ(c.in_process, read) << c.name;
+    if (!read) {
+      EXPECT_EQ(0u, fields.size()) << c.name;
+      continue;
+    }
+    const Json::Value worker = Extract(c.name);
+    EXPECT_EQ(worker.isMember(kFieldTextContent), fields.isMember(kFieldTextContent)) << c.name;
+    EXPECT_EQ(worker[kFieldTextContent].asString(), fields[kFieldTextContent].asString()) << c.name;
+    EXPECT_EQ(PlainTextMediaType(GetFileExtension(c.name, true)), fields[kFieldMediaTypes].asString()) << c.name;
+  }
 }
 
 TEST_F(FormatsTest, TextIsCappedAtTheSettingWhoseDefaultKeepsLongFilesWhole) {
