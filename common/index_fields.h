@@ -72,6 +72,8 @@ inline constexpr char kFieldExposureTime[] = "CORVMDExposureTimeString";
 inline constexpr char kFieldAperture[] = "CORVMDAperture";
 inline constexpr char kFieldResolutionWidthDPI[] = "CORVMDResolutionWidthDPI";
 inline constexpr char kFieldResolutionHeightDPI[] = "CORVMDResolutionHeightDPI";
+inline constexpr char kFieldPixelWidth[] = "CORVMDPixelWidth";
+inline constexpr char kFieldPixelHeight[] = "CORVMDPixelHeight";
 
 // Names a query uses besides the stored fields: the catch-all field (every
 // field whose mapping has "_all" true), and the two orders a search may be

@@ -163,7 +163,7 @@ void AddSearchCommands(CLI::App& app, Output& output) {
   search_cmd->callback([&output] {
     frontend::RequireRunning(frontend::Daemon::kSearch);
     Json::Value answer;
-    elastic::SendRequestWithRetry(answer, SearchRequest(search));
+    elastic::SendRequestWithPatience(answer, SearchRequest(search));
     if (output.json) return PrintJson(answer["data"]);
     PrintHits(search, answer["data"]);
   });
@@ -186,7 +186,7 @@ void AddSearchCommands(CLI::App& app, Output& output) {
     request["data"]["size"] = suggest.size;
     frontend::RequireRunning(frontend::Daemon::kSearch);
     Json::Value answer;
-    elastic::SendRequestWithRetry(answer, request);
+    elastic::SendRequestWithPatience(answer, request);
     if (output.json) return PrintJson(answer["data"]);
     for (const Json::Value& item : answer["data"]["suggestions"]) {
       std::cout << item["term"].asString() << "  (" << item["freq"].asInt64() << ")\n";
@@ -217,7 +217,7 @@ void AddSearchCommands(CLI::App& app, Output& output) {
     request["data"] = data;
     frontend::RequireRunning(frontend::Daemon::kSearch);
     Json::Value answer;
-    elastic::SendRequestWithRetry(answer, request);
+    elastic::SendRequestWithPatience(answer, request);
     if (output.json) return PrintJson(answer["data"]);
     std::vector<std::vector<std::string>> rows;
     for (const Json::Value& hit : answer["data"]["hits"]) {

@@ -244,6 +244,8 @@ TEST_F(FormatsTest, PhotoExifFieldsAndResolutionInCentimetres) {
   EXPECT_EQ("f/2.8", fields[kFieldAperture].asString());
   EXPECT_EQ(300, fields[kFieldResolutionWidthDPI].asInt());
   EXPECT_EQ(240, fields[kFieldResolutionHeightDPI].asInt());
+  EXPECT_EQ(64, fields[kFieldPixelWidth].asInt());
+  EXPECT_EQ(48, fields[kFieldPixelHeight].asInt());
   EXPECT_EQ(1577934245, fields[kFieldContentCreationDate].asInt64());
   EXPECT_EQ("image/jpeg", fields[kFieldMediaTypes].asString());
   EXPECT_FALSE(Extract("photo.jpg", false).isMember(kFieldMake));
@@ -263,6 +265,8 @@ TEST_F(FormatsTest, VideoDurationBitRatesAndCodecs) {
   const Json::Value fields = Extract("clip.mp4");
   EXPECT_NEAR(2.0, fields[kFieldDuration].asDouble(), 0.1);
   EXPECT_EQ("mpeg4 aac", fields[kFieldCodecs].asString());
+  EXPECT_EQ(160, fields[kFieldPixelWidth].asInt());
+  EXPECT_EQ(120, fields[kFieldPixelHeight].asInt());
   EXPECT_GT(fields[kFieldVideoBitRate].asInt(), 0);
   EXPECT_NEAR(64, fields[kFieldAudioBitRate].asInt(), 16);
   EXPECT_GT(fields[kFieldTotalBitRate].asInt(), fields[kFieldVideoBitRate].asInt());

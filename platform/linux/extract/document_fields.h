@@ -23,6 +23,10 @@ bool ContentFieldType(const std::string& name, FieldType* type);
 // that fits in 64 bits, a double field any number).
 bool ValueFitsType(const Json::Value& value, FieldType type);
 
+// Sets the picture's width and height in pixels when both are known (a
+// format that does not say gives 0).
+void SetPixelSize(Json::Value& fields, long width, long height);
+
 }  // namespace extract
 }  // namespace platform
 }  // namespace corvlumex
