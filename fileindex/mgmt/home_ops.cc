@@ -2,6 +2,7 @@
 // switched on and off, and a user's folders follow the user's new name.
 #include "common/file_util.h"
 #include "common/log.h"
+#include "common/path_below.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/mgmt/mgmt_util.h"
@@ -77,7 +78,7 @@ void UserRename(const std::string& user_from, const std::string& user_to) {
   std::vector<std::shared_ptr<Folder>> moved;
   for (const std::shared_ptr<Folder>& folder : FoldersOfShare(folder_mgr, kHomesShare)) {
     const std::string& path = folder->GetPath();
-    if (path != old_home && path.compare(0, old_home.size() + 1, old_home + "/") != 0) continue;
+    if (!IsPathAtOrBelow(path, old_home)) continue;
     Json::Value data = folder->GetData();
     data["path"] = new_home + path.substr(old_home.size());
     auto renamed = std::make_shared<Folder>(data);

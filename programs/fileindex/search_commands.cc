@@ -6,6 +6,7 @@
 #include <sstream>
 
 #include "common/error.h"
+#include "common/index_fields.h"
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/elastic/schema.h"
 #include "fileindex/file_type.h"
@@ -34,7 +35,7 @@ struct SearchArgs {
   unsigned size = 20;
 };
 
-// Points the query's text clauses (those on "_all") at file names only:
+// Points the query's text clauses (those on kFieldAll) at file names only:
 // each word, phrase or prefix becomes a part of the name to find.
 Json::Value NamesOnly(const Json::Value& clause) {
   if (!clause.isObject() || clause.size() != 1) return clause;
@@ -47,9 +48,9 @@ Json::Value NamesOnly(const Json::Value& clause) {
     }
     return out;
   }
-  if ((kind != "match" && kind != "match_phrase" && kind != "prefix") || !body.isMember("_all")) return clause;
+  if ((kind != "match" && kind != "match_phrase" && kind != "prefix") || !body.isMember(kFieldAll)) return clause;
   std::vector<std::string> parts;
-  const std::string text = body["_all"].asString();
+  const std::string text = body[kFieldAll].asString();
   if (kind == "match") {
     std::istringstream words(text);
     for (std::string word; words >> word;) parts.push_back(word);
@@ -59,7 +60,7 @@ Json::Value NamesOnly(const Json::Value& clause) {
   Json::Value out(Json::objectValue);
   for (const std::string& part : parts) {
     Json::Value match(Json::objectValue);
-    match["match"][elastic::kFieldSearchFileName] = part;
+    match["match"][kFieldSearchFileName] = part;
     out["bool"]["must"].append(match);
   }
   return out;
@@ -75,7 +76,7 @@ Json::Value ContentOnly(const Json::Value& clause) {
         out.append(converted);
       } else {
         const std::string key = member.name();
-        out[key == "_all" ? "CORVMDTextContent" : key] = converted;
+        out[key == kFieldAll ? kFieldTextContent : key] = converted;
       }
     }
     return out;
@@ -117,10 +118,10 @@ void PrintHits(const SearchArgs& args, const Json::Value& result) {
   std::vector<std::vector<std::string>> rows;
   for (const Json::Value& hit : hits) {
     const Json::Value& fields = hit["fields"];
-    const bool dir = fields["CORVMDIsDir"].asBool();
-    rows.push_back({fields[elastic::kFieldPath].asString() + (dir ? "/" : ""),
-                    dir ? "-" : HumanSize(fields["CORVMDFSSize"].asInt64()),
-                    HumanTime(fields["CORVMDFSContentChangeDate"].asInt64())});
+    const bool dir = fields[kFieldIsDir].asBool();
+    rows.push_back({fields[kFieldPath].asString() + (dir ? "/" : ""),
+                    dir ? "-" : HumanSize(fields[kFieldFSSize].asInt64()),
+                    HumanTime(fields[kFieldContentChangeDate].asInt64())});
   }
   if (!rows.empty()) PrintTable({"PATH", "SIZE", "MODIFIED"}, rows);
   for (const Json::Value& hit : hits) {
@@ -130,7 +131,7 @@ void PrintHits(const SearchArgs& args, const Json::Value& result) {
       if (c == '\n' || c == '\r' || c == '\t') c = ' ';
     }
     // A file's own control characters are shown escaped; only our bold reaches the terminal.
-    std::cout << "  " << Printable(hit["fields"][elastic::kFieldPath].asString()) << ": "
+    std::cout << "  " << Printable(hit["fields"][kFieldPath].asString()) << ": "
               << PrintableKeeping(snippet, {kBoldOn, kBoldOff}) << "\n";
   }
   const long long total = result["total"].asInt64();
@@ -180,7 +181,7 @@ void AddSearchCommands(CLI::App& app, Output& output) {
     Json::Value request(Json::objectValue);
     request["command"] = "suggest";
     if (!suggest.shares.empty()) request["data"]["ids"] = frontend::IndexIds(suggest.shares);
-    request["data"]["field"] = elastic::kFieldSearchFileName;
+    request["data"]["field"] = kFieldSearchFileName;
     request["data"]["text"] = suggest.text;
     request["data"]["size"] = suggest.size;
     frontend::RequireRunning(frontend::Daemon::kSearch);
@@ -205,12 +206,12 @@ void AddSearchCommands(CLI::App& app, Output& output) {
   failed_cmd->callback([&output] {
     Json::Value data(Json::objectValue);
     if (!failed.shares.empty()) data["ids"] = frontend::IndexIds(failed.shares);
-    data["query"]["qsl"]["term"][elastic::kFieldExtractionFailed] = true;
+    data["query"]["qsl"]["term"][kFieldExtractionFailed] = true;
     data["from"] = failed.from;
     data["size"] = failed.size;
     data["track_total"] = true;
-    data["load_field"].append(elastic::kFieldPath);
-    data["load_field"].append(elastic::kFieldExtractionError);
+    data["load_field"].append(kFieldPath);
+    data["load_field"].append(kFieldExtractionError);
     Json::Value request(Json::objectValue);
     request["command"] = "search";
     request["data"] = data;
@@ -220,7 +221,7 @@ void AddSearchCommands(CLI::App& app, Output& output) {
     if (output.json) return PrintJson(answer["data"]);
     std::vector<std::vector<std::string>> rows;
     for (const Json::Value& hit : answer["data"]["hits"]) {
-      rows.push_back({hit["fields"][elastic::kFieldPath].asString(), hit["fields"][elastic::kFieldExtractionError].asString()});
+      rows.push_back({hit["fields"][kFieldPath].asString(), hit["fields"][kFieldExtractionError].asString()});
     }
     if (!rows.empty()) PrintTable({"PATH", "REASON"}, rows);
     std::cout << answer["data"]["total"].asInt64() << " file(s) whose content could not be read\n";
