@@ -51,7 +51,7 @@ SystemSandbox::SystemSandbox() {
   root_.MakeDir("var/run");
   root_.MakeDir("tmp");
   root_.MakeDir("var/packages/CorvLumex/etc");
-  root_.WriteFile("etc/corvlumex/shares.json", "[{\"name\": \"share\", \"path\": \"" + share_dir_ + "\"}]\n");
+  root_.registry().Add("share", share_dir_);
 }
 
 SystemSandbox::~SystemSandbox() {

@@ -16,7 +16,7 @@
 #include <vector>
 
 #include "tests/support/child_process.h"
-#include "tests/support/log_capture.h"
+#include "tests/support/sandbox.h"
 
 namespace corvlumex {
 namespace testing_support {
@@ -78,7 +78,7 @@ class SystemSandbox {
  private:
   std::set<std::string> Query(const Json::Value& qsl) const;
 
-  SandboxRoot root_;
+  Sandbox root_;
   std::string volume_;
   std::string share_dir_;
   // Started from the system's programs of the build folder.
