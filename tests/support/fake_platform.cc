@@ -13,6 +13,11 @@ int FakePlatform::Refuse(int error_code) {
   return -1;
 }
 
+void FakePlatform::RefuseMonitorQueues() {
+  MonitorQueueUpsertHook = [](auto&&...) { return false; };
+  MonitorQueueDeleteHook = [](auto&&...) { return false; };
+}
+
 ScopedFakePlatform::ScopedFakePlatform() : platform_(std::make_shared<FakePlatform>()) { platform::Install(platform_); }
 
 ScopedFakePlatform::~ScopedFakePlatform() { platform::Install(nullptr); }

@@ -55,6 +55,8 @@ class FakePlatform : public platform::LinuxPlatform {
   // The answers of a full volume and of a refused platform call, with the platform error set.
   static int NoSpace();
   static int Refuse(int error_code);
+  // The notifier's queue configuration cannot be written or removed.
+  void RefuseMonitorQueues();
 };
 
 #undef CORV_FAKE_HOOK

@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 #include <stdlib.h>
+#include <unistd.h>
 
 #include <filesystem>
 #include <fstream>
@@ -56,6 +57,23 @@ bool ShareRegistry::Has(const std::string& name) const {
   return false;
 }
 
+// One entry a line, "name" and "path" first: the shape the run script's
+// registry reader (scripts/lib/system.sh) expects too.
+void ShareRegistry::Save() const {
+  Json::StreamWriterBuilder compact;
+  compact["indentation"] = "";
+  std::string text = "[";
+  for (const Json::Value& entry : entries_) {
+    text += std::string(text.size() > 1 ? ",\n " : "") + "{\"name\": " + Json::writeString(compact, entry["name"]) +
+            ", \"path\": " + Json::writeString(compact, entry["path"]);
+    for (const std::string& member : entry.getMemberNames()) {
+      if (member != "name" && member != "path") text += ", \"" + member + "\": " + Json::writeString(compact, entry[member]);
+    }
+    text += "}";
+  }
+  WriteText(text + "]\n");
+}
+
 void ShareRegistry::WriteText(const std::string& text) const {
   fs::create_directories(fs::path(file_).parent_path());
   std::ofstream(file_, std::ios::binary) << text;
@@ -85,11 +103,12 @@ Sandbox::Sandbox(bool set_root, Layout layout) : path_(MakeRoot()), set_root_(se
 
 Sandbox::~Sandbox() {
   daemon_.reset();
+  std::error_code ignored;
+  if (!tmpfs_volume_.empty()) fs::remove_all(tmpfs_volume_, ignored);
   if (set_root_) {
     if (had_previous_root_) setenv("CORVLUMEX_ROOT", previous_root_.c_str(), 1);
     else unsetenv("CORVLUMEX_ROOT");
   }
-  std::error_code ignored;
   fs::permissions(path_, fs::perms::owner_all, ignored);
   fs::remove_all(path_, ignored);
 }
@@ -108,6 +127,19 @@ std::string Sandbox::WriteFile(const std::string& path, const std::string& conte
 }
 
 std::string Sandbox::Volume(const std::string& volume) const { return fs::canonical(MakeDir(volume)).string(); }
+
+std::string Sandbox::TmpfsVolume() {
+  if (!tmpfs_volume_.empty()) return tmpfs_volume_;
+  std::string pattern = "/dev/shm/corvlumex-test-XXXXXX";
+  if (access("/dev/shm", W_OK) == 0 && mkdtemp(&pattern[0]) != nullptr) return tmpfs_volume_ = pattern;
+  return Volume();
+}
+
+void Sandbox::InstallNoticeTool(const std::string& log_path) const {
+  const std::string tool = WriteFile("usr/corv/bin/corvvxmnotify", "#!/bin/sh\necho \"$*\" >> '" + log_path + "'\n");
+  fs::permissions(tool, fs::perms::owner_all | fs::perms::group_read | fs::perms::group_exec |
+                            fs::perms::others_read | fs::perms::others_exec);
+}
 
 std::string Sandbox::AddShare(const std::string& name, const Json::Value& flags, const std::string& volume) {
   const std::string dir = MakeDir(Volume(volume) + "/" + name);

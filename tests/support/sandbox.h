@@ -36,7 +36,7 @@ class ShareRegistry {
   void WriteText(const std::string& text) const;
 
  private:
-  void Save() const { WriteText(entries_.toStyledString()); }
+  void Save() const;
 
   std::string file_;
   Json::Value entries_{Json::arrayValue};
@@ -64,6 +64,12 @@ class Sandbox {
   // <root>/<volume>, created, with no symbolic link on the way.
   std::string Volume(const std::string& volume = "volume1") const;
   std::string volume() const { return Volume(); }
+  // A volume on tmpfs when there is one (bursts of file changes are quick
+  // there), else <root>/volume1; removed with the sandbox.
+  std::string TmpfsVolume();
+  // A stand-in for the administrators' notice tool: appends its arguments
+  // as one line to `log_path`.
+  void InstallNoticeTool(const std::string& log_path) const;
 
   // Creates <volume>/<name> with its @eaDir and registers it; returns its directory.
   std::string AddShare(const std::string& name, const Json::Value& flags = Json::Value(),
@@ -93,6 +99,7 @@ class Sandbox {
   bool had_previous_root_ = false;
   ShareRegistry registry_;
   std::unique_ptr<FakeDaemon> daemon_;
+  std::string tmpfs_volume_;
 };
 
 }  // namespace testing_support

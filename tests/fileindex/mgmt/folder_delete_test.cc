@@ -134,7 +134,7 @@ TEST_F(FolderDeleteTest, MonitorFailureRestoresTheFolderFile) {
   Add({FolderJson("/photo/a"), FolderJson("/music")});
   const testing_support::SystemSnapshot before = Snapshot();
   ScopedFakePlatform platform;
-  platform->MonitorQueueUpsertHook = platform->MonitorQueueDeleteHook = [](auto&&...) { return false; };
+  platform->RefuseMonitorQueues();
   EXPECT_EQ(ErrorOf([] { FolderDelete(JsonList({"/photo/a", "/music"})); }).code, kErrorSystem);
   EXPECT_EQ(Snapshot(), before);
 }

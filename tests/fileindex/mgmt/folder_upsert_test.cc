@@ -123,7 +123,7 @@ TEST_F(FolderUpsertTest, LateFailurePropagatesAndLeavesEarlierStepsInPlace) {
   const std::string folders_before = ReadFileText(FoldersFile());
   {
     ScopedFakePlatform platform;
-    platform->MonitorQueueUpsertHook = platform->MonitorQueueDeleteHook = [](auto&&...) { return false; };
+    platform->RefuseMonitorQueues();
     const Error error = ErrorOf([] { FolderAdd(JsonList({FolderJson("/photo/a")}), false); });
     EXPECT_EQ(error.code, kErrorSystem);
     EXPECT_EQ(error.reason, "MonitorQueue::Upsert failed, share=photo");

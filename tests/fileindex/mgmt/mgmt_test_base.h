@@ -80,6 +80,7 @@ namespace fileindex {
 using testing_support::FakePlatform;
 using testing_support::FolderJson;
 using testing_support::JsonList;
+using testing_support::JsonOf;
 using testing_support::ScopedFakePlatform;
 using ::testing::ElementsAre;
 }  // namespace fileindex

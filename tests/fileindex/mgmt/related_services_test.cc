@@ -103,7 +103,7 @@ TEST_F(RelatedServicesTest, MonitorConfigurationListsTheShareFoldersOnly) {
 TEST_F(RelatedServicesTest, RefusedMonitorConfigurationIsError502) {
   sandbox_.AddShare("photo");
   ScopedFakePlatform platform;
-  platform->MonitorQueueUpsertHook = platform->MonitorQueueDeleteHook = [](auto&&...) { return false; };
+  platform->RefuseMonitorQueues();
   const FolderMgr folder_mgr;
   ExpectError([&] { UpsertCORVNotifydCfg("photo", folder_mgr); }, kErrorSystem,
               "MonitorQueue::Upsert failed, share=photo",

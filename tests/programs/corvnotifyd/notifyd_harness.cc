@@ -42,22 +42,14 @@ void PrintTo(const QueueLine& line, std::ostream* out) {
 }
 
 NotifydSandbox::NotifydSandbox() {
-  volume_ = "/dev/shm/corvnotifyd-test-XXXXXX";
-  if (access("/dev/shm", W_OK) != 0 || mkdtemp(&volume_[0]) == nullptr) volume_ = root_.MakeDir("vol");
+  volume_ = root_.TmpfsVolume();
   share_ = volume_ + "/share";
   docs_ = share_ + "/docs";
   std::filesystem::create_directories(docs_);
   queue_ = share_ + "/@eaDir/fileindex.queue";
   root_.registry().Add("share", share_);
-  const std::string tool = root_.WriteFile("usr/corv/bin/corvvxmnotify",
-                                           "#!/bin/sh\necho \"$@\" >> \"" + root_.path() + "/notices.log\"\n");
-  chmod(tool.c_str(), 0755);
+  root_.InstallNoticeTool(root_.path() + "/notices.log");
   WriteConfig("fileindex@share.json", queue_, {docs_});
-}
-
-NotifydSandbox::~NotifydSandbox() {
-  std::error_code ignored;
-  std::filesystem::remove_all(volume_, ignored);
 }
 
 void NotifydSandbox::WriteConfig(const std::string& name, const std::string& queue,

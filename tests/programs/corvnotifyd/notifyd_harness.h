@@ -48,7 +48,6 @@ inline bool WaitUntil(const std::function<bool()>& condition,
 class NotifydSandbox {
  public:
   NotifydSandbox();
-  ~NotifydSandbox();
   const std::string& share() const { return share_; }
   const std::string& docs() const { return docs_; }
   const std::string& queue() const { return queue_; }

@@ -19,6 +19,7 @@
 #include "fileindex/elastic/comm.h"
 #include "fileindex/elastic/elastic_control.h"
 #include "tests/support/child_process.h"
+#include "tests/support/frame_client.h"
 #include "tests/support/sandbox.h"
 
 namespace corvlumex {
@@ -120,7 +121,7 @@ class SpotlightHttpTest : public ::testing::Test {
     root_.registry().Add("share", share_);
     search_daemon_ = std::make_unique<ChildProcess>(ProgramPath("corvelasticd"), std::vector<std::string>{"--log-stderr"},
                                                     root_.path() + "/corvelasticd.log");
-    ASSERT_TRUE(PollUntil([&] { return access(ElasticSocketPath().c_str(), F_OK) == 0; }, std::chrono::seconds(20)));
+    ASSERT_TRUE(testing_support::WaitUntilListening(ElasticSocketPath()));
     fileindex::elastic::ShareIndexCreate("share");
     for (int i = 0; i < 5; ++i) {
       Json::Value request(Json::objectValue);
