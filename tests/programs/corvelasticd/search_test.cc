@@ -71,6 +71,7 @@ TEST_F(SearchTest, BadMembersAreRefusedByName) {
       {R"({"size": 1001})", "\"size\" must be 0..1000 and \"from\" at least 0"},
       {R"({"from": -1})", "\"size\" must be 0..1000 and \"from\" at least 0"},
       {R"({"from": 9223372036854775807, "size": 10})", "\"from\" + \"size\" must not exceed 100000"},
+      {R"({"from": 99995, "size": 10})", "\"from\" + \"size\" must not exceed 100000"},
       {R"({"size": "10"})", "\"size\" must be an integer"},
       {R"({"sort": {"field": "size", "order": "up"}})", "\"order\" must be \"asc\" or \"desc\""},
       {R"({"sort": 5})", "\"sort\" must be a field name or {\"field\", \"order\"}"},
