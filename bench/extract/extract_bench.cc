@@ -18,7 +18,7 @@
 #include "platform/linux/extract/parsers/text_sink.h"
 #include "platform/linux/extract/worker_client.h"
 #include "platform/linux/linux_platform.h"
-#include "tests/extract/samples.h"
+#include "tests/support/extract_samples.h"
 
 namespace {
 

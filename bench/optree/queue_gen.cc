@@ -5,7 +5,7 @@
 #include <stdexcept>
 
 #include "fileindex/event.h"
-#include "tests/optree/queue_line.h"
+#include "tests/support/queue_line.h"
 
 namespace corvlumex {
 namespace fileindex {

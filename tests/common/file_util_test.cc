@@ -7,12 +7,12 @@
 
 #include "common/error.h"
 #include "common/file_util.h"
-#include "tests/support/log_capture.h"
+#include "tests/support/sandbox.h"
 
 namespace corvlumex {
 namespace {
 
-using testing_support::SandboxRoot;
+using testing_support::Sandbox;
 
 TEST(PathTextTest, BasenameDirnameExtension) {
   EXPECT_EQ(Dirname("file"), "file");
@@ -33,7 +33,7 @@ TEST(PathTextTest, BasenameDirnameExtension) {
 
 class FileUtilTest : public ::testing::Test {
  protected:
-  SandboxRoot root_{false};
+  Sandbox root_{false};
   std::string Path(const std::string& relative) const { return root_.path() + "/" + relative; }
 };
 
@@ -124,7 +124,7 @@ TEST_F(FileUtilTest, MountPoints) {
 }
 
 TEST_F(FileUtilTest, ChownToTheServiceUserInASandbox) {
-  SandboxRoot sandbox;  // in a sandbox the service user is whoever runs it
+  Sandbox sandbox;  // in a sandbox the service user is whoever runs it
   root_.WriteFile("owned", "x");
   EXPECT_TRUE(ChownCorvLumex(Path("owned")));
   struct stat st;

@@ -6,16 +6,12 @@
 
 #include "common/error.h"
 #include "common/json_util.h"
-#include "tests/support/log_capture.h"
+#include "tests/support/sandbox.h"
 
 namespace corvlumex {
 namespace {
 
-Json::Value Parse(const std::string& text) {
-  Json::Value value;
-  EXPECT_TRUE(JsonFromString(value, text)) << text;
-  return value;
-}
+using testing_support::JsonOf;
 
 template <typename T>
 std::string ReasonOf(const Json::Value& data, const std::string& key, bool required) {
@@ -30,10 +26,10 @@ std::string ReasonOf(const Json::Value& data, const std::string& key, bool requi
 }
 
 TEST(GetJsonValueTest, RequiredReadsReportMissingAndMistypedMembers) {
-  const Json::Value data = Parse(R"({"a":1})");
+  const Json::Value data = JsonOf(R"({"a":1})");
   EXPECT_EQ(ReasonOf<std::string>(data, "path", true), "Missing property: path, data=" + JsonToString(data));
   EXPECT_EQ(ReasonOf<bool>(data, "flag", true), "Missing property: flag, data=" + JsonToString(data));
-  const Json::Value typed = Parse(R"({"n":1.5,"s":"x","o":{}})");
+  const Json::Value typed = JsonOf(R"({"n":1.5,"s":"x","o":{}})");
   // One shared text for every type.
   EXPECT_EQ(ReasonOf<long long>(typed, "n", true), "Not a string, data=" + JsonToString(typed));
   EXPECT_EQ(ReasonOf<int>(typed, "o", true), "Not a string, data=" + JsonToString(typed));
@@ -42,7 +38,7 @@ TEST(GetJsonValueTest, RequiredReadsReportMissingAndMistypedMembers) {
 
 TEST(GetJsonValueTest, NonObjectDataIsRefusedEvenWhenNotRequired) {
   for (const char* text : {"[1,2]", "\"text\"", "3"}) {
-    const Json::Value data = Parse(text);
+    const Json::Value data = JsonOf(text);
     EXPECT_EQ(ReasonOf<std::string>(data, "k", false), "Not an object, data=" + JsonToString(data));
     EXPECT_EQ(ReasonOf<Json::Value>(data, "k", true), "Not an object, data=" + JsonToString(data));
   }
@@ -55,7 +51,7 @@ TEST(GetJsonValueTest, NonRequiredReadsLeaveTheDefault) {
   GetJsonValue(out, Json::Value(), "resume_time", false);
   EXPECT_EQ(out, 42);
   EXPECT_EQ(ReasonOf<int>(Json::Value(), "resume_time", true), "Missing property: resume_time, data=null");
-  const Json::Value data = Parse(R"({"s":[1],"n":"7"})");
+  const Json::Value data = JsonOf(R"({"s":[1],"n":"7"})");
   std::string text = "default";
   GetJsonValue(text, data, "s", false);
   EXPECT_EQ(text, "default");
@@ -65,7 +61,7 @@ TEST(GetJsonValueTest, NonRequiredReadsLeaveTheDefault) {
 }
 
 TEST(GetJsonValueTest, ConversionsFollowTheLibraryRules) {
-  const Json::Value data = Parse(R"({"n":7,"big":9000000000,"b":true,"d":2.5,"v":{"x":[1]}})");
+  const Json::Value data = JsonOf(R"({"n":7,"big":9000000000,"b":true,"d":2.5,"v":{"x":[1]}})");
   long long number = 0;
   GetJsonValue(number, data, "n", true);
   EXPECT_EQ(number, 7);
@@ -84,32 +80,32 @@ TEST(GetJsonValueTest, ConversionsFollowTheLibraryRules) {
 }
 
 TEST(JsonApplyChangesTest, DeepMergeDeletesAndReplaces) {
-  Json::Value target = Parse(R"({"a":1,"o":{"y":2},"l":[2,3],"keep":"k"})");
-  JsonApplyChanges(target, Parse(R"({"a":null,"o":{"x":1},"l":[1],"missing":null})"));
-  EXPECT_EQ(target, Parse(R"({"o":{"x":1,"y":2},"l":[1],"keep":"k"})"));
+  Json::Value target = JsonOf(R"({"a":1,"o":{"y":2},"l":[2,3],"keep":"k"})");
+  JsonApplyChanges(target, JsonOf(R"({"a":null,"o":{"x":1},"l":[1],"missing":null})"));
+  EXPECT_EQ(target, JsonOf(R"({"o":{"x":1,"y":2},"l":[1],"keep":"k"})"));
 
   Json::Value empty(Json::objectValue);
-  JsonApplyChanges(empty, Parse(R"({"o":{}})"));
+  JsonApplyChanges(empty, JsonOf(R"({"o":{}})"));
   ASSERT_TRUE(empty.isMember("o"));
   EXPECT_TRUE(empty["o"].isNull());
 }
 
 TEST(JsonArrayTest, ConvertsBothWays) {
   EXPECT_EQ(Vec2JsonArr<std::string>({}), Json::Value(Json::arrayValue));
-  EXPECT_EQ(Vec2JsonArr<std::string>({"b", "a"}), Parse(R"(["b","a"])"));
-  EXPECT_EQ(JsonArr2Vec<std::string>(Parse(R"(["a",{},"b"])")), (std::vector<std::string>{"a", "b"}));
-  EXPECT_TRUE(JsonArr2Vec<std::string>(Parse(R"({"a":"b"})")).empty());
+  EXPECT_EQ(Vec2JsonArr<std::string>({"b", "a"}), JsonOf(R"(["b","a"])"));
+  EXPECT_EQ(JsonArr2Vec<std::string>(JsonOf(R"(["a",{},"b"])")), (std::vector<std::string>{"a", "b"}));
+  EXPECT_TRUE(JsonArr2Vec<std::string>(JsonOf(R"({"a":"b"})")).empty());
 }
 
 TEST(JsonFileTest, ConveniencesReportSuccess) {
-  testing_support::SandboxRoot root(false);
+  testing_support::Sandbox root(false);
   Json::Value value;
   EXPECT_FALSE(JsonFromString(value, "{"));
   EXPECT_FALSE(JsonFromFile(value, root.path() + "/missing.json"));
   root.WriteFile("bad.json", "{\"a\":");
   EXPECT_FALSE(JsonFromFile(value, root.path() + "/bad.json"));
 
-  const Json::Value stored = Parse(R"({"name":"Ünïcode","n":[1,2]})");
+  const Json::Value stored = JsonOf(R"({"name":"Ünïcode","n":[1,2]})");
   ASSERT_TRUE(JsonToFile(stored, root.path() + "/good.json", 0600));
   ASSERT_TRUE(JsonFromFile(value, root.path() + "/good.json"));
   EXPECT_EQ(value, stored);
@@ -123,17 +119,17 @@ TEST(JsonFileTest, ConveniencesReportSuccess) {
 // with something after the value, a comment or a trailing comma is refused,
 // and the value keeps what it held. Too deep a nesting is invalid, not a throw.
 TEST(JsonFileTest, OnlyValidJsonIsAccepted) {
-  Json::Value value = Parse(R"({"kept":1})");
+  Json::Value value = JsonOf(R"({"kept":1})");
   const std::string deep = std::string(5000, '[') + std::string(5000, ']');
   for (const std::string text : {R"({"a":1} junk)", R"({"a":1}})", "// c\n{}", R"({"a":1} // c)", "[1,]",
                                  R"({"a":1,})", "", "  ", deep.c_str()}) {
     EXPECT_FALSE(JsonFromString(value, text)) << text;
-    EXPECT_EQ(value, Parse(R"({"kept":1})")) << text;
+    EXPECT_EQ(value, JsonOf(R"({"kept":1})")) << text;
   }
   for (const char* text : {"{}\n", " [1, 2] ", "3", "\"text\"", "null"}) {
     EXPECT_TRUE(JsonFromString(value, text)) << text;
   }
-  testing_support::SandboxRoot root(false);
+  testing_support::Sandbox root(false);
   root.WriteFile("extra.json", "{\"a\":1}\n{\"b\":2}\n");
   EXPECT_FALSE(JsonFromFile(value, root.path() + "/extra.json"));
 }
@@ -142,7 +138,7 @@ TEST(JsonFileTest, OnlyValidJsonIsAccepted) {
 // reader must only ever see a whole old or a whole new file. A writer that
 // rewrites in place is caught within a few reads; 60 rounds leave a margin.
 TEST(JsonFileTest, ReaderNeverSeesATornFile) {
-  testing_support::SandboxRoot root(false);
+  testing_support::Sandbox root(false);
   const std::string path = root.path() + "/state.json";
   Json::Value big(Json::arrayValue);
   for (int i = 0; i < 2000; ++i) big.append("entry number " + std::to_string(i));

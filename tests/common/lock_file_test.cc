@@ -9,7 +9,7 @@
 #include "common/error.h"
 #include "common/lock_file.h"
 #include "common/sys.h"
-#include "tests/support/expect_error.h"
+#include "tests/support/sandbox.h"
 
 namespace corvlumex {
 namespace {
@@ -18,11 +18,11 @@ using testing_support::ErrorOf;
 using testing_support::ExpectError;
 using testing_support::LogCapture;
 using testing_support::OpenDescriptors;
-using testing_support::SandboxRoot;
+using testing_support::Sandbox;
 using testing_support::SleepRecorder;
 
 TEST(LockFileTest, MissingFileIsCreatedAndKept) {
-  SandboxRoot root(false);
+  Sandbox root(false);
   const std::string path = root.path() + "/cfg.lock";
   // With no umask in the way the mode is exactly the one the lock asks for:
   // readable by every process that must share (take) the lock.
@@ -38,7 +38,7 @@ TEST(LockFileTest, MissingFileIsCreatedAndKept) {
 }
 
 TEST(LockFileTest, SharedLocksCoexist) {
-  SandboxRoot root(false);
+  Sandbox root(false);
   const std::string path = root.path() + "/cfg.lock";
   SleepRecorder sleeps;
   LockFile first(path, false);
@@ -49,7 +49,7 @@ TEST(LockFileTest, SharedLocksCoexist) {
 // Not reentrant: a second exclusive lock in the same process retries 64
 // times, sleeping after every attempt (also the last), then gives up.
 TEST(LockFileTest, GivesUpAfter64AttemptsWithoutLeakingDescriptors) {
-  SandboxRoot root(false);
+  Sandbox root(false);
   const std::string path = root.path() + "/cfg.lock";
   SleepRecorder sleeps;
   LockFile held(path, true);
@@ -65,7 +65,7 @@ TEST(LockFileTest, GivesUpAfter64AttemptsWithoutLeakingDescriptors) {
 }
 
 TEST(LockFileTest, OpenFailureIsLoggedAndThrown) {
-  SandboxRoot root(false);
+  Sandbox root(false);
   LogCapture log;
   const std::string path = root.path() + "/no/such/dir/cfg.lock";
   const Error error = ErrorOf([&] { LockFile lock(path, true); });
@@ -83,7 +83,7 @@ TEST(LockFileTest, OpenFailureIsLoggedAndThrown) {
 // Two processes: the second waits (really sleeping, the back-off scaled down
 // tenfold) until the first lets go.
 TEST(LockFileTest, SecondProcessGetsTheLockOnceTheFirstReleasesIt) {
-  SandboxRoot root(false);
+  Sandbox root(false);
   const std::string path = root.path() + "/cfg.lock";
   const std::string marker = root.path() + "/marker";
   int ready[2];

@@ -5,50 +5,39 @@
 #include <unistd.h>
 
 #include <fstream>
+#include <tuple>
 
 #include "common/file_util.h"
 #include "platform/linux/linux_platform.h"
 #include "platform/linux/mount_table.h"
-#include "tests/platform/share_sandbox.h"
+#include "tests/support/fake_platform.h"
+#include "tests/support/sandbox.h"
 
 namespace corvlumex {
 namespace platform {
 namespace {
 
+using testing_support::FakePlatform;
 using testing_support::LogCapture;
-using testing_support::SandboxRoot;
+using testing_support::Sandbox;
 
 // Answers statfs and the mount table as a test machine cannot: any magic
-// number and mount type for paths below `prefix_`.
-class FakeMountPlatform : public LinuxPlatform {
- public:
-  FakeMountPlatform(std::string prefix, long magic, std::string type)
-      : prefix_(std::move(prefix)), magic_(magic), type_(std::move(type)) {}
-
- protected:
-  bool StatfsMagic(const std::string& path, long* magic) override {
-    if (!StringStartWith(path, prefix_)) return LinuxPlatform::StatfsMagic(path, magic);
-    *magic = magic_;
-    return true;
-  }
-  std::string MountTypeName(const std::string& path) override {
-    return StringStartWith(path, prefix_) ? type_ : LinuxPlatform::MountTypeName(path);
-  }
-
- private:
-  std::string prefix_;
-  long magic_;
-  std::string type_;
-};
-
+// number and mount type for paths below /fake.
 int TypeOf(long magic, const std::string& mount_type = "") {
-  FakeMountPlatform platform("/fake", magic, mount_type);
+  FakePlatform platform;
+  platform.StatfsMagicHook = [&](const std::string& path, long* answer) {
+    *answer = magic;
+    return StringStartWith(path, "/fake") || platform.RealStatfsMagic(path, answer);
+  };
+  platform.MountTypeNameHook = [&](const std::string& path) {
+    return StringStartWith(path, "/fake") ? mount_type : platform.RealMountTypeName(path);
+  };
   return platform.GetFSType("/fake/dir", 0);
 }
 
 TEST(FsTypeTest, LocalDisksAndTmpAreOrdinaryFileSystems) {
   LinuxPlatform platform;
-  SandboxRoot root(false);
+  Sandbox root(false);
   for (const std::string& path : {root.path(), std::string("/tmp"), std::string("/")}) {
     const int type = platform.GetFSType(path, 0);
     EXPECT_GE(type, 0) << path;
@@ -63,26 +52,18 @@ TEST(FsTypeTest, LocalDisksAndTmpAreOrdinaryFileSystems) {
 }
 
 TEST(FsTypeTest, MagicNumbersAndMountTypes) {
-  EXPECT_EQ(TypeOf(0xEF53), kFsExt);
-  EXPECT_EQ(TypeOf(0x9123683E), kFsBtrfs);
-  EXPECT_EQ(TypeOf(0x58465342), kFsXfs);
-  EXPECT_EQ(TypeOf(0x01021994, "tmpfs"), kFsTmpfs);
-  EXPECT_EQ(TypeOf(0x01021994, "devtmpfs"), kFsPseudo);
-  EXPECT_EQ(TypeOf(0x12345678), kFsUnknown);  // unknown is not refused
-  EXPECT_EQ(TypeOf(0x6969), kFsNfs);
-  EXPECT_EQ(TypeOf(0xFF534D42), kFsSmb);
-  EXPECT_EQ(TypeOf(0xFE534D42), kFsSmb);
-  EXPECT_EQ(TypeOf(0x01021997), kFs9p);
-  EXPECT_EQ(TypeOf(0x00C36400), kFsCeph);
-  EXPECT_EQ(TypeOf(0x65735546, "fuse.sshfs"), kFsFuseNetwork);
-  EXPECT_EQ(TypeOf(0x65735546, "fuse.rclone"), kFsFuseNetwork);
-  EXPECT_EQ(TypeOf(0x65735546, "fuseblk.ntfs-3g"), kFsFuseLocal);
-  EXPECT_EQ(TypeOf(0x65735546, "fuse"), kFsFuseLocal);
-  EXPECT_EQ(TypeOf(0x65735546, "fuse.fuseiso"), kFsIso9660);
-  EXPECT_EQ(TypeOf(0x9660), kFsIso9660);
-  EXPECT_EQ(TypeOf(0x15013346), kFsUdf);
-  EXPECT_EQ(TypeOf(0x73717368), kFsSquashfs);
-  EXPECT_EQ(TypeOf(0x9FA0), kFsPseudo);
+  // An unknown file system (0x12345678) is not refused.
+  for (const auto& [magic, mount_type, type] : std::vector<std::tuple<long, const char*, int>>{
+           {0xEF53, "", kFsExt}, {0x9123683E, "", kFsBtrfs}, {0x58465342, "", kFsXfs},
+           {0x01021994, "tmpfs", kFsTmpfs}, {0x01021994, "devtmpfs", kFsPseudo}, {0x12345678, "", kFsUnknown},
+           {0x6969, "", kFsNfs}, {0xFF534D42, "", kFsSmb}, {0xFE534D42, "", kFsSmb}, {0x01021997, "", kFs9p},
+           {0x00C36400, "", kFsCeph}, {0x65735546, "fuse.sshfs", kFsFuseNetwork},
+           {0x65735546, "fuse.rclone", kFsFuseNetwork}, {0x65735546, "fuseblk.ntfs-3g", kFsFuseLocal},
+           {0x65735546, "fuse", kFsFuseLocal}, {0x65735546, "fuse.fuseiso", kFsIso9660},
+           {0x9660, "", kFsIso9660}, {0x15013346, "", kFsUdf}, {0x73717368, "", kFsSquashfs},
+           {0x9FA0, "", kFsPseudo}}) {
+    EXPECT_EQ(TypeOf(magic, mount_type), type) << std::hex << magic << " " << mount_type;
+  }
 
   LinuxPlatform platform;
   for (int remote : {kFsNfs, kFsSmb, kFsFuseNetwork, kFs9p, kFsCeph, kFsAfs, kFsOtherRemote}) {
@@ -109,7 +90,7 @@ TEST(MountTableTest, FindsTheMountOfAPathAndUnescapesFields) {
 }
 
 TEST(VolumeTest, SnapshotsAreRealSnapshotFolders) {
-  SandboxRoot root(false);
+  Sandbox root(false);
   LinuxPlatform platform;
   const std::string share = root.MakeDir("photo");
   root.MakeDir("photo/#snapshot/daily/a");
@@ -137,27 +118,8 @@ TEST(VolumeTest, HiddenMetadataNames) {
   EXPECT_EQ(platform.EAIsHiddenDir(""), 0);
 }
 
-// A volume with a given amount of free space and user quota.
-class SizedVolumePlatform : public LinuxPlatform {
- public:
-  uint64_t volume_free = 0;
-  bool volume_known = true;
-  bool has_quota = false;
-  uint64_t quota_free = 0;
-
- protected:
-  bool VolumeFreeBytes(const std::string&, uint64_t* free_bytes) override {
-    *free_bytes = volume_free;
-    return volume_known;
-  }
-  bool QuotaFreeBytes(uid_t, const std::string&, uint64_t* free_bytes) override {
-    *free_bytes = quota_free;
-    return has_quota;
-  }
-};
-
 TEST(VolumeTest, FreeSpaceAndTheTwoLackOfSpaceErrors) {
-  SandboxRoot root(false);
+  Sandbox root(false);
   LinuxPlatform real;
   EXPECT_EQ(real.QuotaIsEnough(0, root.path(), 1), 1);
   EXPECT_EQ(LastError().code, kPlatformErrNone);
@@ -166,13 +128,17 @@ TEST(VolumeTest, FreeSpaceAndTheTwoLackOfSpaceErrors) {
   EXPECT_EQ(real.QuotaIsEnough(0, root.path() + "/missing", 1), 0);
   EXPECT_EQ(LastError().code, kPlatformErrSystem);
 
-  SizedVolumePlatform sized;
-  sized.volume_free = 100 << 20;
+  // A volume with a given amount of free space and user quota.
+  FakePlatform sized;
+  uint64_t quota_free = 0;
+  bool has_quota = false;
+  sized.VolumeFreeBytesHook = [](const std::string&, uint64_t* bytes) { return *bytes = 100 << 20, true; };
+  sized.QuotaFreeBytesHook = [&](uid_t, const std::string&, uint64_t* bytes) { return *bytes = quota_free, has_quota; };
   EXPECT_EQ(sized.QuotaIsEnough(0, "/v", 100 << 20), 1);  // exactly enough is enough
   EXPECT_EQ(sized.QuotaIsEnough(0, "/v", (100 << 20) + 1), 0);
   EXPECT_EQ(LastError().code, kPlatformErrNoSpace);
-  sized.has_quota = true;
-  sized.quota_free = 10;
+  has_quota = true;
+  quota_free = 10;
   EXPECT_EQ(sized.QuotaIsEnough(1000, "/v", 11), 0);
   EXPECT_EQ(LastError().code, kPlatformErrQuotaExceeded);
   EXPECT_EQ(sized.QuotaIsEnough(0, "/v", 11), 1);  // the owner has no quota
@@ -180,7 +146,7 @@ TEST(VolumeTest, FreeSpaceAndTheTwoLackOfSpaceErrors) {
 }
 
 TEST(UsersTest, SandboxAccountsAreTheRunningUser) {
-  SandboxRoot root;
+  Sandbox root;
   LinuxPlatform platform;
   UserRecord user;
   ASSERT_TRUE(platform.UserGet("CorvLumex", &user));

@@ -6,14 +6,14 @@
 
 #include "platform/linux/linux_platform.h"
 #include "platform/linux/share_registry.h"
-#include "tests/platform/share_sandbox.h"
+#include "tests/support/sandbox.h"
 
 namespace corvlumex {
 namespace platform {
 namespace {
 
 using testing_support::LogCapture;
-using testing_support::ShareSandbox;
+using testing_support::Sandbox;
 
 std::string Problem(const std::string& text) {
   std::vector<ShareInfo> shares;
@@ -65,7 +65,7 @@ TEST(ShareRegistryTest, FlagsDefaultToFalse) {
 
 class LinuxSharesTest : public ::testing::Test {
  protected:
-  ShareSandbox sandbox_;
+  Sandbox sandbox_;
   LinuxPlatform platform_;
 };
 

@@ -13,13 +13,13 @@
 #include "common/file_util.h"
 #include "common/json_util.h"
 #include "platform/linux/linux_platform.h"
-#include "tests/support/log_capture.h"
+#include "tests/support/sandbox.h"
 
 namespace corvlumex {
 namespace platform {
 namespace {
 
-using testing_support::SandboxRoot;
+using testing_support::Sandbox;
 
 std::string ReadAll(const std::string& path) {
   std::ifstream input(path);
@@ -49,7 +49,7 @@ class ServicesTest : public ::testing::Test {
     return script;
   }
 
-  SandboxRoot root_;
+  Sandbox root_;
   LinuxPlatform platform_;
 };
 

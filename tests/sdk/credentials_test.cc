@@ -12,67 +12,60 @@
 #include "common/error.h"
 #include "common/log.h"
 #include "sdk/credentials.h"
-#include "tests/platform/share_sandbox.h"
-#include "tests/support/expect_error.h"
+#include "tests/support/sandbox.h"
+#include "tests/support/fake_platform.h"
 
 namespace corvlumex {
 namespace sdk {
 namespace {
 
-using platform::LinuxPlatform;
 using testing_support::ErrorOf;
 using testing_support::LogCapture;
-using testing_support::SandboxRoot;
-using testing_support::ScopedPlatform;
+using testing_support::Sandbox;
+using testing_support::ScopedFakePlatform;
 
-// Counts switches, and refuses those to `refused_`.
-class CountingPlatform : public LinuxPlatform {
- public:
-  explicit CountingPlatform(std::string refused = "") : refused_(std::move(refused)) {}
-  bool ResetCredentialsByName(const std::string& name, bool with_groups) override {
-    ++switches;
-    if (name == refused_) {
+// Counts switches in `switches`, and refuses those to `refused`.
+void CountSwitches(ScopedFakePlatform& fake, int* switches, const std::string& refused = "") {
+  fake->ResetCredentialsByNameHook = [&fake, switches, refused](const std::string& name, bool with_groups) {
+    ++*switches;
+    if (name == refused) {
       platform::SetLastError(platform::kPlatformErrCredentials, "test", 1, "refused");
       return false;
     }
-    return LinuxPlatform::ResetCredentialsByName(name, with_groups);
-  }
-  int switches = 0;
-
- private:
-  std::string refused_;
-};
+    return fake->RealResetCredentialsByName(name, with_groups);
+  };
+}
 
 struct passwd* Nobody() { return getpwnam("nobody"); }
 
 TEST(SDKCredentialsTest, UnchangedIdsRestoreNothing) {
-  SandboxRoot root;
-  auto counting = std::make_shared<CountingPlatform>();
-  ScopedPlatform installed(counting);
+  Sandbox root;
+  ScopedFakePlatform installed;
+  int switches = 0;
+  CountSwitches(installed, &switches);
   { SDKCredentials saved; }
-  EXPECT_EQ(counting->switches, 0);
+  EXPECT_EQ(switches, 0);
   {
     SDKCredentials saved;
     saved.AsUser("root");  // the sandbox's "root" is the running user: no change
   }
-  EXPECT_EQ(counting->switches, 1);
+  EXPECT_EQ(switches, 1);
   EXPECT_EQ(geteuid(), getuid());
 }
 
 TEST(SDKCredentialsTest, FailuresAre503) {
-  SandboxRoot root;
-  ScopedPlatform installed(std::make_shared<CountingPlatform>("alice"));
+  Sandbox root;
+  ScopedFakePlatform installed;
+  int switches = 0;
+  CountSwitches(installed, &switches, "alice");
   LogCapture log;
   EXPECT_EQ(ErrorOf([] { SDKCredentials as("alice"); }).code, kErrorSwitchUser);
   EXPECT_EQ(log.Matching("Failed [!ResetCredentialsByName(target_username)]").size(), 1u);
 
-  struct NoUsers : LinuxPlatform {
-    bool UserGetByUID(uid_t, platform::UserRecord*) override {
-      platform::SetLastError(platform::kPlatformErrUserNotFound, "test", 1, "");
-      return false;
-    }
+  installed->UserGetByUIDHook = [](uid_t, platform::UserRecord*) {
+    platform::SetLastError(platform::kPlatformErrUserNotFound, "test", 1, "");
+    return false;
   };
-  ScopedPlatform no_users(std::make_shared<NoUsers>());
   const Error error = ErrorOf([] { SDKCredentials saved; });
   EXPECT_EQ(error.code, kErrorSwitchUser);
   EXPECT_EQ(error.reason, "CORVUserGetByUID failed, err=0x0600");
@@ -97,7 +90,7 @@ class RootCredentialsTest : public ::testing::Test {
 };
 
 TEST_F(RootCredentialsTest, SwitchesToAnotherUserAndBack) {
-  SandboxRoot private_dir(false);
+  Sandbox private_dir(false);
   ASSERT_EQ(chmod(private_dir.path().c_str(), 0700), 0);
   const std::string probe = private_dir.path() + "/probe";
   {
@@ -124,7 +117,7 @@ TEST_F(RootCredentialsTest, SwitchesToAnotherUserAndBack) {
 }
 
 TEST_F(RootCredentialsTest, SwitchesWorkInsideASandboxToo) {
-  SandboxRoot root;
+  Sandbox root;
   {
     SDKCredentials saved;  // "root": the running user of the sandbox
     saved.AsUser("nobody");
@@ -150,7 +143,9 @@ TEST_F(RootCredentialsTest, FailedRestoreEndsTheProcess) {
   EXPECT_DEATH(
       {
         SetLogSink([](int, const std::string& line) { fprintf(stderr, "%s\n", line.c_str()); });
-        ScopedPlatform installed(std::make_shared<CountingPlatform>("root"));
+        ScopedFakePlatform installed;
+        int switches = 0;
+        CountSwitches(installed, &switches, "root");
         SDKCredentials saved;
         saved.AsUser("nobody");
       },

@@ -3,67 +3,22 @@
 
 #include "common/error.h"
 #include "sdk/share.h"
-#include "tests/platform/share_sandbox.h"
-#include "tests/support/expect_error.h"
+#include "tests/support/sandbox.h"
+#include "tests/support/fake_platform.h"
 
 namespace corvlumex {
 namespace sdk {
 namespace {
 
-using platform::LinuxPlatform;
 using platform::ShareInfo;
 using testing_support::ExpectError;
-using testing_support::ScopedPlatform;
-using testing_support::ShareSandbox;
-
-// Every share query fails, as a broken platform library would.
-class FailingSharePlatform : public LinuxPlatform {
- public:
-  int hide_value = 1;
-  int hide_result = 0;
-  bool fail_alloc = false;
-  bool encrypted_answers = false;  // then the read-only check is the one that fails
-
-  int ShareIsEncryptedGet(const ShareInfo& share, int* value) override {
-    return encrypted_answers ? LinuxPlatform::ShareIsEncryptedGet(share, value) : -1;
-  }
-  int ShareIsReadOnlyGet(const ShareInfo&, int*) override { return -1; }
-  int ShareIsEncryptionGet(const ShareInfo&, int*) override { return -1; }
-  int ShareRecycleStatusGet(const ShareInfo&, int*) override { return -1; }
-  int ShareHideUnreadableGet(const ShareInfo&, int* value) override {
-    *value = hide_value;
-    return hide_result;
-  }
-  int QueuePathCompose(const char*, char*, size_t) override { return -1; }
-  int DBPathCompose(const char*, char*, size_t) override { return -1; }
-  int GetIndexID(const char*, char*, size_t) override { return -1; }
-  std::unique_ptr<platform::StringList> StringListAlloc(size_t capacity) override {
-    return fail_alloc ? nullptr : LinuxPlatform::StringListAlloc(capacity);
-  }
-  int ShareEnum(platform::StringList*, int) override { return -1; }
-};
-
-// Reports the given answer and platform error for every space question.
-class SpacePlatform : public LinuxPlatform {
- public:
-  SpacePlatform(int answer, int error) : answer_(answer), error_(error) {}
-  int QuotaIsEnough(uid_t uid, const std::string& path, uint64_t size) override {
-    EXPECT_EQ(uid, 0u);
-    EXPECT_EQ(size, 104857600u);
-    last_path = path;
-    platform::SetLastError(error_, "test", 1, "");
-    return answer_;
-  }
-  std::string last_path;
-
- private:
-  int answer_;
-  int error_;
-};
+using testing_support::JsonOf;
+using testing_support::Sandbox;
+using testing_support::ScopedFakePlatform;
 
 class SDKShareTest : public ::testing::Test {
  protected:
-  ShareSandbox sandbox_;
+  Sandbox sandbox_;
 };
 
 TEST_F(SDKShareTest, UnknownShareIs800) {
@@ -76,15 +31,9 @@ TEST_F(SDKShareTest, UnknownShareIs800) {
 
 TEST_F(SDKShareTest, IndexableOnlyWhenNeitherEncryptedNorReadOnly) {
   const std::string photo = sandbox_.AddShare("photo");
-  Json::Value flags;
-  flags["readonly"] = true;
-  sandbox_.AddShare("archive", flags);
-  flags = Json::Value();
-  flags["encrypted"] = true;
-  flags["recycle_bin"] = true;
-  sandbox_.AddShare("secret", flags);
-  flags["readonly"] = true;
-  sandbox_.AddShare("both", flags);
+  sandbox_.AddShare("archive", JsonOf(R"({"readonly": true})"));
+  sandbox_.AddShare("secret", JsonOf(R"({"encrypted": true, "recycle_bin": true})"));
+  sandbox_.AddShare("both", JsonOf(R"({"encrypted": true, "recycle_bin": true, "readonly": true})"));
 
   const SDKShare share("photo");
   EXPECT_TRUE(share.CanBeIndexed());
@@ -104,10 +53,8 @@ TEST_F(SDKShareTest, IndexableOnlyWhenNeitherEncryptedNorReadOnly) {
 }
 
 TEST_F(SDKShareTest, PrivilegesComeFromThePlatformUnchanged) {
-  Json::Value extra;
-  extra["ftp_privilege"] = platform::kFtpPrivNoUpload;
-  extra["privileges"]["nobody"] = "ro";
-  sandbox_.AddShare("photo", extra);
+  sandbox_.AddShare("photo", JsonOf(R"({"privileges": {"nobody": "ro"}, "ftp_privilege": )" +
+                                    std::to_string(platform::kFtpPrivNoUpload) + "}"));
   const SDKShare share("photo");
   EXPECT_EQ(share.GetFTPPrivilege(), static_cast<uint32_t>(platform::kFtpPrivNoUpload));
   EXPECT_EQ(share.GetPrivilege("nobody"), platform::kSharePrivReadOnly);
@@ -122,12 +69,22 @@ TEST_F(SDKShareTest, EnumIsSorted) {
 
 TEST_F(SDKShareTest, FailedQueriesAre502WithTheirReasons) {
   sandbox_.AddShare("photo");
-  auto failing = std::make_shared<FailingSharePlatform>();
-  ScopedPlatform installed(failing);
+  // Every share query fails, as a broken platform library would.
+  ScopedFakePlatform failing;
+  const auto fail = [](auto&&...) { return -1; };
+  failing->ShareIsEncryptedGetHook = failing->ShareIsReadOnlyGetHook = failing->ShareIsEncryptionGetHook = fail;
+  failing->ShareRecycleStatusGetHook = fail;
+  failing->QueuePathComposeHook = failing->DBPathComposeHook = failing->GetIndexIDHook = fail;
+  failing->ShareEnumHook = fail;
+  int hide_value = 1, hide_result = 0;
+  failing->ShareHideUnreadableGetHook = [&](const ShareInfo&, int* value) {
+    *value = hide_value;
+    return hide_result;
+  };
   const SDKShare share("photo");
   ExpectError([&] { share.CanBeIndexed(); }, kErrorSystem, "KLIBShareis_encryptedGet failed, share=photo",
               "0 > KLIBShareIsEncryptedGet(share_info_, &is_encrypted)");
-  failing->encrypted_answers = true;
+  failing->ShareIsEncryptedGetHook = nullptr;  // now the read-only check is the one that fails
   ExpectError([&] { share.CanBeIndexed(); }, kErrorSystem, "KLIBShareis_readonlyGet failed, share=photo",
               "0 > KLIBShareIsReadOnlyGet(share_info_, &is_readonly)");
   ExpectError([&] { share.IsEncryption(); }, kErrorSystem, "KLIBShareIsEncryptionGet failed, share=photo",
@@ -142,15 +99,15 @@ TEST_F(SDKShareTest, FailedQueriesAre502WithTheirReasons) {
               "0 > FILEIDXGetIndexID(share_info_->szName, name, sizeof(name))");
   ExpectError([] { SDKShare::Enum(); }, kErrorShareEnum, "KLIBShareEnum failed",
               "0 > KLIBShareEnum(&share_list, &enum_func)");
-  failing->fail_alloc = true;
+  failing->StringListAllocHook = [](size_t) { return nullptr; };
   ExpectError([] { SDKShare::Enum(); }, kErrorShareEnum, "", "nullptr == (share_list = KLIBCSzListAlloc(BUFSIZ))");
 
   // Hide-unreadable never throws: only a successful exact 1 is true.
   EXPECT_TRUE(share.IsHideUnReadable());
-  failing->hide_value = 2;
+  hide_value = 2;
   EXPECT_FALSE(share.IsHideUnReadable());
-  failing->hide_value = 1;
-  failing->hide_result = -1;
+  hide_value = 1;
+  hide_result = -1;
   EXPECT_FALSE(share.IsHideUnReadable());
 }
 
@@ -165,23 +122,28 @@ TEST_F(SDKShareTest, OnlyADefiniteLackOfSpaceIsNotEnough) {
   for (const Case& c : {Case{1, 0, true}, Case{0, platform::kPlatformErrNoSpace, false},
                         Case{0, platform::kPlatformErrQuotaExceeded, false}, Case{0, platform::kPlatformErrSystem, true},
                         Case{0, 0, true}, Case{1, platform::kPlatformErrNoSpace, true}}) {
-    auto space = std::make_shared<SpacePlatform>(c.answer, c.error);
-    ScopedPlatform installed(space);
+    ScopedFakePlatform space;
+    std::string asked;
+    space->QuotaIsEnoughHook = [&](uid_t uid, const std::string& path, uint64_t size) {
+      EXPECT_EQ(uid, 0u);
+      EXPECT_EQ(size, 104857600u);
+      asked = path;
+      platform::SetLastError(c.error, "test", 1, "");
+      return c.answer;
+    };
     EXPECT_EQ(SDKShare("photo").IsSpaceEnough(), c.enough) << c.answer << " " << c.error;
-    EXPECT_EQ(space->last_path, photo);
+    EXPECT_EQ(asked, photo);
   }
 }
 
 // A full volume as the Linux platform itself sees it through statvfs.
 TEST_F(SDKShareTest, FullVolumeThroughStatvfs) {
   sandbox_.AddShare("photo");
-  struct FullVolume : LinuxPlatform {
-    bool VolumeFreeBytes(const std::string&, uint64_t* free_bytes) override {
-      *free_bytes = 50 << 20;
-      return true;
-    }
+  ScopedFakePlatform installed;
+  installed->VolumeFreeBytesHook = [](const std::string&, uint64_t* free_bytes) {
+    *free_bytes = 50 << 20;
+    return true;
   };
-  ScopedPlatform installed(std::make_shared<FullVolume>());
   EXPECT_FALSE(SDKShare("photo").IsSpaceEnough());
   EXPECT_EQ(platform::LastError().code, platform::kPlatformErrNoSpace);
 }

@@ -12,6 +12,7 @@
 #include "common/error.h"
 #include "fileindex/communication.h"
 #include "fileindex/frame_reader.h"
+#include "tests/support/child_process.h"
 
 namespace corvlumex {
 namespace testing_support {
@@ -27,6 +28,16 @@ int ConnectTo(const std::string& path) {
     return -1;
   }
   return fd;
+}
+
+bool WaitUntilListening(const std::string& socket, std::chrono::milliseconds timeout) {
+  return PollUntil(
+      [&] {
+        const int fd = ConnectTo(socket);
+        if (fd >= 0) close(fd);
+        return fd >= 0;
+      },
+      timeout);
 }
 
 std::string Frame(const std::string& text) {

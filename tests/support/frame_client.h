@@ -2,6 +2,7 @@
 // test (or a hostile-input benchmark) gives it, and reads the answer frame.
 #pragma once
 
+#include <chrono>
 #include <string>
 
 namespace corvlumex {
@@ -9,6 +10,9 @@ namespace testing_support {
 
 // A connection to the socket (-1 when refused).
 int ConnectTo(const std::string& socket);
+// Polls until `socket` takes connections: its file exists from bind(), before
+// the daemon listens.
+bool WaitUntilListening(const std::string& socket, std::chrono::milliseconds timeout = std::chrono::seconds(20));
 // A frame of `text` (length with the trailing NUL, text, NUL).
 std::string Frame(const std::string& text);
 // Raw bytes in (then the sending side is shut), raw answer text out (""

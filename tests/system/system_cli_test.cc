@@ -258,7 +258,7 @@ TEST(SystemCliTest, TheRunCommandAddsSharesBesideThoseAlreadyIndexed) {
 
   // A registry that lost an indexed share (what rewriting it used to do):
   // the error names the share instead of an empty reason.
-  WriteText(box.root() + "/etc/corvlumex/shares.json", "[{\"name\": \"docs\", \"path\": \"" + box.root() + "/volume2/docs\"}]\n");
+  ShareRegistry(box.root()).Add("docs", box.root() + "/volume2/docs");  // the only share now
   const CliResult broken = RunCli({"folder", "list"});
   EXPECT_NE(broken.status, 0);
   EXPECT_NE(broken.err.find("shares the share registry no longer lists: notes, share"), std::string::npos) << broken.err;

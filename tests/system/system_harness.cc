@@ -10,6 +10,7 @@
 #include "common/json_util.h"
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/index_mgr.h"
+#include "tests/support/frame_client.h"
 #include "tests/system/cli_runner.h"
 
 namespace corvlumex {
@@ -17,10 +18,6 @@ namespace testing_support {
 namespace fs = std::filesystem;
 
 namespace {
-
-bool WaitForSocket(const std::string& path) {
-  return PollUntil([&] { return access(path.c_str(), F_OK) == 0; }, std::chrono::seconds(20));
-}
 
 Json::Value FolderObject(const std::string& relative, bool document, bool audio, bool video, bool photo) {
   Json::Value folder(Json::objectValue);
@@ -43,28 +40,18 @@ void WriteText(const std::string& path, const std::string& content) {
 }
 
 SystemSandbox::SystemSandbox() {
-  // tmpfs keeps bursts of file changes quick; the root holds everything else.
-  std::string pattern = access("/dev/shm", W_OK) == 0 ? "/dev/shm/fileindex-system-XXXXXX" : root() + "/volXXXXXX";
-  volume_ = mkdtemp(&pattern[0]) != nullptr ? pattern : root() + "/volume1";
-  share_dir_ = volume_ + "/share";
+  share_dir_ = root_.TmpfsVolume() + "/share";
   fs::create_directories(share_dir_);
   root_.MakeDir("var/run");
   root_.MakeDir("tmp");
   root_.MakeDir("var/packages/CorvLumex/etc");
-  root_.WriteFile("etc/corvlumex/shares.json", "[{\"name\": \"share\", \"path\": \"" + share_dir_ + "\"}]\n");
+  root_.registry().Add("share", share_dir_);
 }
 
 SystemSandbox::~SystemSandbox() {
   indexer_.reset();
   notifier_.reset();
   search_daemon_.reset();
-  std::error_code ignored;
-  fs::remove_all(volume_, ignored);
-}
-
-void SystemSandbox::InstallNoticeTool(const std::string& log_path) {
-  const std::string tool = root_.WriteFile("usr/corv/bin/corvvxmnotify", "#!/bin/sh\necho \"$*\" >> '" + log_path + "'\n");
-  chmod(tool.c_str(), 0755);
 }
 
 void SystemSandbox::StartAll(const std::vector<std::string>& indexer_args,
@@ -84,7 +71,7 @@ void SystemSandbox::StopNotifier(int signal) {
 
 void SystemSandbox::StartSearchDaemon() {
   search_daemon_ = Launch("corvelasticd", {"--log-stderr"});
-  if (!WaitForSocket(root() + "/var/run/corvelasticd.sock")) throw Error(kErrorSystem, "corvelasticd did not start");
+  if (!WaitUntilListening(root() + "/var/run/corvelasticd.sock")) throw Error(kErrorSystem, "corvelasticd did not start");
 }
 
 void SystemSandbox::StopSearchDaemon(int signal) {
@@ -97,7 +84,7 @@ void SystemSandbox::StartIndexer(const std::vector<std::string>& args) {
   std::vector<std::string> words{"--foreground"};
   words.insert(words.end(), indexer_args_.begin(), indexer_args_.end());
   indexer_ = Launch("fileindexd", words);
-  if (!WaitForSocket(root() + "/var/run/fileindexd.sock")) throw Error(kErrorSystem, "fileindexd did not start");
+  if (!WaitUntilListening(root() + "/var/run/fileindexd.sock")) throw Error(kErrorSystem, "fileindexd did not start");
 }
 
 void SystemSandbox::StopIndexer(int signal) {

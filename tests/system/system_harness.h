@@ -16,7 +16,7 @@
 #include <vector>
 
 #include "tests/support/child_process.h"
-#include "tests/support/log_capture.h"
+#include "tests/support/sandbox.h"
 
 namespace corvlumex {
 namespace testing_support {
@@ -30,9 +30,7 @@ class SystemSandbox {
   const std::string& share_dir() const { return share_dir_; }  // the share "share"
   std::string Path(const std::string& relative) const { return share_dir_ + "/" + relative; }
 
-  // Puts a stand-in for the administrators' notice tool in the sandbox root:
-  // it appends its arguments as one line to `log_path`.
-  void InstallNoticeTool(const std::string& log_path);
+  void InstallNoticeTool(const std::string& log_path) { root_.InstallNoticeTool(log_path); }
   // Starts the three daemons (fileindexd with `indexer_args`) and waits for
   // their sockets.
   void StartAll(const std::vector<std::string>& indexer_args = {},
@@ -78,8 +76,7 @@ class SystemSandbox {
  private:
   std::set<std::string> Query(const Json::Value& qsl) const;
 
-  SandboxRoot root_;
-  std::string volume_;
+  Sandbox root_;
   std::string share_dir_;
   // Started from the system's programs of the build folder.
   std::unique_ptr<ChildProcess> Launch(const std::string& program, const std::vector<std::string>& args,

@@ -1,0 +1,237 @@
+#include "fileindex/elastic/comm.h"
+
+#include <gtest/gtest.h>
+
+#include <memory>
+#include <string>
+#include <type_traits>
+
+#include "common/error.h"
+#include "common/json_util.h"
+#include "common/sys.h"
+#include "fileindex/elastic/daemon_codes.h"
+#include "tests/fileindex/elastic/fake_search_daemon.h"
+#include "tests/support/sandbox.h"
+
+namespace corvlumex {
+namespace {
+
+using testing_support::FakeAnswer;
+using testing_support::FakeSearchDaemon;
+using testing_support::JsonOf;
+using testing_support::LogCapture;
+using testing_support::Sandbox;
+using testing_support::SleepRecorder;
+
+// Runs one exchange and returns the Error it threw (code 0 when none).
+Error ExchangeError(const Json::Value& req) {
+  Json::Value res;
+  return testing_support::ErrorOrNone([&] { SendRequestImpl(res, req); });
+}
+
+class SendRequestTest : public ::testing::Test {
+ protected:
+  Sandbox root_;
+  SleepRecorder sleeps_;
+  LogCapture log_;
+  Json::Value req_ = JsonOf(R"({"command": "index_delete", "data": {"id": "fileindex_music"}})");
+};
+
+TEST_F(SendRequestTest, OneFramedRequestPerConnectionAndTheAnswerIsReturned) {
+  FakeSearchDaemon daemon;
+  daemon.Enqueue(FakeAnswer::Success(JsonOf(R"({"hits": 2})")), 2);
+  Json::Value res;
+  SendRequestImpl(res, req_);
+  SendRequestImpl(res, req_);
+  EXPECT_EQ(res["data"]["hits"].asInt(), 2);
+  ASSERT_EQ(daemon.Requests().size(), 2u);
+  EXPECT_EQ(daemon.Requests()[0], req_);
+  EXPECT_EQ(daemon.Connections(), 2);
+  EXPECT_TRUE(sleeps_.Sleeps().empty());
+  EXPECT_TRUE(log_.Lines().empty());
+}
+
+// The channel goes through the platform's client class, by its own name and
+// through its base; a connection that is not connected refuses to carry.
+TEST_F(SendRequestTest, PlatformConnectionCarriesOneFrameEachWay) {
+  static_assert(std::is_base_of<corvdaemon::SockConnection, corvdaemon::DomainSockConnection>::value,
+                "the Unix-socket client is a socket connection");
+  FakeSearchDaemon daemon;
+  daemon.Enqueue(FakeAnswer::Success(JsonOf(R"({"hits": 1})")));
+  std::string raw;
+  {
+    corvdaemon::DomainSockConnection idle(ElasticSocketPath());
+    EXPECT_FALSE(idle.Send("{}"));
+    EXPECT_FALSE(idle.Recv(raw));
+  }
+  corvdaemon::DomainSockConnection conn(ElasticSocketPath());
+  ASSERT_TRUE(conn.Connect());
+  corvdaemon::SockConnection& base = conn;
+  ASSERT_TRUE(base.Send(JsonToString(req_)));
+  ASSERT_TRUE(base.Recv(raw));
+  Json::Value res;
+  ASSERT_TRUE(JsonFromString(res, raw)) << raw;
+  EXPECT_EQ(res["data"]["hits"].asInt(), 1);
+  ASSERT_EQ(daemon.Requests().size(), 1u);
+  EXPECT_EQ(daemon.Requests()[0], req_);
+}
+
+TEST_F(SendRequestTest, MissingSocketIsWaitedForFifteenSecondsThenConnectFails) {
+  const Error error = ExchangeError(req_);
+  EXPECT_EQ(error.code, kErrorSearchRequest);
+  EXPECT_EQ(error.reason, "Connect failed");
+  ASSERT_EQ(sleeps_.Sleeps().size(), 15u);
+  for (const auto& sleep : sleeps_.Sleeps()) EXPECT_EQ(sleep, std::chrono::seconds(1));
+  const auto waits = log_.Matching("elastic socket is not ready, retry ... ");
+  ASSERT_EQ(waits.size(), 15u);
+  EXPECT_NE(waits.front().find("retry ... 1"), std::string::npos);
+  EXPECT_NE(waits.back().find("retry ... 15"), std::string::npos);
+  const auto failed = log_.Matching("(SendRequestImpl) Failed [!conn.Connect()], reason: Connect failed");
+  EXPECT_EQ(failed.size(), 1u);
+}
+
+TEST_F(SendRequestTest, SocketThatAppearsWhileWaitingIsUsed) {
+  std::unique_ptr<FakeSearchDaemon> daemon;
+  int waits = 0;
+  SetSleepHook([&](std::chrono::microseconds) {
+    if (++waits == 3) daemon = std::make_unique<FakeSearchDaemon>();
+  });
+  Json::Value res;
+  SendRequestImpl(res, req_);
+  SetSleepHook(nullptr);
+  EXPECT_EQ(waits, 3);
+  EXPECT_EQ(daemon->Requests().size(), 1u);
+}
+
+TEST_F(SendRequestTest, SocketFileWithoutListenerFailsToConnect) {
+  root_.WriteFile("var/run/corvelasticd.sock", "");
+  const Error error = ExchangeError(req_);
+  EXPECT_EQ(error.code, kErrorSearchRequest);
+  EXPECT_EQ(error.reason, "Connect failed");
+  EXPECT_TRUE(sleeps_.Sleeps().empty());
+  EXPECT_EQ(log_.Matching("[err: ").size(), 1u) << "the system error is shown";
+}
+
+TEST_F(SendRequestTest, DaemonThatClosesBeforeReadingFailsTheSend) {
+  FakeSearchDaemon daemon;
+  daemon.Enqueue(FakeAnswer::CloseUnread());
+  // Larger than the socket buffer, so the write is still under way when the
+  // daemon closes. SIGPIPE keeps its default here: the send must not kill us.
+  Json::Value big = req_;
+  big["data"]["padding"] = std::string(4 << 20, 'x');
+  const Error error = ExchangeError(big);
+  EXPECT_EQ(error.code, kErrorSearchRequest);
+  EXPECT_EQ(error.reason, "Send failed");
+  EXPECT_EQ(log_.Matching("Failed [!conn.Send(req.toString())], reason: Send failed").size(), 1u);
+}
+
+TEST_F(SendRequestTest, UnusableAnswersFailWithTheRawText) {
+  FakeSearchDaemon daemon;
+  const struct {
+    FakeAnswer answer;
+    std::string raw;
+  } cases[] = {
+      {FakeAnswer::Raw("not json"), "not json"},
+      {FakeAnswer::Raw(R"({"data": {}})"), R"({"data": {}})"},
+      {FakeAnswer::Raw(R"({"success": "true"})"), R"({"success": "true"})"},
+      {FakeAnswer::Raw(R"([true])"), R"([true])"},
+      {FakeAnswer::HangUp(), ""},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.raw);
+    daemon.Enqueue(c.answer);
+    log_.Clear();
+    const Error error = ExchangeError(req_);
+    EXPECT_EQ(error.code, kErrorSearchRequest);
+    EXPECT_EQ(error.reason, "Recv failed, res=" + c.raw);
+    EXPECT_EQ(log_.Matching("Failed [!conn.Recv(resp_raw) || !res.fromString(resp_raw) || "
+                            "!res.isMember(\"success\") || !res[\"success\"].isBool()], reason: Recv failed, res=")
+                  .size(),
+              1u);
+  }
+}
+
+TEST_F(SendRequestTest, FailureAnswersCarryTheDaemonsCodeWithoutALogLineOrAreABadArgument) {
+  FakeSearchDaemon daemon;
+  const struct {
+    const char* answer;
+    int code;
+    const char* reason;  // its start
+  } cases[] = {
+      {R"({"success": false, "error": {"code": 1300, "msg": "no such index"}})", 1300, "Request failed, msg=no such index"},
+      {R"({"success": false, "error": {"code": 1401, "msg": "not ready"}})", elasticd::kCodeOpening, "Request failed, msg=not ready"},
+      {R"({"success": false, "error": {"msg": "x"}})", kErrorBadArgument, "Missing property: code"},
+      {R"({"success": false, "error": {"code": 1300}})", kErrorBadArgument, "Missing property: msg"},
+      {R"({"success": false})", kErrorBadArgument, ""},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.answer);
+    daemon.Enqueue(FakeAnswer::Raw(c.answer));
+    log_.Clear();
+    const Error error = ExchangeError(req_);
+    EXPECT_EQ(error.code, c.code);
+    EXPECT_EQ(error.reason.rfind(c.reason, 0), 0u) << error.reason;
+    if (c.code != kErrorBadArgument) {
+      EXPECT_EQ(error.reason, c.reason);
+      EXPECT_TRUE(log_.Lines().empty());
+    }
+  }
+}
+
+class CompoundTest : public SendRequestTest {
+ protected:
+  Json::Value compound_ = JsonOf(R"({"compound": [
+      {"command": "document_set_by_id", "data": {"id": "fileindex_s", "doc_id": "/v/s/a"}},
+      {"command": "document_set_by_id", "data": {"id": "fileindex_s", "doc_id": "/v/s/b"}},
+      {"command": "document_set_by_id", "data": {"id": "fileindex_s", "doc_id": "/v/s/c"}}]})");
+  FakeSearchDaemon daemon_;
+};
+
+TEST_F(CompoundTest, FailedSubRequestsAreLoggedAndIgnored) {
+  daemon_.Enqueue(FakeAnswer::Raw(R"({"success": true, "has_fail": true, "data": [
+      {"success": true},
+      {"success": false, "error": {"code": 1300, "msg": "no such doc"}},
+      {"success": false, "error": {"code": 1301, "msg": "bad field"}}]})"));
+  Json::Value res;
+  SendRequestImpl(res, compound_);
+  const auto lines = log_.Matching("(SendRequestImpl) Compound failed: ");
+  ASSERT_EQ(lines.size(), 2u);
+  EXPECT_NE(lines[0].find(JsonToString(compound_["compound"][1]) + " (1300) no such doc"), std::string::npos)
+      << lines[0];
+  EXPECT_NE(lines[1].find(" (1301) bad field"), std::string::npos) << lines[1];
+}
+
+TEST_F(CompoundTest, BusySubRequestFailsTheWholeRequestWithTheBareMessage) {
+  daemon_.Enqueue(FakeAnswer::Raw(R"({"success": true, "has_fail": true, "data": [
+      {"success": false, "error": {"code": 1300, "msg": "no such doc"}},
+      {"success": false, "error": {"code": 1400, "msg": "busy"}},
+      {"success": false, "error": {"code": 1300, "msg": "never looked at"}}]})"));
+  const Error error = ExchangeError(compound_);
+  EXPECT_EQ(error.code, elasticd::kCodeBusy);
+  EXPECT_EQ(error.reason, "busy");
+  EXPECT_EQ(log_.Matching("Compound failed").size(), 1u) << "stops at the busy element";
+}
+
+TEST_F(CompoundTest, MalformedSubAnswersCountAsFailedWithoutThrowing) {
+  daemon_.Enqueue(FakeAnswer::Raw(R"({"success": true, "has_fail": true, "data": [
+      5, {"success": "no"}, {"success": false, "error": "oops"}, {"success": false, "error": {"code": "x"}}]})"));
+  EXPECT_EQ(ExchangeError(compound_).code, 0);
+  const auto lines = log_.Matching("Compound failed: ");
+  ASSERT_EQ(lines.size(), 4u);
+  EXPECT_NE(lines[2].find(JsonToString(compound_["compound"][2]) + " (0) "), std::string::npos) << lines[2];
+  EXPECT_NE(lines[3].find("null (0) "), std::string::npos) << "more answers than sub-requests: " << lines[3];
+}
+
+TEST_F(CompoundTest, SubAnswersAreOnlyReadWhenTheDaemonReportsAFailure) {
+  const std::string failing_data = R"("data": [{"success": false, "error": {"code": 1400, "msg": "busy"}}])";
+  daemon_.Enqueue(FakeAnswer::Raw(R"({"success": true, "has_fail": false, )" + failing_data + "}"));
+  daemon_.Enqueue(FakeAnswer::Raw(R"({"success": true, )" + failing_data + "}"));
+  daemon_.Enqueue(FakeAnswer::Raw(R"({"success": true, "has_fail": true, )" + failing_data + "}"));
+  EXPECT_EQ(ExchangeError(compound_).code, 0) << "has_fail false";
+  EXPECT_EQ(ExchangeError(compound_).code, 0) << "has_fail absent";
+  EXPECT_EQ(ExchangeError(req_).code, 0) << "not a compound request";
+  EXPECT_TRUE(log_.Lines().empty());
+}
+
+}  // namespace
+}  // namespace corvlumex

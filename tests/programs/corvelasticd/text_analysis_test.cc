@@ -1,0 +1,166 @@
+// Folding and tokenizing: the rules every stored value and every query go through.
+#include <gtest/gtest.h>
+#include <utf8proc.h>
+
+#include "programs/corvelasticd/daemon_error.h"
+#include "programs/corvelasticd/index_schema.h"
+#include "programs/corvelasticd/query.h"
+#include "programs/corvelasticd/text_analysis.h"
+#include "tests/programs/corvelasticd/daemon_harness.h"
+
+namespace corvlumex {
+namespace elasticd {
+namespace {
+
+std::vector<std::string> Tokens(Analyzer analyzer, const std::string& text) {
+  std::vector<std::string> tokens;
+  Analyze(analyzer, text, &tokens);
+  return tokens;
+}
+
+TEST(FoldTest, DecomposedAndPrecomposedFormsMeetOtherMarksAndBadBytesAreKept) {
+  const struct {
+    std::string text;
+    FoldMode mode;
+    std::string folded;
+  } cases[] = {
+      {"Cafe\xCC\x81", FoldMode::kCase, "caf\xC3\xA9"},
+      {"CAF\xC3\x89", FoldMode::kCase, "caf\xC3\xA9"},
+      {"Cafe\xCC\x81", FoldMode::kSearch, "cafe"},
+      {"Stra\xC3\x9F" "e", FoldMode::kCase, "strasse"},
+      // A kana voicing mark changes the letter: "が" must not become "か".
+      {"\xE3\x81\x8C", FoldMode::kSearch, "\xE3\x81\x8C"},
+      // Invalid UTF-8 is kept, with ASCII lowered.
+      {std::string("AB\xFF\xFE" "C", 5), FoldMode::kSearch, std::string("ab\xFF\xFE" "c", 5)},
+  };
+  for (const auto& c : cases) EXPECT_EQ(Fold(c.text, c.mode), c.folded) << c.text;
+}
+
+// ASCII is split without the Unicode table; each character must still be
+// a word character exactly when its category says so (letters, marks, numbers).
+TEST(AnalyzeTest, EveryAsciiCharacterJoinsOrSplitsWordsByItsUnicodeCategory) {
+  for (int c = 1; c < 0x80; ++c) {
+    const utf8proc_category_t category = utf8proc_category(c);
+    const bool word = c == '_' || (category >= UTF8PROC_CATEGORY_LU && category <= UTF8PROC_CATEGORY_NO);
+    const std::string text = std::string("ab") + static_cast<char>(c) + "cd";
+    const std::vector<std::string> tokens = Tokens(Analyzer::kStandard, text);
+    if (c == '_') {
+      EXPECT_EQ(tokens, std::vector<std::string>({"ab_cd", "ab", "cd"}));
+    } else if (word) {
+      const char lower = static_cast<char>(c >= 'A' && c <= 'Z' ? c + 32 : c);
+      // A capital after a small letter starts a camelCase part.
+      std::vector<std::string> whole = {std::string("ab") + lower + "cd"};
+      if (c >= 'A' && c <= 'Z') whole.insert(whole.end(), {"ab", std::string(1, lower) + "cd"});
+      EXPECT_EQ(tokens, whole) << c;
+    } else {
+      EXPECT_EQ(tokens, std::vector<std::string>({"ab", "cd"})) << c;
+    }
+  }
+}
+
+// The index is handed each field's tokens joined by blanks; the joined form
+// made without a string per token must be that exactly, appended to what
+// the field's earlier values gave.
+TEST(AnalyzeTest, JoinedTokensAreTheTokensJoinedByBlanks) {
+  const struct {
+    Analyzer analyzer;
+    std::string text;
+  } cases[] = {
+      {Analyzer::kStandard, "readFileSync of pthread_mutex_lock, XMLParser 42"},
+      {Analyzer::kStandard, "Caf\xC3\xA9 na\xC3\xAFve \xE6\x9D\xB1\xE4\xBA\xAC"},
+      {Analyzer::kStandard, "a \xCC\x81 B\xCC\x81" "c"},  // a lone mark folds to nothing
+      {Analyzer::kWhitespace, "  Two  WORDS\there "},
+      {Analyzer::kKeyword, "My File.TXT"},
+      {Analyzer::kStandard, " ,;. "},
+  };
+  for (const auto& c : cases) {
+    for (const std::string& before : {std::string(), std::string("earlier")}) {
+      std::string expected = before;
+      for (const std::string& token : Tokens(c.analyzer, c.text)) {
+        if (!expected.empty()) expected += ' ';
+        expected += token;
+      }
+      std::string joined = before;
+      EXPECT_EQ(AnalyzeJoined(c.analyzer, c.text, &joined), !Tokens(c.analyzer, c.text).empty()) << c.text;
+      EXPECT_EQ(joined, expected) << c.text;
+    }
+  }
+}
+
+TEST(AnalyzeTest, KeywordValuesStayWholeWithoutBlanks) {
+  EXPECT_EQ(Tokens(Analyzer::kKeyword, "My File.TXT"), std::vector<std::string>({"my\x1F" "file.txt"}));
+  EXPECT_TRUE(Tokens(Analyzer::kKeyword, "").empty());
+}
+
+TEST(AnalyzeTest, StandardSplitsOnPunctuationAndCjkCharacters) {
+  EXPECT_EQ(Tokens(Analyzer::kStandard, "AC-3 decoder_v2, \xC3\x89t\xC3\xA9!"),
+            std::vector<std::string>({"ac", "3", "decoder_v2", "decoder", "v2", "ete"}));
+  EXPECT_EQ(Tokens(Analyzer::kStandard, "\xE6\x9D\xB1\xE4\xBA\xAC"), std::vector<std::string>({"\xE6\x9D\xB1", "\xE4\xBA\xAC"}));
+}
+
+TEST(AnalyzeTest, JoinedAndCamelCaseWordsGiveTheWholeWordThenEachPart) {
+  const struct {
+    const char* text;
+    std::vector<std::string> tokens;
+  } cases[] = {
+      {"pthread_mutex_lock", {"pthread_mutex_lock", "pthread", "mutex", "lock"}},
+      {"readFileSync", {"readfilesync", "read", "file", "sync"}},
+      {"XMLParser", {"xmlparser", "xml", "parser"}},
+      {"utf8Decode", {"utf8decode", "utf8", "decode"}},
+      {"__init__", {"__init__", "init"}},
+      {"IPv6 iPhone", {"ipv6", "iphone", "i", "phone"}},
+      {"plain Words UPPER", {"plain", "words", "upper"}},
+      {"foo_bar e-mail C++", {"foo_bar", "foo", "bar", "e", "mail", "c"}},
+  };
+  for (const auto& c : cases) EXPECT_EQ(Tokens(Analyzer::kStandard, c.text), c.tokens) << c.text;
+  // Names' words ("white space" fields) are not split.
+  EXPECT_EQ(Tokens(Analyzer::kWhitespace, "read_me.txt"), std::vector<std::string>({"read_me.txt"}));
+}
+
+TEST(AnalyzeTest, WhiteSpaceKeepsPunctuationInsideTokens) {
+  EXPECT_EQ(Tokens(Analyzer::kWhitespace, " Smith,John\tO'Neil "), std::vector<std::string>({"smith,john", "o'neil"}));
+}
+
+TEST(AnalyzeTest, QueryWordsGroupTheirTokens) {
+  const auto groups = AnalyzeQuery(Analyzer::kStandard, "ac-3 tokyo");
+  ASSERT_EQ(groups.size(), 2u);
+  EXPECT_EQ(groups[0], std::vector<std::string>({"ac", "3"}));
+  EXPECT_EQ(groups[1], std::vector<std::string>({"tokyo"}));
+}
+
+TEST(QueryTest, PrefixUpperBoundSkipsTrailingFFBytes) {
+  EXPECT_EQ(PrefixUpperBound("/a/"), "/a0");
+  EXPECT_EQ(PrefixUpperBound(std::string("a\xFF", 2)), "b");
+  EXPECT_EQ(PrefixUpperBound(std::string("\xFF\xFF", 2)), "");
+}
+
+TEST(QueryTest, RankedClauseIsTheFirstRequiredFullTextClause) {
+  const IndexSchema schema = IndexSchema::FromMappings(elasticd_test::LibraryMappings());
+  Json::Value clause;
+  Json::Value text;
+  text["match"]["_all"] = "hello";
+  clause["bool"]["must"].append(text);
+  EXPECT_TRUE(Query::Parse(clause, schema).HasRankedClause());
+  Json::Value should;
+  should["bool"]["should"].append(text);
+  EXPECT_FALSE(Query::Parse(should, schema).HasRankedClause());
+  EXPECT_EQ(Query::Parse(clause, schema).HighlightTokens(), std::set<std::string>({"hello"}));
+}
+
+TEST(SchemaTest, MappingsDecideHowEachFieldIsStored) {
+  const IndexSchema schema = IndexSchema::FromMappings(elasticd_test::LibraryMappings());
+  EXPECT_EQ(schema.property_id(), "CORVMDPath");
+  EXPECT_EQ(schema.Find("CORVMDFSName")->kind, FieldKind::kKeyword);
+  EXPECT_EQ(schema.Find("CORVMDSearchFileName")->kind, FieldKind::kNgram);
+  EXPECT_EQ(schema.Find("CORVMDAuthors")->analyzer, Analyzer::kWhitespace);
+  EXPECT_EQ(schema.Find("CORVMDFSSize")->kind, FieldKind::kNumber);
+  EXPECT_TRUE(schema.Find("CORVMDKeywords")->in_all);
+  EXPECT_FALSE(schema.Find("CORVMDParent")->in_all);
+  Json::Value bad = elasticd_test::LibraryMappings();
+  bad["properties"]["CORVMDTitle"]["analyzer"] = "snowball";
+  EXPECT_THROW(IndexSchema::FromMappings(bad), DaemonError);
+}
+
+}  // namespace
+}  // namespace elasticd
+}  // namespace corvlumex

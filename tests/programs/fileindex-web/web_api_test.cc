@@ -1,0 +1,375 @@
+// The web API against the real system in a sandbox: sessions and CSRF,
+// bad requests, administrators only for management, and each user seeing
+// only the files they can read. The user tests make real accounts (root
+// only) and sign them in through PAM.
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cstdlib>
+#include <filesystem>
+
+#include "common/json_util.h"
+#include "fileindex/index_mgr.h"
+#include "fileindex/status_mgr.h"
+#include "tests/programs/fileindex-web/web_harness.h"
+
+namespace corvlumex {
+namespace testing_support {
+namespace {
+
+namespace fs = std::filesystem;
+
+// Every management call, with a body that would change something.
+const struct {
+  const char* method;
+  const char* path;
+  const char* body;
+} kManagementCalls[] = {
+    {"GET", "/api/folders", ""},
+    {"GET", "/api/folder?path=/share", ""},
+    {"GET", "/api/status", ""},
+    {"GET", "/api/browse?path=/share", ""},
+    {"GET", "/api/failures", ""},
+    {"POST", "/api/folders/add", R"({"path": "/share/new"})"},
+    {"POST", "/api/folders/set", R"({"path": "/share", "document": false})"},
+    {"POST", "/api/folders/delete", R"({"paths": ["/share"]})"},
+    {"POST", "/api/folders/reindex", R"({"paths": ["/share"]})"},
+    {"POST", "/api/pause", R"({"hours": 1})"},
+    {"POST", "/api/resume", "{}"},
+};
+
+Reply Call(WebClient& client, const char* method, const std::string& path, const std::string& body) {
+  return std::string(method) == "GET" ? client.Get(path) : client.Post(path, body);
+}
+
+// What the management calls above would change.
+std::string ManagedState() {
+  Json::Value folders;
+  fileindex::FolderList(folders, 0, 0, "", "", Json::Value(Json::arrayValue));
+  return JsonToString(folders) + " paused=" + std::to_string(fileindex::StatusMgr().GetPauseInfo());
+}
+
+class WebApiTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    sandbox_ = std::make_unique<WebSandbox>(WebArgs());
+    ASSERT_TRUE(sandbox_->WebRunning()) << sandbox_->WebLog();
+    fs::create_directories(sandbox_->Path("docs"));
+    WriteText(sandbox_->Path("docs/public.txt"), "marmalade recipe for everyone");
+    sandbox_->AddFolder("");
+  }
+  virtual std::vector<std::string> WebArgs() { return {}; }
+  void Indexed() {
+    ASSERT_EQ(sandbox_->Converge(sandbox_->DiskPaths("")), "") << sandbox_->Logs();
+  }
+  WebClient Admin() {
+    WebClient client(sandbox_->port());
+    EXPECT_TRUE(client.UseLink(sandbox_->SignInLink()));
+    return client;
+  }
+
+  std::unique_ptr<WebSandbox> sandbox_;
+};
+
+TEST_F(WebApiTest, WithoutALiveSessionNothingAnswersAndNothingChanges) {
+  WebClient signed_out = Admin();
+  const std::string old_cookie = signed_out.cookie;
+  ASSERT_EQ(signed_out.Post("/api/sign-out", "{}").status, 200);
+  signed_out.cookie = old_cookie;  // a copy of the cookie kept after sign-out
+  WebClient forged(sandbox_->port());
+  forged.cookie = std::string(64, 'a');
+  forged.csrf_token = std::string(64, 'b');
+  WebClient none(sandbox_->port());
+  const std::string before = ManagedState();
+  for (WebClient* client : {&none, &forged, &signed_out}) {
+    for (const auto& call : kManagementCalls) {
+      const Reply reply = Call(*client, call.method, call.path, call.body);
+      EXPECT_EQ(reply.status, 401) << call.path << " " << reply.body;
+      EXPECT_FALSE(reply.json["error"]["reason"].asString().empty()) << call.path;
+    }
+    for (const char* read : {"/api/search?q=marmalade", "/api/suggest?q=ma", "/api/shares", "/api/session",
+                             "/api/download?path=" }) {
+      EXPECT_EQ(client->Get(read).status, 401) << read;
+    }
+  }
+  EXPECT_EQ(ManagedState(), before);
+  // The pages themselves load without a session (they show the sign-in form).
+  EXPECT_EQ(none.Get("/sign-in.html").status, 200);
+  EXPECT_EQ(none.Get("/").status, 200);
+}
+
+TEST_F(WebApiTest, ChangesNeedTheSessionsOwnCsrfToken) {
+  WebClient admin = Admin();
+  WebClient other = Admin();  // links are used up: make another
+  const std::string before = ManagedState();
+  const std::string token = admin.csrf_token;
+  const struct {
+    const char* what;
+    std::string token;
+    const char* content_type;
+    int status;
+  } cases[] = {
+      {"no token", "", "application/json", 403},
+      {"a wrong token", std::string(64, '0'), "application/json", 403},
+      {"another session's token", other.csrf_token, "application/json", 403},
+      {"a form post", token, "application/x-www-form-urlencoded", 415},
+  };
+  for (const auto& c : cases) {
+    const Reply reply = admin.PostRaw("/api/pause", R"({"hours": 1})", c.content_type, {{"X-CSRF-Token", c.token}});
+    EXPECT_EQ(reply.status, c.status) << c.what << ": " << reply.body;
+  }
+  EXPECT_EQ(ManagedState(), before);
+  EXPECT_EQ(admin.Post("/api/pause", R"({"hours": 1})").status, 200);
+  EXPECT_GT(fileindex::StatusMgr().GetPauseInfo(), 0);
+}
+
+TEST_F(WebApiTest, ASignInLinkWorksOnce) {
+  const std::string link = sandbox_->SignInLink();
+  WebClient first(sandbox_->port()), second(sandbox_->port());
+  EXPECT_TRUE(first.UseLink(link));
+  EXPECT_FALSE(second.UseLink(link));
+  EXPECT_EQ(second.Get("/api/session").status, 401);
+}
+
+TEST_F(WebApiTest, BadRequestsGetAJsonErrorAndTheDaemonStaysUp) {
+  WebClient admin = Admin();
+  const std::string before = ManagedState();
+  const struct {
+    const char* path;
+    std::string body;
+    int status;
+  } cases[] = {
+      {"/api/folders/add", "{\"path\": ", 400},
+      {"/api/folders/add", "[1, 2]", 400},
+      {"/api/folders/add", R"({"path": "/share/x", "colour": "red"})", 400},
+      {"/api/folders/add", R"({"path": 42})", 400},
+      {"/api/folders/add", R"({"path": "/share/../etc"})", 400},
+      {"/api/folders/set", R"({"path": "/share", "document": "yes"})", 400},
+      {"/api/folders/delete", R"({"paths": "/share"})", 400},
+      {"/api/folders/delete", R"({"paths": []})", 400},
+      {"/api/pause", R"({"hours": -1})", 400},
+      {"/api/pause", R"({"hours": 1e300})", 400},
+      {"/api/pause", R"({"hours": 1} {"hours": 2})", 400},
+      {"/api/pause", std::string(100000, ' '), 413},
+      {"/api/pause", "{\"hours\": " + std::string(5000, '[') , 400},
+      {"/api/sign-in", R"({"user": "root"})", 400},
+      {"/api/nothing-here", "{}", 404},
+  };
+  for (const auto& c : cases) {
+    const Reply reply = admin.Post(c.path, c.body);
+    EXPECT_EQ(reply.status, c.status) << c.path << " " << c.body.substr(0, 60) << ": " << reply.body;
+    EXPECT_FALSE(reply.json["success"].asBool());
+    EXPECT_FALSE(reply.json["error"]["reason"].asString().empty()) << reply.body;
+    EXPECT_FALSE(reply.json["error"]["what_to_do"].asString().empty()) << reply.body;
+  }
+  for (const char* read : {"/api/search?q=%22unclosed", "/api/search?size=100000", "/api/search?from=x",
+                           "/api/search?q=a&q=b", "/api/search?colour=red", "/api/search?category=spreadsheet",
+                           "/api/folders?sort=colour"}) {
+    const Reply reply = admin.Get(read);
+    EXPECT_EQ(reply.status, 400) << read << ": " << reply.body;
+    EXPECT_FALSE(reply.json["error"]["reason"].asString().empty()) << read;
+  }
+  EXPECT_EQ(ManagedState(), before);
+  EXPECT_TRUE(sandbox_->WebRunning());
+  EXPECT_EQ(admin.Get("/api/session").status, 200);
+}
+
+TEST_F(WebApiTest, DownloadsStayInsideIndexedShares) {
+  WebClient admin = Admin();
+  Indexed();
+  fs::create_symlink("/etc/hostname", sandbox_->Path("docs/escape.txt"));
+  fs::create_symlink(sandbox_->Path("docs/public.txt"), sandbox_->Path("docs/inside.txt"));
+  const std::string share = sandbox_->share_dir();
+  const struct {
+    std::string path;
+    int status;
+  } cases[] = {
+      {share + "/docs/public.txt", 200},
+      {share + "/docs/inside.txt", 200},
+      {share + "/docs/escape.txt", 403},
+      {share + "/docs/../docs/public.txt", 400},
+      {"/etc/hostname", 404},
+      {share + "/docs/missing.txt", 404},
+      {share + "/docs", 403},
+      {"docs/public.txt", 400},
+  };
+  for (const auto& c : cases) {
+    const Reply reply = admin.Get("/api/download?path=" + Escape(c.path));
+    EXPECT_EQ(reply.status, c.status) << c.path << ": " << reply.body.substr(0, 200);
+    if (c.status == 200) {
+      EXPECT_EQ(reply.body, "marmalade recipe for everyone");
+    }
+  }
+}
+
+TEST_F(WebApiTest, AnAdministratorCanDoWhatTheCommandLineDoes) {
+  WebClient admin = Admin();
+  Indexed();
+  fs::create_directories(sandbox_->Path("more/deeper"));
+  WriteText(sandbox_->Path("more/deeper/note.txt"), "lighthouse keeper");
+  Reply reply = admin.Get("/api/browse?path=/share");
+  ASSERT_EQ(reply.status, 200) << reply.body;
+  EXPECT_NE(JsonToString(reply.json["data"]).find("/share/more"), std::string::npos) << reply.body;
+  EXPECT_EQ(admin.Post("/api/folders/delete", R"({"paths": ["/share"]})").status, 200);
+  reply = admin.Post("/api/folders/add", R"({"path": "/share/more", "name": "More", "video": false})");
+  ASSERT_EQ(reply.status, 200) << reply.body;
+  reply = admin.Post("/api/folders/add", R"({"path": "/share/more"})");
+  EXPECT_EQ(reply.status, 400);
+  EXPECT_EQ(reply.json["error"]["code"].asInt(), 901) << reply.body;
+  reply = admin.Get("/api/folder?path=/share/more");
+  ASSERT_EQ(reply.status, 200) << reply.body;
+  EXPECT_EQ(reply.json["data"]["name"].asString(), "More");
+  EXPECT_FALSE(reply.json["data"]["video"].asBool());
+  EXPECT_TRUE(reply.json["data"]["document"].asBool());
+  EXPECT_EQ(admin.Post("/api/folders/set", R"({"path": "/share/more", "photo": false})").status, 200);
+  EXPECT_FALSE(admin.Get("/api/folder?path=/share/more").json["data"]["photo"].asBool());
+  EXPECT_TRUE(PollUntil([&] { return admin.Get("/api/search?q=lighthouse").json["data"]["total"].asInt() == 1; },
+                        std::chrono::seconds(30)));
+  EXPECT_EQ(admin.Post("/api/folders/reindex", R"({"paths": ["/share/more"]})").status, 200);
+  reply = admin.Get("/api/folders");
+  ASSERT_EQ(reply.status, 200);
+  EXPECT_EQ(reply.json["data"]["total"].asInt(), 1);
+  reply = admin.Get("/api/status");
+  ASSERT_EQ(reply.status, 200) << reply.body;
+  EXPECT_TRUE(reply.json["data"]["shares"]["share"].isMember("documents")) << reply.body;
+  EXPECT_EQ(admin.Post("/api/pause", R"({"hours": 0})").status, 200);
+  EXPECT_EQ(admin.Get("/api/status").json["data"]["resume_time"].asInt64(), 0);
+  EXPECT_EQ(admin.Post("/api/resume", "{}").status, 200);
+  EXPECT_EQ(admin.Get("/api/status").json["data"]["resume_time"].asInt64(), -1);
+  reply = admin.Post("/api/folders/delete", R"({"paths": ["/share/nowhere"]})");
+  EXPECT_GE(reply.status, 400);
+  EXPECT_FALSE(reply.json["error"]["reason"].asString().empty());
+}
+
+// With a certificate and key the daemon speaks HTTPS only, and its session
+// cookie is marked Secure.
+class WebHttpsTest : public WebApiTest {
+ protected:
+  std::vector<std::string> WebArgs() override {
+    const std::string dir = testing::TempDir() + "/web-tls-" + std::to_string(getpid());
+    fs::create_directories(dir);
+    const std::string make = "openssl req -x509 -newkey rsa:2048 -nodes -subj /CN=127.0.0.1 -days 1 -keyout " + dir +
+                             "/key.pem -out " + dir + "/cert.pem 2>/dev/null";
+    EXPECT_EQ(std::system(make.c_str()), 0);
+    return {"--certificate", dir + "/cert.pem", "--key", dir + "/key.pem"};
+  }
+};
+
+TEST_F(WebHttpsTest, ServesHttpsWithSecureCookies) {
+  const std::string link = sandbox_->SignInLink();
+  ASSERT_EQ(link.compare(0, 8, "https://"), 0) << link;
+  WebClient plain(sandbox_->port());
+  EXPECT_EQ(plain.Get("/api/session").status, 0);  // no answer to plain HTTP
+  WebClient secure(sandbox_->port(), true);
+  const size_t path = link.find("/sign-in");
+  const Reply reply = secure.Get(link.substr(path));
+  EXPECT_EQ(reply.status, 303);
+  EXPECT_NE(reply.header("Set-Cookie").find("; Secure"), std::string::npos) << reply.header("Set-Cookie");
+  EXPECT_NE(reply.header("Set-Cookie").find("HttpOnly; SameSite=Strict"), std::string::npos);
+  EXPECT_EQ(secure.Get("/api/session").status, 200);
+}
+
+// Real accounts: alice administers (a member of the test's admin group),
+// bob does not; each signs in with a password through PAM.
+class WebUsersTest : public WebApiTest {
+ protected:
+  void SetUp() override {
+    if (geteuid() != 0) GTEST_SKIP() << "needs root to create users and sign them in through PAM";
+    const std::string suffix = std::to_string(getpid());
+    alice_ = "cwa" + suffix;
+    bob_ = "cwb" + suffix;
+    group_ = "cwg" + suffix;
+    const std::string script = "groupadd " + group_ + " && useradd -M -N -s /usr/sbin/nologin -G " + group_ + " " + alice_ +
+                               " && useradd -M -N -s /usr/sbin/nologin " + bob_ + " && printf '%s:%s\\n%s:%s\\n' " + alice_ +
+                               " " + kPassword + " " + bob_ + " " + kPassword + " | chpasswd";
+    ASSERT_EQ(std::system(script.c_str()), 0) << script;
+    made_users_ = true;
+    WebApiTest::SetUp();
+    for (const std::string& dir : {sandbox_->share_dir(), fs::path(sandbox_->share_dir()).parent_path().string(),
+                                   sandbox_->Path("docs")}) {
+      chmod(dir.c_str(), 0755);
+    }
+    const std::string secret = sandbox_->Path("docs/alice-only-zanzibar.txt");
+    WriteText(secret, "marmalade zanzibar secret");
+    ASSERT_EQ(std::system(("chown " + alice_ + " " + secret + " && chmod 0600 " + secret).c_str()), 0);
+    Indexed();
+    fileindex::UpdateTermSuggestion();
+  }
+  void TearDown() override {
+    if (!made_users_) return;
+    sandbox_.reset();
+    std::system(("userdel " + alice_ + "; userdel " + bob_ + "; groupdel " + group_).c_str());
+  }
+  std::vector<std::string> WebArgs() override { return {"--admin-group", "cwg" + std::to_string(getpid())}; }
+  WebClient User(const std::string& name) {
+    WebClient client(sandbox_->port());
+    const Reply reply = client.SignIn(name, kPassword);
+    EXPECT_EQ(reply.status, 200) << name << ": " << reply.body << sandbox_->WebLog();
+    return client;
+  }
+
+  static constexpr const char* kPassword = "Corv-Test-Pass-42";
+  std::string alice_, bob_, group_;
+  bool made_users_ = false;
+};
+
+TEST_F(WebUsersTest, AFileReadableByOneUserNeverReachesAnother) {
+  WebClient alice = User(alice_);
+  WebClient bob = User(bob_);
+  const std::string secret = sandbox_->Path("docs/alice-only-zanzibar.txt");
+  const struct {
+    WebClient* who;
+    int marmalade_total;
+    int zanzibar_total;
+    int download_status;
+  } cases[] = {{&alice, 2, 1, 200}, {&bob, 1, 0, 403}};
+  for (const auto& c : cases) {
+    Reply reply = c.who->Get("/api/search?q=marmalade&size=1");
+    ASSERT_EQ(reply.status, 200) << reply.body;
+    EXPECT_EQ(reply.json["data"]["total"].asInt(), c.marmalade_total) << reply.body;
+    reply = c.who->Get("/api/search?q=marmalade&size=100");
+    const std::string text = JsonToString(reply.json["data"]);
+    EXPECT_EQ(text.find("zanzibar") != std::string::npos, c.zanzibar_total > 0) << text;
+    reply = c.who->Get("/api/search?q=zanzibar");
+    EXPECT_EQ(reply.json["data"]["total"].asInt(), c.zanzibar_total) << reply.body;
+    reply = c.who->Get("/api/suggest?q=zanz");
+    ASSERT_EQ(reply.status, 200) << reply.body;
+    EXPECT_EQ(reply.json["data"].size() > 0, c.zanzibar_total > 0) << reply.body;
+    reply = c.who->Get("/api/download?path=" + Escape(secret));
+    EXPECT_EQ(reply.status, c.download_status) << reply.body.substr(0, 200);
+    EXPECT_EQ(reply.body.find("secret") != std::string::npos && c.download_status == 200, c.download_status == 200);
+  }
+}
+
+TEST_F(WebUsersTest, OnlyAdministratorsReachManagementCalls) {
+  WebClient alice = User(alice_);
+  WebClient bob = User(bob_);
+  EXPECT_TRUE(alice.Get("/api/session").json["data"]["admin"].asBool());
+  EXPECT_FALSE(bob.Get("/api/session").json["data"]["admin"].asBool());
+  const std::string before = ManagedState();
+  for (const auto& call : kManagementCalls) {
+    const Reply reply = Call(bob, call.method, call.path, call.body);
+    EXPECT_EQ(reply.status, 403) << call.path << ": " << reply.body;
+  }
+  EXPECT_EQ(ManagedState(), before);
+  EXPECT_EQ(alice.Get("/api/status").status, 200);
+  EXPECT_EQ(alice.Post("/api/pause", R"({"hours": 1})").status, 200);
+  EXPECT_EQ(bob.Get("/api/search?q=marmalade").status, 200);
+}
+
+TEST_F(WebUsersTest, WrongPasswordsSlowTheNextSignInDown) {
+  WebClient client(sandbox_->port());
+  for (int i = 0; i < 3; ++i) EXPECT_EQ(client.SignIn(bob_, "wrong").status, 401);
+  const Reply slowed = client.SignIn(bob_, kPassword);
+  EXPECT_EQ(slowed.status, 429) << slowed.body;
+  EXPECT_FALSE(slowed.header("Retry-After").empty());
+  EXPECT_EQ(client.Get("/api/session").status, 401);
+  // Another account is not slowed by bob's failures.
+  EXPECT_EQ(WebClient(sandbox_->port()).SignIn(alice_, kPassword).status, 200);
+  EXPECT_EQ(WebClient(sandbox_->port()).SignIn("no-such-user-here", kPassword).status, 401);
+}
+
+}  // namespace
+}  // namespace testing_support
+}  // namespace corvlumex

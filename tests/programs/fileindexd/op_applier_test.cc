@@ -1,0 +1,272 @@
+// The operation table of fileindexd, command by command, against a scripted
+// search daemon; extraction is a stand-in platform answer.
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <filesystem>
+#include <fstream>
+#include <functional>
+#include <memory>
+
+#include "common/error.h"
+#include "fileindex/elastic/daemon_codes.h"
+#include "fileindex/folder_mgr.h"
+#include "fileindex/optree.h"
+#include "tests/support/fake_platform.h"
+#include "programs/fileindexd/fresh_lane.h"
+#include "programs/fileindexd/index_rules.h"
+#include "programs/fileindexd/op_applier.h"
+#include "programs/fileindexd/progress.h"
+#include "programs/fileindexd/settle_tracker.h"
+#include "tests/fileindex/elastic/fake_search_daemon.h"
+#include "tests/support/sandbox.h"
+
+namespace corvlumex {
+namespace fileindexd {
+namespace {
+namespace fs = std::filesystem;
+using testing_support::FakeAnswer;
+
+class OpApplierTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    // Extraction without the worker: the document of a file is its path
+    // fields; a file named "broken.c" cannot be read.
+    platform_->ParseFileHook = [](const std::string& path, const Json::Value&, Json::Value& document) {
+      if (fs::path(path).filename() == "broken.c") throw std::runtime_error("not a readable file");
+      document["CORVMDPath"] = path;
+      document["CORVMDFSName"] = fs::path(path).filename().string();
+    };
+    share_ = root_.AddShare("share");
+    root_.MakeDir("volume1/share/docs");
+    root_.WriteFile("var/packages/CorvLumex/etc/fileindex.folders",
+                    R"([{"path": "/share/docs", "name": "docs", "document": false, "audio": true, "video": true, "photo": true}])");
+    folders_ = std::make_unique<fileindex::FolderMgr>();
+    rules_ = std::make_unique<IndexRules>(*folders_, share_);
+    settle_ = std::make_unique<SettleTracker>(root_.path() + "/settle", SettleOptions());
+    applier_ = std::make_unique<OpApplier>("share", *rules_, progress_, *settle_);
+    daemon_.SetHandler(testing_support::AnswerSuccess);
+  }
+
+  std::string Docs(const std::string& name) const { return share_ + "/docs/" + name; }
+  // "command doc_id" (or the query's prefix) of each request.
+  std::vector<std::string> Sent() const {
+    std::vector<std::string> out;
+    for (const Json::Value& request : daemon_.Requests()) {
+      const Json::Value& data = request["data"];
+      std::string target = data["doc_id"].asString();
+      if (target.empty()) target = data["query"]["qsl"]["prefix"]["CORVMDPath"].asString();
+      out.push_back(request["command"].asString() + " " + target);
+    }
+    return out;
+  }
+
+  testing_support::Sandbox root_;
+  testing_support::ScopedFakePlatform platform_;
+  testing_support::LogCapture log_;
+  testing_support::FakeSearchDaemon daemon_;
+  std::string share_;
+  std::unique_ptr<fileindex::FolderMgr> folders_;
+  std::unique_ptr<IndexRules> rules_;
+  ProgressBoard progress_;
+  std::unique_ptr<SettleTracker> settle_;
+  std::unique_ptr<OpApplier> applier_;
+};
+
+using Lines = std::vector<std::string>;
+
+TEST_F(OpApplierTest, UpsertStoresDeletesOrClearsByWhatIsOnDisk) {
+  root_.WriteFile("volume1/share/docs/main.c", "int x;");
+  root_.WriteFile("volume1/share/docs/notes.txt", "documents are off here");
+  applier_->Upsert(Docs("main.c"));
+  applier_->Upsert(Docs("notes.txt"));
+  applier_->Upsert(Docs("gone"));
+  EXPECT_EQ(Sent(), (Lines{"document_upsert_by_id " + Docs("main.c"), "document_del_by_id " + Docs("notes.txt"),
+                                  "document_del_by_id " + Docs("gone"), "document_del_by_query " + Docs("gone") + "/"}));
+}
+
+TEST_F(OpApplierTest, AnAttributeChangeOfAFileNeverStoredStoresItWhole) {
+  root_.WriteFile("volume1/share/docs/a.c", "x");
+  daemon_.Enqueue(FakeAnswer::Failure(elasticd::kCodeDocumentNotFound, "No document with the id"));
+  applier_->Attr(Docs("a.c"));
+  EXPECT_EQ(Sent(), (Lines{"document_set_by_id " + Docs("a.c"), "document_upsert_by_id " + Docs("a.c")}));
+}
+
+TEST_F(OpApplierTest, ARenameWithoutAnOldDocumentIsReadFromDisk) {
+  root_.WriteFile("volume1/share/docs/new.c", "x");
+  daemon_.Enqueue(FakeAnswer::Failure(elasticd::kCodeDocumentNotFound, "No document with the id"));
+  applier_->Rename(Docs("old.c"), Docs("new.c"));
+  EXPECT_EQ(Sent(), (Lines{"document_set_by_id " + Docs("old.c"), "document_del_by_id " + Docs("old.c"),
+                                  "document_del_by_query " + Docs("old.c") + "/", "document_upsert_by_id " + Docs("new.c")}));
+}
+
+// After a crash a rename is applied again over what its first run already
+// moved, or its target has moved on: whatever the index still holds under an
+// old name that is gone from disk is removed, whether the move found a document.
+TEST_F(OpApplierTest, ARenameWhoseSourceIsGoneRemovesWhatIsLeftUnderIt) {
+  root_.WriteFile("volume1/share/docs/C.c", "x");
+  Json::Value below(Json::arrayValue);
+  below.append(Json::Value(Json::objectValue));
+  below[0]["CORVMDPath"] = Docs("B/f.c");
+  below[0]["CORVMDFSName"] = "f.c";
+  below[0]["CORVMDParent"] = Docs("B");
+  const std::string set = "document_set_by_id " + Docs("B");
+  const std::string listed = "document_get_by_query " + Docs("B") + "/";
+  const std::string compound = " ";  // carries no command of its own
+  const std::string del = "document_del_by_id " + Docs("B");
+  const std::string del_below = "document_del_by_query " + Docs("B") + "/";
+  struct Case {
+    const char* name;
+    const char* to;
+    bool old_document;  // B's own document is still there to move
+    Lines expected;
+  };
+  const std::vector<Case> cases = {
+      {"target gone, no old document", "gone", false, Lines{set, del, del_below}},
+      {"target gone, old document moved", "gone", true, Lines{set, listed, compound, del, del_below}},
+      {"target there, old document moved", "C.c", true, Lines{set, listed, compound, del, del_below}},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    const size_t before = daemon_.Requests().size();
+    if (c.old_document) {
+      daemon_.Enqueue(FakeAnswer::Success(Json::Value(Json::objectValue)));
+      daemon_.Enqueue(FakeAnswer::Success(below));
+    } else {
+      daemon_.Enqueue(FakeAnswer::Failure(elasticd::kCodeDocumentNotFound, "No document with the id"));
+    }
+    applier_->Rename(Docs("B"), Docs(c.to));
+    const Lines sent = Sent();
+    EXPECT_EQ(Lines(sent.begin() + before, sent.end()), c.expected);
+  }
+}
+
+// A file with three names, changed through one: the others the index holds
+// get the new document (attributes only for an attribute change); a name
+// that is no longer this file is left to its own events.
+TEST_F(OpApplierTest, AChangeThroughOneHardLinkReachesItsOtherNames) {
+  root_.WriteFile("volume1/share/docs/a.c", "x");
+  root_.WriteFile("volume1/share/docs/other.c", "another file");
+  ASSERT_EQ(link(Docs("a.c").c_str(), Docs("b.c").c_str()), 0);
+  ASSERT_EQ(link(Docs("a.c").c_str(), Docs("c.c").c_str()), 0);
+  Json::Value names(Json::arrayValue);
+  for (const char* name : {"a.c", "b.c", "c.c", "other.c"}) {
+    Json::Value doc(Json::objectValue);
+    doc["CORVMDPath"] = Docs(name);
+    names.append(doc);
+  }
+  struct Case {
+    const char* name;
+    std::function<void()> apply;
+    std::string command;
+  };
+  const std::vector<Case> cases = {
+      {"upsert", [&] { applier_->Upsert(Docs("a.c")); }, "document_upsert_by_id "},
+      {"attributes", [&] { applier_->Attr(Docs("a.c")); }, "document_set_by_id "},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    const size_t before = daemon_.Requests().size();
+    daemon_.Enqueue(FakeAnswer::Success(Json::Value(Json::objectValue)));
+    daemon_.Enqueue(FakeAnswer::Success(names));
+    c.apply();
+    const Lines sent = Sent();
+    EXPECT_EQ(Lines(sent.begin() + before, sent.end()),
+              (Lines{c.command + Docs("a.c"), "document_get_by_query ", c.command + Docs("b.c"), c.command + Docs("c.c")}));
+  }
+  // The query asks for the file's identity, which every stored document carries.
+  const Json::Value query = daemon_.Requests()[1]["data"]["query"]["qsl"]["term"]["CORVMDFSFileID"];
+  EXPECT_TRUE(query.isString() && !query.asString().empty()) << daemon_.Requests()[1];
+  EXPECT_EQ(daemon_.Requests()[0]["data"]["data"]["CORVMDFSFileID"], query);
+}
+
+// The fresh lane reads what the notifier appended to the live queue: the
+// files of a folder with few new lines are stored (or their documents
+// deleted) and committed; bulk folders, renames and folders wait for the
+// in-order pass; a file is refreshed again only when it changed.
+TEST_F(OpApplierTest, TheFreshLaneStoresTheFilesOfSmallGroupsOnly) {
+  const std::string queue = root_.path() + "/fileindex.queue";
+  const auto line = [](int event, const std::string& path, bool is_dir = false) {
+    return R"({"event": )" + std::to_string(event) + R"(, "is_dir": )" + (is_dir ? "true" : "false") +
+           R"(, "path": ")" + path + "\"}\n";
+  };
+  root_.WriteFile("volume1/share/docs/new.c", "fresh");
+  root_.MakeDir("volume1/share/docs/bulk");
+  std::string lines = line(0x40, Docs("new.c")) + line(0x80, Docs("gone.c")) + line(0x40, Docs("bulk"), true) +
+                      R"({"event": 256, "path": ")" + Docs("moved.c") + R"(", "path_old": ")" + Docs("was.c") + "\"}\n";
+  for (int i = 0; i < 9; ++i) {
+    root_.WriteFile("volume1/share/docs/bulk/f" + std::to_string(i) + ".c", "bulk");
+    lines += line(0x40, Docs("bulk/f" + std::to_string(i) + ".c"));
+  }
+  root_.WriteFile("fileindex.queue", lines + R"({"event": 2, "path": ")" + Docs("new"));
+  FreshLane lane("share", queue, *applier_, FreshLaneOptions());
+  EXPECT_EQ(lane.Look(), 2u);
+  EXPECT_EQ(Sent(), (Lines{"document_upsert_by_id " + Docs("new.c"), "document_del_by_id " + Docs("gone.c"), "commit "}));
+
+  // The half line, completed, names the same unchanged file: nothing to do.
+  std::ofstream(queue, std::ios::app) << ".c\"}\n" << line(0x2, Docs("new.c"));
+  EXPECT_EQ(lane.Look(), 0u);
+  // Changed since: stored again.
+  root_.WriteFile("volume1/share/docs/new.c", "fresher and longer");
+  std::ofstream(queue, std::ios::app) << line(0x2, Docs("new.c"));
+  EXPECT_EQ(lane.Look(), 1u);
+  EXPECT_EQ(daemon_.Requests().size(), 5u);
+}
+
+TEST_F(OpApplierTest, ARenameIntoAHiddenFolderRemovesTheDocuments) {
+  root_.MakeDir("volume1/share/docs/@tmp");
+  root_.WriteFile("volume1/share/docs/@tmp/a.c", "x");
+  applier_->Rename(Docs("a.c"), Docs("@tmp/a.c"));
+  EXPECT_EQ(Sent(), (Lines{"document_del_by_id " + Docs("a.c"), "document_del_by_query " + Docs("a.c") + "/",
+                                  "document_del_by_id " + Docs("@tmp/a.c"),
+                                  "document_del_by_query " + Docs("@tmp/a.c") + "/"}));
+}
+
+TEST_F(OpApplierTest, AReindexStoresWhatChangedAndDeletesWhatIsGone) {
+  root_.MakeDir("volume1/share/docs/sub");
+  root_.WriteFile("volume1/share/docs/sub/same.c", "same");
+  root_.WriteFile("volume1/share/docs/sub/new.c", "new");
+  struct stat st;
+  ASSERT_EQ(lstat(Docs("sub/same.c").c_str(), &st), 0);
+  Json::Value listed(Json::arrayValue);
+  Json::Value same(Json::objectValue);
+  same["CORVMDPath"] = Docs("sub/same.c");
+  same["CORVMDFSContentChangeDate"] = static_cast<Json::Int64>(st.st_mtime);
+  same["CORVMDAttributeChangeDate"] = static_cast<Json::Int64>(st.st_ctime);
+  same["CORVMDFSSize"] = static_cast<Json::Int64>(st.st_size);
+  listed.append(same);
+  Json::Value stale(Json::objectValue);
+  stale["CORVMDPath"] = Docs("sub/stale.c");
+  listed.append(stale);
+  daemon_.Enqueue(FakeAnswer::Success(listed));
+  applier_->SetWalkThreads(2);
+  applier_->Reindex(Docs("sub"));
+  Lines commands = Sent();
+  ASSERT_EQ(commands.size(), 4u);
+  EXPECT_EQ(commands[0], "document_get_by_query " + Docs("sub") + "/");
+  std::sort(commands.begin() + 1, commands.begin() + 3);  // the walk's upserts run on two threads
+  EXPECT_EQ(commands[1], "document_upsert_by_id " + Docs("sub"));
+  EXPECT_EQ(commands[2], "document_upsert_by_id " + Docs("sub/new.c"));
+  EXPECT_EQ(commands[3], "document_del_by_id " + Docs("sub/stale.c"));
+}
+
+TEST_F(OpApplierTest, OneFileFailsAloneButAnIndexFailureStopsTheBatch) {
+  root_.WriteFile("volume1/share/docs/broken.c", "x");
+  root_.WriteFile("volume1/share/docs/ok.c", "x");
+  applier_->Upsert(Docs("broken.c"));  // extraction fails: logged and skipped
+  EXPECT_EQ(progress_.Snapshot()["share"]["total_failed"].asUInt64(), 1u);
+  EXPECT_EQ(log_.Matching("upsert of " + Docs("broken.c") + " skipped: code=914").size(), 1u);
+  daemon_.Enqueue(FakeAnswer::Failure(elasticd::kCodeIndexNotFound, "No index fileindex_share"));
+  try {
+    applier_->Upsert(Docs("ok.c"));
+    FAIL() << "a missing index must stop the batch";
+  } catch (const Error& error) {
+    EXPECT_EQ(error.code, elasticd::kCodeIndexNotFound);
+  }
+}
+
+}  // namespace
+}  // namespace fileindexd
+}  // namespace corvlumex
