@@ -16,6 +16,7 @@
 #include "common/error.h"
 #include "tests/support/frame_client.h"
 #include "tests/support/log_capture.h"
+#include "tests/support/sandbox.h"
 
 namespace corvlumex {
 namespace fileindex {
@@ -48,7 +49,7 @@ class UnixListenerTest : public ::testing::Test {
     return std::make_unique<UnixListener>(path_, options);
   }
 
-  testing_support::SandboxRoot root_{false};
+  testing_support::Sandbox root_{false};
   std::string path_ = root_.path() + "/daemon.sock";
 };
 
