@@ -5,17 +5,15 @@
 //
 // SIGTERM or SIGINT stops it after every event read so far is written.
 #include <fcntl.h>
-#include <pthread.h>
-#include <signal.h>
 #include <sys/file.h>
 #include <syslog.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <string>
-#include <thread>
 
 #include "common/error.h"
 #include "common/log.h"
@@ -23,6 +21,7 @@
 #include "platform/linux/config_files.h"
 #include "platform/linux/notifier_presence.h"
 #include "programs/corvnotifyd/notifier.h"
+#include "programs/daemon_support/stop_signals.h"
 
 namespace {
 
@@ -121,29 +120,21 @@ int main(int argc, char** argv) {
     }
   }
 
-  // The signals are taken by one thread, synchronously; every other thread
-  // inherits the block.
-  sigset_t stop_signals;
-  sigemptyset(&stop_signals);
-  sigaddset(&stop_signals, SIGTERM);
-  sigaddset(&stop_signals, SIGINT);
-  pthread_sigmask(SIG_BLOCK, &stop_signals, nullptr);
-  signal(SIGPIPE, SIG_IGN);
+  // The notifier's threads inherit the block.
+  corvlumex::BlockStopSignals();
 
   try {
     corvlumex::notifyd::Notifier notifier(options);
     notifier.Start();
-    std::thread signal_thread([&] {
-      int received = 0;
-      sigwait(&stop_signals, &received);
-      CORV_LOG("stopping on signal %d: writing what is pending", received);
-      notifier.Stop();
-    });
-    CORV_LOG("watching as configured in %s", options.config_dir.c_str());
-    notifier.Run();
-    // Run() also ends when the reader fails: release the signal thread.
-    pthread_kill(signal_thread.native_handle(), SIGTERM);
-    signal_thread.join();
+    {
+      const corvlumex::StopSignalThread stopper([&](int received) {
+        CORV_LOG("stopping on signal %d: writing what is pending", received);
+        notifier.Stop();
+      });
+      CORV_LOG("watching as configured in %s", options.config_dir.c_str());
+      // Run() also ends when the reader fails: leaving the scope releases the signal thread.
+      notifier.Run();
+    }
     CORV_LOG("stopped");
   } catch (const corvlumex::Error& e) {
     CORV_LOG("cannot run: %s", e.what());
