@@ -33,7 +33,7 @@ bool Found(const std::string& share, const std::string& word) {
   request["data"]["size"] = 1;
   Json::Value answer;
   try {
-    elastic::SendRequestWithRetry(answer, request);
+    elastic::SendRequestWithPatience(answer, request);
   } catch (const corvlumex::Error&) {
     return false;
   }

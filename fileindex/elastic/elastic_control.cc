@@ -117,6 +117,19 @@ void SendRequestWithRetry(Json::Value& res, const Json::Value& req) {
   }
 }
 
+void SendRequestWithPatience(Json::Value& res, const Json::Value& req, std::chrono::milliseconds patience) {
+  const auto give_up = std::chrono::steady_clock::now() + patience;
+  for (;;) {
+    try {
+      SendRequestImpl(res, req);
+      return;
+    } catch (const Error& error) {
+      if (!IsElasticBusyCode(error.code) || std::chrono::steady_clock::now() >= give_up) throw;
+    }
+    SleepFor(std::chrono::milliseconds(250));
+  }
+}
+
 void SendRequestNoResult(const Json::Value& req) {
   Json::Value res;
   SendRequestWithRetry(res, req);

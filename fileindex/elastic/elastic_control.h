@@ -6,6 +6,7 @@
 #include <json/json.h>
 #include <sys/types.h>
 
+#include <chrono>
 #include <string>
 #include <vector>
 
@@ -22,6 +23,13 @@ std::string GetFileIndexID(const std::string& share_name);
 void SendRequestWithRetry(Json::Value& res, const Json::Value& req);
 // The same, for commands whose answer is not needed.
 void SendRequestNoResult(const Json::Value& req);
+// For a person waiting for an answer (a search typed at the command line, a
+// status): a busy daemon, most often one still opening an index after its
+// start, is asked again every quarter second for up to `patience`; then its
+// busy error propagates, so the person is told to try again instead of
+// waiting a quarter of an hour in silence.
+void SendRequestWithPatience(Json::Value& res, const Json::Value& req,
+                             std::chrono::milliseconds patience = std::chrono::seconds(10));
 
 // False while the search daemon cannot take the share's requests at once:
 // it does not run, or it is still opening the share's index after a start

@@ -210,6 +210,12 @@ const char kFileIndexMappingsText[] = R"json({
 		"CORVMDExtractionError": {
 			"analyzer": "keyword",
 			"_all": false
+		},
+		"CORVMDPixelWidth": {
+			"type": "int"
+		},
+		"CORVMDPixelHeight": {
+			"type": "int"
 		}
 	}
 })json";

@@ -94,7 +94,10 @@ int LinuxPlatform::ServiceStop(const std::string& name, bool wait) { return Requ
 int LinuxPlatform::ServiceRestart(const std::string& name) {
   if (UnitName(name) != kSambaUnit) return RequestService(this, "restart", name, true);
   if (ServiceCommand() != kSystemctl) return RequestService(this, "reload", name, true);
-  return ServiceResult(Exec("smbcontrol", {"smbd", "reload-config"}, kExecDefault | kExecSearchPath),
+  // Its words ("Can't find pid ...") would land on whatever terminal started
+  // the daemon; the failure is logged with its status instead.
+  return ServiceResult(Exec("smbcontrol", {"smbd", "reload-config"},
+                            kExecDefault | kExecSearchPath | kExecNullStdout | kExecNullStderr),
                        "smbcontrol smbd reload-config");
 }
 

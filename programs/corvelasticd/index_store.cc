@@ -74,15 +74,6 @@ std::vector<std::string> KeysOf(const std::vector<Hit>& hits) {
   return keys;
 }
 
-std::string JoinTokens(const std::vector<std::string>& tokens) {
-  std::string out;
-  for (const std::string& token : tokens) {
-    if (!out.empty()) out += ' ';
-    out += token;
-  }
-  return out;
-}
-
 }  // namespace
 
 std::string IndexStore::DatabasePath(const std::string& directory) { return directory + "/" + kDatabaseName; }
@@ -255,10 +246,11 @@ void IndexStore::IndexEntries(int64_t rowid, const Json::Value& document, bool r
   std::vector<std::string> columns;
   bool any = false;
   for (const FieldSpec* field : text_fields_) {
-    std::vector<std::string> tokens;
-    ForEachValue(document[field->name], [&](const Json::Value& value) { Analyze(field->analyzer, ValueText(value), &tokens); });
-    any = any || !tokens.empty();
-    columns.push_back(JoinTokens(tokens));
+    std::string joined;
+    ForEachValue(document[field->name], [&](const Json::Value& value) {
+      if (AnalyzeJoined(field->analyzer, ValueText(value), &joined)) any = true;
+    });
+    columns.push_back(std::move(joined));
   }
   if (any) pending_index_.Add(remove ? &delete_text_sql_ : &insert_text_sql_, rowid, std::move(columns));
   columns.clear();

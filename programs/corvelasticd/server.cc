@@ -1,6 +1,7 @@
 #include "programs/corvelasticd/server.h"
 
 #include <fcntl.h>
+#include <malloc.h>
 #include <poll.h>
 #include <sys/epoll.h>
 #include <sys/socket.h>
@@ -31,6 +32,8 @@ namespace {
 // Workers started with the server, and the most that stay waiting after a burst.
 constexpr int kStartWorkers = 2;
 constexpr int kMaxIdleWorkers = 4;
+// A request at least this large gives its memory back to the system once answered.
+constexpr size_t kTrimAfterBytes = 1u << 20;
 
 sockaddr_un Address(const std::string& path) {
   sockaddr_un address;
@@ -242,6 +245,14 @@ void Server::Serve(int fd, const PeerIdentity& peer) {
     }
     if (status != FrameStatus::kOk) return;
     SendAnswer(fd, AnswerTo(request, peer));
+    if (request.size() >= kTrimAfterBytes) {
+      // A large document passes through several copies (frame, JSON, tokens)
+      // on whichever connection thread served it; each thread's heap would
+      // keep that peak for good. Handing it back costs little beside the
+      // request itself.
+      std::string().swap(request);
+      malloc_trim(0);
+    }
   }
 }
 

@@ -38,7 +38,9 @@ bool IsCjkCharacter(int32_t cp) {
 }
 
 bool IsWordCharacter(int32_t cp) {
-  if (cp == '_') return true;
+  // ASCII, most of any text, without the table: its letters and digits are
+  // its only characters of the categories below.
+  if (cp < 0x80) return cp == '_' || (cp >= '0' && cp <= '9') || ((cp | 0x20) >= 'a' && (cp | 0x20) <= 'z');
   switch (utf8proc_category(cp)) {
     case UTF8PROC_CATEGORY_LU: case UTF8PROC_CATEGORY_LL: case UTF8PROC_CATEGORY_LT:
     case UTF8PROC_CATEGORY_LM: case UTF8PROC_CATEGORY_LO:
@@ -60,6 +62,11 @@ bool IsBlank(int32_t cp) {
 // Next code point at `pos`; an invalid byte is returned as a code point of
 // its own (negative) and consumes one byte, so no input stops the scan.
 int32_t NextCodePoint(std::string_view text, size_t* pos) {
+  const unsigned char first = static_cast<unsigned char>(text[*pos]);
+  if (first < 0x80) {
+    *pos += 1;
+    return first;
+  }
   utf8proc_int32_t cp = 0;
   const auto* start = reinterpret_cast<const utf8proc_uint8_t*>(text.data() + *pos);
   const utf8proc_ssize_t used = utf8proc_iterate(start, static_cast<utf8proc_ssize_t>(text.size() - *pos), &cp);
@@ -73,8 +80,8 @@ int32_t NextCodePoint(std::string_view text, size_t* pos) {
 
 // Splits folded text into runs: `kind(cp)` says 0 = separator, 1 = part of a
 // word, 2 = a word of its own.
-template <typename Kind>
-void SplitRuns(std::string_view text, Kind kind, const std::function<void(size_t, size_t)>& visit) {
+template <typename Kind, typename Visit>
+void SplitRuns(std::string_view text, Kind kind, const Visit& visit) {
   size_t pos = 0;
   size_t word_start = std::string_view::npos;
   while (pos < text.size()) {
@@ -104,9 +111,9 @@ int WhitespaceKind(int32_t cp) { return IsBlank(cp) ? 0 : 1; }
 bool IsAsciiUpper(char c) { return c >= 'A' && c <= 'Z'; }
 bool IsAsciiLowerOrDigit(char c) { return (c >= 'a' && c <= 'z') || (c >= '0' && c <= '9'); }
 
-}  // namespace
-
-void AddWordParts(std::string_view word, std::vector<std::string>* tokens) {
+// Calls `emit(std::string)` with each folded part of a word that has parts.
+template <typename Emit>
+void ForEachWordPart(std::string_view word, const Emit& emit) {
   std::vector<std::string_view> parts;  // allocated only for a word that has parts
   bool split = false;
   size_t start = 0;
@@ -133,8 +140,10 @@ void AddWordParts(std::string_view word, std::vector<std::string>* tokens) {
   }
   if (!split) return;  // a plain word
   if (start < word.size()) parts.push_back(word.substr(start));
-  for (const std::string_view part : parts) tokens->push_back(Fold(part, FoldMode::kSearch));
+  for (const std::string_view part : parts) emit(Fold(part, FoldMode::kSearch));
 }
+
+}  // namespace
 
 std::string Fold(std::string_view text, FoldMode mode) {
   if (IsAscii(text)) return AsciiLower(text);
@@ -161,20 +170,25 @@ std::string Fold(std::string_view text, FoldMode mode) {
   return std::string(reinterpret_cast<const char*>(buffer.data()), static_cast<size_t>(bytes));
 }
 
-void Analyze(Analyzer analyzer, std::string_view text, std::vector<std::string>* tokens) {
+namespace {
+
+// Calls `emit` with each token of `text`, in order (see Analyze): a
+// std::string or a std::string_view into text that lives only for the call.
+template <typename Emit>
+void ForEachToken(Analyzer analyzer, std::string_view text, const Emit& emit) {
   if (analyzer == Analyzer::kKeyword) {
     if (text.empty()) return;
     std::string token = Fold(text, FoldMode::kCase);
     for (char& c : token) {
       if (c == ' ') c = '\x1F';
     }
-    tokens->push_back(std::move(token));
+    emit(std::move(token));
     return;
   }
   if (analyzer == Analyzer::kWhitespace) {
     const std::string folded = Fold(text, FoldMode::kSearch);
     const std::string_view view(folded);
-    SplitRuns(view, WhitespaceKind, [&](size_t begin, size_t end) { tokens->emplace_back(view.substr(begin, end - begin)); });
+    SplitRuns(view, WhitespaceKind, [&](size_t begin, size_t end) { emit(view.substr(begin, end - begin)); });
     return;
   }
   if (text.find('_') == std::string_view::npos &&
@@ -183,16 +197,36 @@ void Analyze(Analyzer analyzer, std::string_view text, std::vector<std::string>*
     // folding word by word and gives the same words.
     const std::string folded = Fold(text, FoldMode::kSearch);
     const std::string_view view(folded);
-    SplitRuns(view, StandardKind, [&](size_t begin, size_t end) { tokens->emplace_back(view.substr(begin, end - begin)); });
+    SplitRuns(view, StandardKind, [&](size_t begin, size_t end) { emit(view.substr(begin, end - begin)); });
     return;
   }
   // Words are found before folding: the case of the letters marks where a
   // camelCase word's parts meet.
   SplitRuns(text, StandardKind, [&](size_t begin, size_t end) {
     const std::string_view word = text.substr(begin, end - begin);
-    tokens->push_back(Fold(word, FoldMode::kSearch));
-    AddWordParts(word, tokens);
+    emit(Fold(word, FoldMode::kSearch));
+    ForEachWordPart(word, emit);
   });
+}
+
+}  // namespace
+
+void AddWordParts(std::string_view word, std::vector<std::string>* tokens) {
+  ForEachWordPart(word, [tokens](std::string part) { tokens->push_back(std::move(part)); });
+}
+
+void Analyze(Analyzer analyzer, std::string_view text, std::vector<std::string>* tokens) {
+  ForEachToken(analyzer, text, [tokens](auto&& token) { tokens->emplace_back(std::forward<decltype(token)>(token)); });
+}
+
+bool AnalyzeJoined(Analyzer analyzer, std::string_view text, std::string* joined) {
+  bool any = false;
+  ForEachToken(analyzer, text, [&](std::string_view token) {
+    if (!joined->empty()) joined->push_back(' ');
+    joined->append(token);
+    any = true;
+  });
+  return any;
 }
 
 std::vector<std::vector<std::string>> AnalyzeQuery(Analyzer analyzer, std::string_view text) {

@@ -31,6 +31,11 @@ enum class Analyzer {
 // have their blanks replaced by '\x1F' so no token ever holds a blank.
 void Analyze(Analyzer analyzer, std::string_view text, std::vector<std::string>* tokens);
 
+// Appends the tokens of `text` as Analyze gives them to `joined`, each
+// after one blank when `joined` is not empty (the form the full-text index
+// is handed), without a string per token; true when there was a token.
+bool AnalyzeJoined(Analyzer analyzer, std::string_view text, std::string* joined);
+
 // Appends the parts of one word of kStandard when it is joined by '_' or
 // written in camelCase ("pthread_mutex_lock": pthread, mutex, lock;
 // "readFileSync": read, file, sync; "XMLParser": xml, parser), folded;

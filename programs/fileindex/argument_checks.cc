@@ -7,6 +7,7 @@
 
 #include "common/error.h"
 #include "common/sys.h"
+#include "fileindex/elastic/comm.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/util.h"
 #include "programs/fileindex/folder_support.h"
@@ -115,6 +116,10 @@ std::string ReasonOf(int code, const std::string& reason) {
   if (code == kErrorShareEnum) {
     return reason + " (the share registry " + SysPath("/etc/corvlumex/shares.json") +
            " cannot be read; fileindex -v ... shows what is wrong in it)";
+  }
+  if (IsElasticBusyCode(code)) {
+    return reason + " (the search daemon is busy, most often still opening an index after it started; "
+                    "try again in a moment)";
   }
   if (!reason.empty() || code != kErrorShareNotFound) return reason;
   try {

@@ -89,7 +89,7 @@ Json::Value ContentOnly(const Json::Value& clause) {
 Json::Value AskSearchDaemon(const std::function<Json::Value()>& make_request) {
   frontend::RequireRunning(frontend::Daemon::kSearch);
   Json::Value answer;
-  elastic::SendRequestWithRetry(answer, make_request());
+  elastic::SendRequestWithPatience(answer, make_request());
   return answer["data"];
 }
 

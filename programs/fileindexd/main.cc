@@ -32,7 +32,7 @@ int main(int argc, char** argv) {
   std::string socket_path = SysPath(fileindex::kFileIndexDaemonSocketPath);
   bool log_stderr = false;
   bool debug = false;
-  long settle_ms = 1000, settle_max_ms = 60000, poll_ms = 250;
+  long settle_ms = 1000, settle_max_ms = 60000, poll_ms = 250, slice_ms = 1000;
   app.add_option("--socket", socket_path, "command socket (default: <root>/var/run/fileindexd.sock)");
   app.add_flag("--log-stderr,--foreground", log_stderr, "log to standard error instead of syslog");
   app.add_flag("--debug", debug, "also log every queued event as it is read");
@@ -44,6 +44,9 @@ int main(int argc, char** argv) {
       ->check(CLI::Range(1u, 16u));
   app.add_option("--poll-ms", poll_ms, "queue poll when its folder cannot be watched")
       ->check(CLI::Range(10L, 600000L));
+  app.add_option("--slice-ms", slice_ms,
+                 "a long batch is committed, and how far it got saved, after this much work (default 1000)")
+      ->check(CLI::Range(50L, 600000L));
   CLI11_PARSE(app, argc, argv);
 
   // The library's debug lines (one per queued event) only when asked for.
@@ -54,6 +57,7 @@ int main(int argc, char** argv) {
   WorkerOptions options;
   options.fallback_poll = std::chrono::milliseconds(poll_ms);
   options.walk_threads = walk_threads;
+  options.slice = std::chrono::milliseconds(slice_ms);
   options.settle.initial = std::chrono::milliseconds(settle_ms);
   options.settle.ceiling = std::chrono::milliseconds(std::max(settle_ms, settle_max_ms));
   Daemon daemon(options);

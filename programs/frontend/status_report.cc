@@ -68,7 +68,7 @@ Json::Value DocumentCount(const std::string& share) {
   count.size = 0;
   try {
     Json::Value answer;
-    fileindex::elastic::SendRequestWithRetry(answer, SearchRequest(count));
+    fileindex::elastic::SendRequestWithPatience(answer, SearchRequest(count), std::chrono::seconds(2));
     return answer["data"]["total"];
   } catch (const Error&) {
     return Json::Value();

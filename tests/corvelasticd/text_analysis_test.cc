@@ -1,5 +1,6 @@
 // Folding and tokenizing: the rules every stored value and every query go through.
 #include <gtest/gtest.h>
+#include <utf8proc.h>
 
 #include "programs/corvelasticd/daemon_error.h"
 #include "programs/corvelasticd/index_schema.h"
@@ -33,6 +34,57 @@ TEST(FoldTest, DecomposedAndPrecomposedFormsMeetOtherMarksAndBadBytesAreKept) {
       {std::string("AB\xFF\xFE" "C", 5), FoldMode::kSearch, std::string("ab\xFF\xFE" "c", 5)},
   };
   for (const auto& c : cases) EXPECT_EQ(Fold(c.text, c.mode), c.folded) << c.text;
+}
+
+// ASCII is split without the Unicode table; each character must still be
+// a word character exactly when its category says so (letters, marks, numbers).
+TEST(AnalyzeTest, EveryAsciiCharacterJoinsOrSplitsWordsByItsUnicodeCategory) {
+  for (int c = 1; c < 0x80; ++c) {
+    const utf8proc_category_t category = utf8proc_category(c);
+    const bool word = c == '_' || (category >= UTF8PROC_CATEGORY_LU && category <= UTF8PROC_CATEGORY_NO);
+    const std::string text = std::string("ab") + static_cast<char>(c) + "cd";
+    const std::vector<std::string> tokens = Tokens(Analyzer::kStandard, text);
+    if (c == '_') {
+      EXPECT_EQ(tokens, std::vector<std::string>({"ab_cd", "ab", "cd"}));
+    } else if (word) {
+      const char lower = static_cast<char>(c >= 'A' && c <= 'Z' ? c + 32 : c);
+      // A capital after a small letter starts a camelCase part.
+      std::vector<std::string> whole = {std::string("ab") + lower + "cd"};
+      if (c >= 'A' && c <= 'Z') whole.insert(whole.end(), {"ab", std::string(1, lower) + "cd"});
+      EXPECT_EQ(tokens, whole) << c;
+    } else {
+      EXPECT_EQ(tokens, std::vector<std::string>({"ab", "cd"})) << c;
+    }
+  }
+}
+
+// The index is handed each field's tokens joined by blanks; the joined form
+// made without a string per token must be that exactly, appended to what
+// the field's earlier values gave.
+TEST(AnalyzeTest, JoinedTokensAreTheTokensJoinedByBlanks) {
+  const struct {
+    Analyzer analyzer;
+    std::string text;
+  } cases[] = {
+      {Analyzer::kStandard, "readFileSync of pthread_mutex_lock, XMLParser 42"},
+      {Analyzer::kStandard, "Caf\xC3\xA9 na\xC3\xAFve \xE6\x9D\xB1\xE4\xBA\xAC"},
+      {Analyzer::kStandard, "a \xCC\x81 B\xCC\x81" "c"},  // a lone mark folds to nothing
+      {Analyzer::kWhitespace, "  Two  WORDS\there "},
+      {Analyzer::kKeyword, "My File.TXT"},
+      {Analyzer::kStandard, " ,;. "},
+  };
+  for (const auto& c : cases) {
+    for (const std::string& before : {std::string(), std::string("earlier")}) {
+      std::string expected = before;
+      for (const std::string& token : Tokens(c.analyzer, c.text)) {
+        if (!expected.empty()) expected += ' ';
+        expected += token;
+      }
+      std::string joined = before;
+      EXPECT_EQ(AnalyzeJoined(c.analyzer, c.text, &joined), !Tokens(c.analyzer, c.text).empty()) << c.text;
+      EXPECT_EQ(joined, expected) << c.text;
+    }
+  }
 }
 
 TEST(AnalyzeTest, KeywordValuesStayWholeWithoutBlanks) {

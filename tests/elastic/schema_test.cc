@@ -28,7 +28,9 @@ const std::vector<std::string> kFields = {
     "CORVMDFinderOpenDate", "CORVMDLogicalSize", "CORVMDPhysicalSize", "CORVMDDateAdded", "CORVMDSearchFileName",
     "CORVMDStarRating", "_CORVMDUserTags", "CORVMDSpotlightBoost", "CORVMDFSFileID",
     // Added after the original set: marks a file whose content could not be read.
-    "CORVMDExtractionFailed", "CORVMDExtractionError"};
+    "CORVMDExtractionFailed", "CORVMDExtractionError",
+    // Picture and film sizes in pixels, asked for by Finder searches.
+    "CORVMDPixelWidth", "CORVMDPixelHeight"};
 
 // What differs from the defaults, by kind: the type, the analyzer, and
 // whether the field is left out of the catch-all "_all".
@@ -40,7 +42,7 @@ const std::map<std::string, std::vector<std::string>> kTypes = {
              "CORVMDRecordingYear", "CORVMDAudioBitRate", "CORVMDTotalBitRate", "CORVMDVideoBitRate",
              "CORVMDAudioSampleRate", "CORVMDAudioChannelCount", "CORVMDISOSpeed", "CORVMDResolutionWidthDPI",
              "CORVMDResolutionHeightDPI", "CORVMDFinderLabel", "CORVMDFinderOpenDate", "CORVMDLogicalSize",
-             "CORVMDPhysicalSize", "CORVMDDateAdded"}},
+             "CORVMDPhysicalSize", "CORVMDDateAdded", "CORVMDPixelWidth", "CORVMDPixelHeight"}},
     {"text", {"CORVMDAuthors", "CORVMDTitle", "CORVMDAlbum", "CORVMDIdentifier", "CORVMDCreator", "CORVMDMusicalGenre",
               "CORVMDComposer", "CORVMDComment", "CORVMDCodecs", "CORVMDDescription", "CORVMDAcquisitionMake",
               "CORVMDAcquisitionModel", "CORVMDTextContent", "CORVMDSearchFileName", "_CORVMDUserTags",

@@ -5,10 +5,12 @@
 #include <gtest/gtest.h>
 #include <unistd.h>
 
+#include "common/file_util.h"
 #include "platform/linux/extract/document_fields.h"
 #include "platform/linux/extract/parsers/extract_content.h"
 #include "platform/linux/extract/parsers/formats.h"
 #include "platform/linux/extract/parsers/text_sink.h"
+#include "platform/linux/extract/plain_text.h"
 #include "tests/extract/samples.h"
 #include "tests/support/log_capture.h"
 
@@ -65,6 +67,45 @@ TEST_F(FormatsTest, TextWithoutKnownExtensionIsReadByItsMediaType) {
   const Json::Value binary = Extract("blob.bin");
   EXPECT_FALSE(binary.isMember(kFieldTextContent));
   EXPECT_NE("", binary[kFieldMediaTypes].asString());
+}
+
+// Plain text the indexer reads itself must give the very text the worker
+// would; whatever needs an encoding guess or a parser is left to the worker.
+TEST_F(FormatsTest, PlainTextReadInProcessGivesTheWorkersTextOrIsLeftToIt) {
+  const struct {
+    const char* name;
+    std::string bytes;
+    bool in_process;
+  } cases[] = {
+      {"notes.txt", "  Caf\xC3\xA9 cr\xC3\xA8me\r\n\tsecond\x01line\x7F end \n", true},
+      {"marked.md", "\xEF\xBB\xBF# Title\nbody \xFF broken", true},
+      {"cut.h", "int x; // \xE2\x82", true},
+      {"Upper.PM", "package Upper; 1;", true},
+      {"blank.c", " \n\t\n", true},
+      {"latin.txt", "Caf\xE9 cr\xE8me", false},
+      {"wide.txt", std::string("\xFF\xFEw\0i\0", 6), false},
+      {"zero.txt", std::string("text\0more", 9), false},
+      {"page.html", "<html><body>words</body></html>", false},
+      {"README", "no extension: the worker's media type decides", false},
+      {"big.txt", std::string(kInProcessTextBytes + 1, 'x'), false},
+  };
+  for (const auto& c : cases) {
+    WriteBytes(PathOf(c.name), c.bytes);
+    const int fd = open(PathOf(c.name).c_str(), O_RDONLY | O_CLOEXEC);
+    ASSERT_GE(fd, 0) << c.name;
+    Json::Value fields(Json::objectValue);
+    const bool read = ReadPlainTextInProcess(fd, PathOf(c.name), c.bytes.size(), text_cap_, fields);
+    close(fd);
+    EXPECT_EQ(c.in_process, read) << c.name;
+    if (!read) {
+      EXPECT_EQ(0u, fields.size()) << c.name;
+      continue;
+    }
+    const Json::Value worker = Extract(c.name);
+    EXPECT_EQ(worker.isMember(kFieldTextContent), fields.isMember(kFieldTextContent)) << c.name;
+    EXPECT_EQ(worker[kFieldTextContent].asString(), fields[kFieldTextContent].asString()) << c.name;
+    EXPECT_EQ(PlainTextMediaType(GetFileExtension(c.name, true)), fields[kFieldMediaTypes].asString()) << c.name;
+  }
 }
 
 TEST_F(FormatsTest, TextIsCappedAtTheSettingWhoseDefaultKeepsLongFilesWhole) {
@@ -244,6 +285,8 @@ TEST_F(FormatsTest, PhotoExifFieldsAndResolutionInCentimetres) {
   EXPECT_EQ("f/2.8", fields[kFieldAperture].asString());
   EXPECT_EQ(300, fields[kFieldResolutionWidthDPI].asInt());
   EXPECT_EQ(240, fields[kFieldResolutionHeightDPI].asInt());
+  EXPECT_EQ(64, fields[kFieldPixelWidth].asInt());
+  EXPECT_EQ(48, fields[kFieldPixelHeight].asInt());
   EXPECT_EQ(1577934245, fields[kFieldContentCreationDate].asInt64());
   EXPECT_EQ("image/jpeg", fields[kFieldMediaTypes].asString());
   EXPECT_FALSE(Extract("photo.jpg", false).isMember(kFieldMake));
@@ -263,6 +306,8 @@ TEST_F(FormatsTest, VideoDurationBitRatesAndCodecs) {
   const Json::Value fields = Extract("clip.mp4");
   EXPECT_NEAR(2.0, fields[kFieldDuration].asDouble(), 0.1);
   EXPECT_EQ("mpeg4 aac", fields[kFieldCodecs].asString());
+  EXPECT_EQ(160, fields[kFieldPixelWidth].asInt());
+  EXPECT_EQ(120, fields[kFieldPixelHeight].asInt());
   EXPECT_GT(fields[kFieldVideoBitRate].asInt(), 0);
   EXPECT_NEAR(64, fields[kFieldAudioBitRate].asInt(), 16);
   EXPECT_GT(fields[kFieldTotalBitRate].asInt(), fields[kFieldVideoBitRate].asInt());

@@ -181,7 +181,7 @@ TEST_F(WorkerTest, HostileContainersAndMarkupAreRefusedNotExpanded) {
 }
 
 TEST_F(WorkerTest, ThreadsExtractAtTheSameTime) {
-  for (int i = 0; i < 8; ++i) WriteBytes(PathOf("f" + std::to_string(i) + ".txt"), "text " + std::to_string(i));
+  for (int i = 0; i < 8; ++i) WriteBytes(PathOf("f" + std::to_string(i) + ".dat"), "text " + std::to_string(i));
   std::vector<std::thread> threads;
   std::vector<int> wrong(4, 0);
   for (int t = 0; t < 4; ++t) {
@@ -190,7 +190,7 @@ TEST_F(WorkerTest, ThreadsExtractAtTheSameTime) {
       for (int round = 0; round < 5; ++round) {
         for (int i = 0; i < 8; ++i) {
           Json::Value options(Json::objectValue), document;
-          platform.ParseFile(PathOf("f" + std::to_string(i) + ".txt"), options, document);
+          platform.ParseFile(PathOf("f" + std::to_string(i) + ".dat"), options, document);
           if (document[kFieldTextContent].asString() != "text " + std::to_string(i)) ++wrong[t];
         }
       }
@@ -201,37 +201,37 @@ TEST_F(WorkerTest, ThreadsExtractAtTheSameTime) {
 }
 
 TEST_F(WorkerTest, TestRunsFindTheirBuildsWorkerWithoutSetUp) {
-  WriteBytes(PathOf("a.txt"), "alpha");
+  WriteBytes(PathOf("a.dat"), "alpha");
   unsetenv("CORVLUMEX_EXTRACT_WORKER");  // FILEINDEX_BUILD_DIR alone, as ctest sets it
   EXPECT_EQ(std::string(std::getenv("FILEINDEX_BUILD_DIR")) + "/programs/corvcontentextractd/corvcontentextractd",
             FindWorkerProgram());
-  EXPECT_EQ("alpha", Parse("a.txt")[kFieldTextContent].asString());
+  EXPECT_EQ("alpha", Parse("a.dat")[kFieldTextContent].asString());
 }
 
 TEST_F(WorkerTest, ALoopingParserIsStoppedAtTheTimeLimitAndACrashingOneFailsOnlyThatFile) {
-  WriteBytes(PathOf("loop.txt"), "words");
+  WriteBytes(PathOf("loop.dat"), "words");
   setenv("CORVLUMEX_EXTRACT_TIMEOUT_MS", "300", 1);
   UseHook("spin");
   const auto start = std::chrono::steady_clock::now();
-  const std::string reason = FailureOf("loop.txt");
+  const std::string reason = FailureOf("loop.dat");
   EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(5));
   EXPECT_NE(std::string::npos, reason.find("longer than 300 ms")) << reason;
-  EXPECT_EQ(1u, log_.Matching("loop.txt failed: extraction took longer").size());
+  EXPECT_EQ(1u, log_.Matching("loop.dat failed: extraction took longer").size());
   unsetenv("CORVLUMEX_EXTRACT_TIMEOUT_MS");
   UseHook("crash");
-  EXPECT_NE(std::string::npos, FailureOf("loop.txt").find("signal 11"));
+  EXPECT_NE(std::string::npos, FailureOf("loop.dat").find("signal 11"));
   UseHook("");
-  EXPECT_EQ("words", Parse("loop.txt")[kFieldTextContent].asString());
+  EXPECT_EQ("words", Parse("loop.dat")[kFieldTextContent].asString());
 }
 
 TEST_F(WorkerTest, AMemoryHungryParserHitsTheLimit) {
 #if defined(__SANITIZE_ADDRESS__)
   GTEST_SKIP() << "the sanitizer build runs the worker without an address-space limit";
 #endif
-  WriteBytes(PathOf("a.txt"), "alpha");
+  WriteBytes(PathOf("a.dat"), "alpha");
   setenv("CORVLUMEX_EXTRACT_MEMORY_MB", "256", 1);
   UseHook("hog");
-  const std::string reason = FailureOf("a.txt");
+  const std::string reason = FailureOf("a.dat");
   unsetenv("CORVLUMEX_EXTRACT_MEMORY_MB");
   EXPECT_NE(std::string::npos, reason.find("out of memory (the worker may use 256 MiB)")) << reason;
 }
@@ -310,9 +310,9 @@ TEST_F(WorkerTest, ACompressionBombIsCutNotFollowed) {
 }
 
 TEST_F(WorkerTest, TheWorkerIsConfined) {
-  WriteBytes(PathOf("a.txt"), "alpha");
+  WriteBytes(PathOf("a.dat"), "alpha");
   UseHook("probe");
-  const std::string reason = FailureOf("a.txt");
+  const std::string reason = FailureOf("a.dat");
   EXPECT_NE(std::string::npos, reason.find("socket: Operation not permitted")) << reason;
   EXPECT_NE(std::string::npos, reason.find("fork: Operation not permitted")) << reason;
   EXPECT_NE(std::string::npos, reason.find("exec: Operation not permitted")) << reason;
@@ -358,9 +358,9 @@ TEST_F(WorkerTest, LinksPipesAndFoldersAreNotOpened) {
 }
 
 TEST_F(WorkerTest, AMissingWorkerIsAClearError) {
-  WriteBytes(PathOf("a.txt"), "alpha");
+  WriteBytes(PathOf("a.dat"), "alpha");
   setenv("CORVLUMEX_EXTRACT_WORKER", PathOf("no-such-worker").c_str(), 1);
-  EXPECT_NE(std::string::npos, FailureOf("a.txt").find("corvcontentextractd was not found"));
+  EXPECT_NE(std::string::npos, FailureOf("a.dat").find("corvcontentextractd was not found"));
 }
 
 TEST_F(WorkerTest, PrintShowsTheDocumentAsJson) {

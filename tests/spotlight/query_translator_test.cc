@@ -68,6 +68,7 @@ TEST(QueryTranslatorTest, SambasParserOutputBecomesOurSearchLanguage) {
        R"({"bool": {"must_not": [{"range": {"CORVMDFSSize": {"gte": 1, "lte": 1}}}]}})"},
       {R"(kMDItemFSSize>"1")", "CORVMDFSSize:{1 TO *}", R"({"range": {"CORVMDFSSize": {"gt": 1}}})"},
       {R"(kMDItemFSSize<"1")", "CORVMDFSSize:{* TO 1}", R"({"range": {"CORVMDFSSize": {"lt": 1}}})"},
+      {R"(kMDItemPixelWidth>"1000")", "CORVMDPixelWidth:{1000 TO *}", R"({"range": {"CORVMDPixelWidth": {"gt": 1000}}})"},
       {R"(kMDItemFSCreationDate>"1")", R"(CORVMDFSCreationDate:{2001\-01\-01T00\:00\:01Z TO *})",
        R"({"range": {"CORVMDFSCreationDate": {"gt": ")" + date + R"("}}})"},
       {R"(kMDItemFSCreationDate<"1")", R"(CORVMDFSCreationDate:{* TO 2001\-01\-01T00\:00\:01Z})",

@@ -157,7 +157,7 @@ std::set<std::string> SystemSandbox::Query(const Json::Value& qsl) const {
     request["data"]["load_field"].append("CORVMDPath");
     Json::Value answer;
     try {
-      fileindex::elastic::SendRequestWithRetry(answer, request);
+      fileindex::elastic::SendRequestWithPatience(answer, request);
     } catch (const Error& error) {
       return {"<search failed: " + error.reason + ">"};
     }

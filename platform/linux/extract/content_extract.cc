@@ -1,5 +1,6 @@
 // Content extraction of the Linux platform: the file-system fields come from
-// the file's status in this process; everything read from inside the file
+// the file's status in this process, and so does the text of small UTF-8
+// plain-text files (plain_text.h); everything else read from inside a file
 // comes from a confined worker process (worker_client.h).
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -12,6 +13,7 @@
 #include "common/json_util.h"
 #include "platform/linux/extract/document_fields.h"
 #include "platform/linux/extract/file_fields.h"
+#include "platform/linux/extract/plain_text.h"
 #include "platform/linux/extract/worker_client.h"
 #include "platform/linux/linux_platform.h"
 
@@ -66,7 +68,11 @@ void LinuxPlatform::ParseFile(const std::string& path, const Json::Value& option
       struct stat opened;
       if (fstat(file.fd(), &opened) != 0) FailWithErrno("cannot read the status of", path);
       if (!S_ISREG(opened.st_mode)) throw Error(kErrorParseDocument, "no longer a regular file: " + path);
-      const Json::Value content = extract::ExtractInWorker(file.fd(), path, need_meta);
+      Json::Value content(Json::objectValue);
+      if (!extract::ReadPlainTextInProcess(file.fd(), path, static_cast<size_t>(opened.st_size),
+                                           extract::CurrentExtractLimits().text_cap, content)) {
+        content = extract::ExtractInWorker(file.fd(), path, need_meta);
+      }
       for (const std::string& name : content.getMemberNames()) fields[name] = content[name];
     } catch (const Error& error) {
       // The file exists: it stays findable by everything but its content.

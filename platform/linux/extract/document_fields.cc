@@ -44,6 +44,8 @@ constexpr ContentField kContentFields[] = {
     {kFieldAperture, FieldType::kString},
     {kFieldResolutionWidthDPI, FieldType::kInt},
     {kFieldResolutionHeightDPI, FieldType::kInt},
+    {kFieldPixelWidth, FieldType::kInt},
+    {kFieldPixelHeight, FieldType::kInt},
 };
 
 }  // namespace
@@ -71,6 +73,12 @@ bool ValueFitsType(const Json::Value& value, FieldType type) {
       return value.isBool();
   }
   return false;
+}
+
+void SetPixelSize(Json::Value& fields, long width, long height) {
+  if (width <= 0 || height <= 0) return;
+  fields[kFieldPixelWidth] = static_cast<Json::Int64>(width);
+  fields[kFieldPixelHeight] = static_cast<Json::Int64>(height);
 }
 
 }  // namespace extract

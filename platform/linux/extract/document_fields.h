@@ -68,6 +68,8 @@ constexpr const char kFieldExposureTime[] = "CORVMDExposureTimeString";
 constexpr const char kFieldAperture[] = "CORVMDAperture";
 constexpr const char kFieldResolutionWidthDPI[] = "CORVMDResolutionWidthDPI";
 constexpr const char kFieldResolutionHeightDPI[] = "CORVMDResolutionHeightDPI";
+constexpr const char kFieldPixelWidth[] = "CORVMDPixelWidth";
+constexpr const char kFieldPixelHeight[] = "CORVMDPixelHeight";
 
 // True and `type` set when `name` is a field the worker may return.
 bool ContentFieldType(const std::string& name, FieldType* type);
@@ -75,6 +77,10 @@ bool ContentFieldType(const std::string& name, FieldType* type);
 // True when `value` fits a field of `type` (an int field takes any integer
 // that fits in 64 bits, a double field any number).
 bool ValueFitsType(const Json::Value& value, FieldType type);
+
+// Sets the picture's width and height in pixels when both are known (a
+// format that does not say gives 0).
+void SetPixelSize(Json::Value& fields, long width, long height);
 
 }  // namespace extract
 }  // namespace platform

@@ -1,6 +1,7 @@
 #include "platform/linux/extract/worker_main.h"
 
 #include <fcntl.h>
+#include <malloc.h>
 #include <signal.h>
 #include <sys/socket.h>
 #include <sys/wait.h>
@@ -178,6 +179,11 @@ int RunWorker(int socket, const WorkerLimits& limits) {
     }
     if (fd >= 0) close(fd);
     if (!SendReply(socket, reply)) return 1;
+    // A worker serves many files: without this, the buffers of one large
+    // file (tens of MiB of unpacked and converted text) would stay resident
+    // for all the small ones after it.
+    reply = Json::Value();
+    malloc_trim(0);
   }
 }
 

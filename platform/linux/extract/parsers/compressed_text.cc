@@ -56,7 +56,10 @@ void ExtractCompressed(int fd, const std::string& inner_name, TextSink& text) {
     throw ExtractError("not compressed data (gzip, bzip2, xz or zstd) despite its name");
   }
   const size_t limit = 4 * text.cap();  // as plain text reads at most
+  // Reserved at once: growing by doubling would hold the old and the new
+  // copy together, and pages never written cost nothing.
   std::string data;
+  data.reserve(limit);
   char buffer[65536];
   while (data.size() < limit) {
     const la_ssize_t got = archive_read_data(archive.get(), buffer, sizeof(buffer));
@@ -68,9 +71,11 @@ void ExtractCompressed(int fd, const std::string& inner_name, TextSink& text) {
     data.append(buffer, std::min(static_cast<size_t>(got), limit - data.size()));
   }
   if (!LooksLikeText(data)) return;  // an archive (.tar.gz) or a binary: its name and status suffice
+  const bool troff = IsManPageName(inner_name) || LooksLikeTroff(data.substr(0, 16));
   std::string utf8;
   ConvertToUtf8(data, &utf8);
-  if (IsManPageName(inner_name) || LooksLikeTroff(data.substr(0, 16))) {
+  std::string().swap(data);  // up to 4 × the text cap: gone before the text is collected
+  if (troff) {
     AppendTroffText(utf8, text);
   } else {
     text.Append(utf8);

@@ -6,6 +6,8 @@
 #include <cerrno>
 #include <cstring>
 
+#include "platform/linux/extract/parsers/text_sink.h"
+
 namespace corvlumex {
 namespace platform {
 namespace extract {
@@ -16,25 +18,6 @@ constexpr size_t kDetectBytes = 64 * 1024;
 
 bool StartsWith(const std::string& bytes, const char* prefix, size_t length) {
   return bytes.size() >= length && memcmp(bytes.data(), prefix, length) == 0;
-}
-
-bool IsValidUtf8(const std::string& bytes) {
-  const unsigned char* p = reinterpret_cast<const unsigned char*>(bytes.data());
-  const size_t size = bytes.size();
-  size_t i = 0;
-  while (i < size) {
-    const unsigned char c = p[i];
-    size_t length = c < 0x80 ? 1 : (c >= 0xC2 && c <= 0xDF) ? 2 : (c >= 0xE0 && c <= 0xEF) ? 3
-                                                            : (c >= 0xF0 && c <= 0xF4) ? 4 : 0;
-    if (length == 0) return false;
-    // A sequence cut by the end of the sample does not make the text invalid.
-    if (i + length > size) return size - i < 4;
-    for (size_t k = 1; k < length; ++k) {
-      if ((p[i + k] & 0xC0) != 0x80) return false;
-    }
-    i += length;
-  }
-  return true;
 }
 
 // UTF-16 without a mark: Latin text then has a zero byte in every other

@@ -12,6 +12,7 @@
 #include "platform/linux/extract/parsers/formats.h"
 #include "platform/linux/extract/parsers/text_sink.h"
 #include "platform/linux/extract/parsers/troff_text.h"
+#include "platform/linux/extract/plain_text.h"
 
 namespace corvlumex {
 namespace platform {
@@ -28,22 +29,7 @@ struct Format {
 const std::map<std::string, Format>& FormatsByExtension() {
   static const auto* formats = [] {
     auto* table = new std::map<std::string, Format>();
-    for (const char* ext : {"txt", "text", "log", "md", "markdown", "rst", "csv", "tsv", "json", "yaml", "yml",
-                            "ini", "conf", "cfg", "toml", "tex", "srt", "vtt", "sub", "nfo", "c", "h", "cc", "cpp",
-                            "cxx", "hpp", "hh", "java", "py", "sh", "bash", "js", "ts", "css", "go", "rs", "rb",
-                            "pl", "php", "sql", "lua", "swift", "kt", "cs", "properties", "diff", "patch",
-                            // More source code and plain-text formats whose content libmagic may take for
-                            // something else (a Perl module for JavaScript, a Pascal unit for HTML).
-                            "pm", "pod", "t", "pas", "pp", "dpr", "inc", "el", "lisp", "scm", "hs", "ml", "mli",
-                            "tcl", "awk", "m4", "cmake", "mk", "mak", "am", "ac", "in", "vim", "r", "f", "f90",
-                            "for", "adb", "ads", "d", "nim", "zig", "dart", "scala", "groovy", "gradle", "erl",
-                            "hrl", "ex", "exs", "clj", "jsx", "tsx", "mjs", "cjs", "vue", "scss", "less", "sass",
-                            "po", "pot", "texi", "texinfo", "asm", "s", "bat", "ps1", "cmd", "y", "l", "proto",
-                            "hxx", "ipp", "tcc", "inl", "m", "mm", "jl", "pyi", "pyx", "rake",
-                            "gemspec", "cabal", "bib", "sty", "cls", "dtx", "ltx", "adoc", "asciidoc", "org",
-                            "license", "changelog", "readme", "news", "todo", "authors", "copying", "install"}) {
-      (*table)[ext] = {Family::kText, OfficeFormat::kDocx};
-    }
+    for (const std::string& ext : PlainTextExtensions()) (*table)[ext] = {Family::kText, OfficeFormat::kDocx};
     for (const char* ext : {"html", "htm", "xhtml", "shtml"}) (*table)[ext] = {Family::kHtml, OfficeFormat::kDocx};
     for (const char* ext : {"xml", "svg", "rss", "atom", "plist"}) (*table)[ext] = {Family::kXml, OfficeFormat::kDocx};
     for (const char* ext : {"gz", "bz2", "xz", "zst"}) (*table)[ext] = {Family::kCompressed, OfficeFormat::kDocx};

@@ -4,6 +4,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 
@@ -13,6 +14,10 @@ namespace extract {
 
 std::string ReadHead(int fd, size_t limit) {
   std::string bytes;
+  // Sized once from the file's status: growing by doubling would hold two
+  // copies of a large file for a moment.
+  struct stat st;
+  if (fstat(fd, &st) == 0 && st.st_size > 0) bytes.reserve(std::min(limit, static_cast<size_t>(st.st_size)));
   char buffer[65536];
   off_t offset = 0;
   while (bytes.size() < limit) {

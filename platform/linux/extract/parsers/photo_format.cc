@@ -75,6 +75,9 @@ void ExtractPhoto(int fd, Json::Value& fields) {
   if (image.get() == nullptr) throw ExtractError("not a picture format Exiv2 can read");
   image->readMetadata();
 
+  // The size Exiv2 reads from the format's own header, not from EXIF (which
+  // an editor that crops the picture often leaves unchanged).
+  SetPixelSize(fields, image->pixelWidth(), image->pixelHeight());
   const Exiv2::ExifData& exif = image->exifData();
   SetExifText(fields, kFieldMake, exif, "Exif.Image.Make");
   SetExifText(fields, kFieldModel, exif, "Exif.Image.Model");

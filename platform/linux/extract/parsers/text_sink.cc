@@ -80,6 +80,24 @@ std::string TextSink::Trimmed() const {
   return text_.substr(begin, end - begin + 1);
 }
 
+bool IsValidUtf8(const std::string& bytes) {
+  const unsigned char* p = reinterpret_cast<const unsigned char*>(bytes.data());
+  const size_t size = bytes.size();
+  size_t i = 0;
+  while (i < size) {
+    const unsigned char c = p[i];
+    size_t length = c < 0x80 ? 1 : (c >= 0xC2 && c <= 0xDF) ? 2 : (c >= 0xE0 && c <= 0xEF) ? 3
+                                                            : (c >= 0xF0 && c <= 0xF4) ? 4 : 0;
+    if (length == 0) return false;
+    if (i + length > size) return size - i < 4;
+    for (size_t k = 1; k < length; ++k) {
+      if ((p[i + k] & 0xC0) != 0x80) return false;
+    }
+    i += length;
+  }
+  return true;
+}
+
 std::string CleanUtf8(const std::string& text) {
   TextSink sink(text.size() * 3 + 3);
   sink.Append(text);

@@ -45,6 +45,10 @@ class TextSink {
   std::string text_;
 };
 
+// Whether `bytes` (the start of a file) are UTF-8: a sequence cut by the
+// end of the sample does not make them invalid.
+bool IsValidUtf8(const std::string& bytes);
+
 // Text made valid UTF-8 the same way and trimmed (for metadata values).
 std::string CleanUtf8(const std::string& text);
 

@@ -146,6 +146,9 @@ void ExtractVideo(int fd, Json::Value& fields) {
     const std::string name = avcodec_get_name(codec->codec_id);
     if (seen.insert(name).second) codecs += (codecs.empty() ? "" : " ") + name;
     const int64_t rate = codec->bit_rate > 0 ? Kilobits(codec->bit_rate) : 0;
+    if (codec->codec_type == AVMEDIA_TYPE_VIDEO && !fields.isMember(kFieldPixelWidth)) {
+      SetPixelSize(fields, codec->width, codec->height);
+    }
     if (codec->codec_type == AVMEDIA_TYPE_VIDEO && rate > 0 && !fields.isMember(kFieldVideoBitRate)) {
       fields[kFieldVideoBitRate] = static_cast<Json::Int64>(rate);
     }
