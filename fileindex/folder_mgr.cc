@@ -10,6 +10,7 @@
 #include "common/file_util.h"
 #include "common/json_util.h"
 #include "common/log.h"
+#include "common/path_below.h"
 #include "common/sys.h"
 #include "fileindex/constants.h"
 #include "fileindex/file_type.h"
@@ -19,12 +20,6 @@
 namespace corvlumex {
 namespace fileindex {
 namespace {
-
-// "/v/s/a" is "/v/s/a" itself or an ancestor of `full_path`, never a
-// sibling with a longer name ("/v/s/ab").
-bool IsSelfOrAncestor(const std::string& folder_full_path, const std::string& full_path) {
-  return StringStartWith(full_path + "/", folder_full_path + "/");
-}
 
 // Matches the folder whose share-form path is exactly `path`.
 auto PathIs(const std::string& path) {
@@ -187,7 +182,7 @@ std::shared_ptr<Folder> FolderMgr::GetMostSuitableCfg(const std::string& full_pa
   size_t best_length = 0;
   for (const std::shared_ptr<Folder>& folder : folders_) {
     const std::string folder_full_path = folder->GetFullPath();
-    if (!IsSelfOrAncestor(folder_full_path, full_path)) continue;
+    if (!IsPathAtOrBelow(full_path, folder_full_path)) continue;
     // Strictly longer: on a tie the earlier folder stays.
     if (!best || folder_full_path.size() > best_length) {
       best = folder;
@@ -199,7 +194,7 @@ std::shared_ptr<Folder> FolderMgr::GetMostSuitableCfg(const std::string& full_pa
 
 bool FolderMgr::IsFullPathIndexed(const std::string& full_path) const {
   return std::any_of(folders_.begin(), folders_.end(), [&full_path](const std::shared_ptr<Folder>& folder) {
-    return IsSelfOrAncestor(folder->GetFullPath(), full_path);
+    return IsPathAtOrBelow(full_path, folder->GetFullPath());
   });
 }
 

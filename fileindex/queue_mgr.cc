@@ -13,6 +13,7 @@
 #include "common/file_util.h"
 #include "common/lock_file.h"
 #include "common/log.h"
+#include "common/path_below.h"
 #include "fileindex/event.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/optree.h"
@@ -20,12 +21,6 @@
 namespace corvlumex {
 namespace fileindex {
 namespace {
-
-// `text` followed by "/" starts with `prefix` followed by "/": the path
-// itself or something below it, never a sibling with a longer name.
-bool IsSelfOrBelow(const std::string& text, const std::string& prefix) {
-  return StringStartWith(text + "/", prefix + "/");
-}
 
 bool WriteWhole(int fd, const std::string& text) {
   size_t done = 0;
@@ -100,7 +95,7 @@ bool QueueMgr::IsFullPathProcessing(const std::string& full_path) {
   // Loaded for its checks only: an unreadable folder file fails the call.
   const FolderMgr folder_mgr;
   const auto mentions = [&full_path](std::shared_ptr<Event> event) {
-    return IsSelfOrBelow(event->path, full_path) || IsSelfOrBelow(event->path_old, full_path);
+    return IsPathAtOrBelow(event->path, full_path) || IsPathAtOrBelow(event->path_old, full_path);
   };
   return FindQueue(mentions, queue_path_) || FindQueue(mentions, queue_path_tmp_);
 }
@@ -108,7 +103,7 @@ bool QueueMgr::IsFullPathProcessing(const std::string& full_path) {
 bool QueueMgr::IsFullPathHasReindex(const std::string& full_path) {
   // The opposite direction: the reindexed folder is an ancestor of the path.
   const auto covers = [&full_path](std::shared_ptr<Event> event) {
-    return event->event == kEventReindex && IsSelfOrBelow(full_path, event->path);
+    return event->event == kEventReindex && IsPathAtOrBelow(full_path, event->path);
   };
   return FindQueue(covers, queue_path_) || FindQueue(covers, queue_path_tmp_);
 }

@@ -67,8 +67,6 @@ std::atomic<pid_t> last_daemon_pid{0};
 
 pid_t LastSearchDaemonPid() { return last_daemon_pid.load(); }
 
-bool IsElasticBusyCode(int code) { return code == kElasticBusy || code == kElasticNotReady; }
-
 std::string ElasticSocketPath() { return SysPath("/var/run/corvelasticd.sock"); }
 
 bool WaitForFrame(int fd) {

@@ -8,13 +8,9 @@
 
 #include <string>
 
-namespace corvlumex {
+#include "fileindex/elastic/daemon_codes.h"
 
-// Codes with which corvelasticd says it cannot take a request now; callers
-// treat both alike and ask again later.
-constexpr int kElasticBusy = 1400;
-constexpr int kElasticNotReady = 1401;
-bool IsElasticBusyCode(int code);
+namespace corvlumex {
 
 // corvelasticd's socket, relocated by the system root.
 std::string ElasticSocketPath();

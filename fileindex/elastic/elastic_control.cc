@@ -10,6 +10,7 @@
 #include "common/file_util.h"
 #include "common/json_util.h"
 #include "common/log.h"
+#include "common/path_below.h"
 #include "common/sys.h"
 #include "fileindex/constants.h"
 #include "fileindex/custom_event.h"
@@ -40,7 +41,7 @@ Json::Value MakeRequest(const std::string& command, const std::string& share) {
 // whose name merely begins with the folder's name (b2 next to b) out.
 Json::Value DescendantsQuery(const std::string& path) {
   Json::Value query(Json::objectValue);
-  query["qsl"]["prefix"][kFieldPath] = path + "/";
+  query["qsl"]["prefix"][kFieldPath] = PrefixOfPathsBelow(path);
   return query;
 }
 
@@ -56,6 +57,10 @@ const Json::Value& QueryDocuments(const Json::Value& res, const std::string& pre
                    "No document list in the answer, prefix=" + prefix + "/");
   return res["data"];
 }
+
+// Name search runs on its own field, analysed for matches inside names: a
+// copy of the name, wherever a document's name is written.
+void AddSearchName(Json::Value& document) { document[kFieldSearchFileName] = document[kFieldFSName]; }
 
 // The document of `path` as the platform's content extraction sees it.
 Json::Value ExtractDocument(const std::string& path, bool need_meta) {
@@ -73,8 +78,7 @@ Json::Value ExtractDocument(const std::string& path, bool need_meta) {
     throw Error(kErrorParseDocument, "Parse failed, path=" + path);
   }
   CORV_CHECK_THROW(!document.isObject(), kErrorParseDocument, "Parse failed, path=" + path);
-  // Name search runs on its own field, analysed for matches inside names.
-  document[kFieldSearchFileName] = document[kFieldFSName];
+  AddSearchName(document);
   // The names of one file find each other by it, so that a change through
   // one of its hard links reaches them all.
   struct stat st;
@@ -202,34 +206,24 @@ void IndexAttr(const std::string& share, const std::string& path) {
 }
 
 void IndexRename(const std::string& share, const std::string& path_from, const std::string& path_to) {
-  const std::string name = Basename(path_to);
-  const std::string ext = GetFileExtension(path_to, true);
   Json::Value res;
 
   // The moved document keeps its key; only its path and name fields change.
   Json::Value fields(Json::objectValue);
-  fields[kFieldPath] = path_to;
-  fields[kFieldParent] = Dirname(path_to);
-  fields[kFieldFSName] = name;
-  fields[kFieldSearchFileName] = name;
-  fields[kFieldDisplayName] = name;
-  fields[kFieldKind] = ext;
-  fields[kFieldExtension] = ext;
+  SetNameFields(path_to, fields);
+  AddSearchName(fields);
   Json::Value set_req = MakeRequest("document_set_by_id", share);
   set_req["data"]["doc_id"] = path_from;
   set_req["data"]["data"] = fields;
   SendRequestWithRetry(res, set_req);
 
-  Json::Value query_req = MakeRequest("document_get_by_query", share);
-  query_req["data"]["query"] = DescendantsQuery(path_from);
-  query_req["data"]["query"]["load_field"] = LoadFields({kFieldPath, kFieldFSName, kFieldParent});
-  SendRequestWithRetry(res, query_req);
+  const Json::Value descendants = IndexDocumentsBelow(share, path_from, {kFieldPath, kFieldFSName, kFieldParent});
 
   // Every descendant in one exchange. The prefix query guarantees that each
   // parent begins with path_from, so its head is replaced by position.
   const std::string index_id = GetFileIndexID(share);
   Json::Value compound(Json::arrayValue);
-  for (const Json::Value& doc : QueryDocuments(res, path_from)) {
+  for (const Json::Value& doc : descendants) {
     std::string child_name;
     std::string parent;
     GetJsonValue(child_name, doc, kFieldFSName, true);
@@ -249,13 +243,18 @@ void IndexRename(const std::string& share, const std::string& path_from, const s
   SendRequestNoResult(compound_req);
 }
 
-void IndexGetByPrefixPath(const std::string& share, const std::string& prefix, std::vector<std::string>& paths) {
+Json::Value IndexDocumentsBelow(const std::string& share, const std::string& path, std::initializer_list<const char*> fields) {
   Json::Value req = MakeRequest("document_get_by_query", share);
-  req["data"]["query"] = DescendantsQuery(prefix);
-  req["data"]["query"]["load_field"] = LoadFields({kFieldPath});
+  req["data"]["query"] = DescendantsQuery(path);
+  req["data"]["query"]["load_field"] = LoadFields(fields);
   Json::Value res;
   SendRequestWithRetry(res, req);
-  for (const Json::Value& doc : QueryDocuments(res, prefix)) {
+  QueryDocuments(res, path);
+  return std::move(res["data"]);
+}
+
+void IndexGetByPrefixPath(const std::string& share, const std::string& prefix, std::vector<std::string>& paths) {
+  for (const Json::Value& doc : IndexDocumentsBelow(share, prefix, {kFieldPath})) {
     std::string path;
     GetJsonValue(path, doc, kFieldPath, true);
     paths.push_back(path);

@@ -7,6 +7,7 @@
 #include <sys/types.h>
 
 #include <chrono>
+#include <initializer_list>
 #include <string>
 #include <vector>
 
@@ -59,6 +60,10 @@ void IndexAttr(const std::string& share, const std::string& path);
 // Rewrites the path fields of the document at `path_from` and of every
 // document below it. The documents keep their keys (the old full paths).
 void IndexRename(const std::string& share, const std::string& path_from, const std::string& path_to);
+// The documents below the folder `path` (not the folder's own), uncommitted
+// writes included, each holding only `fields`; Error 916 when the answer
+// carries no list.
+Json::Value IndexDocumentsBelow(const std::string& share, const std::string& path, std::initializer_list<const char*> fields);
 // Appends the paths of the documents below `prefix` to `paths`, in the
 // daemon's order; Error 916 when the answer carries no list.
 void IndexGetByPrefixPath(const std::string& share, const std::string& prefix, std::vector<std::string>& paths);

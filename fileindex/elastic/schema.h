@@ -1,28 +1,16 @@
 // What the search daemon needs to create a share's index: the settings, the
-// field mappings and the event-handler plug-in, plus the names of the
-// document fields that the index commands write themselves.
+// field mappings and the event-handler plug-in. The names of the document
+// fields are common/index_fields.h.
 #pragma once
 
 #include <json/json.h>
+
+#include "common/index_fields.h"
 
 namespace corvlumex {
 namespace fileindex {
 namespace elastic {
 
-// Document fields written by the index commands (the mappings list them all).
-inline constexpr char kFieldPath[] = "CORVMDPath";  // the document key
-inline constexpr char kFieldParent[] = "CORVMDParent";
-inline constexpr char kFieldFSName[] = "CORVMDFSName";
-inline constexpr char kFieldSearchFileName[] = "CORVMDSearchFileName";
-inline constexpr char kFieldDisplayName[] = "CORVMDDisplayName";
-inline constexpr char kFieldKind[] = "CORVMDKind";
-inline constexpr char kFieldExtension[] = "CORVMDExtension";
-// "<device>:<inode>" of a file: the names of one file (hard links) share it.
-inline constexpr char kFieldFileID[] = "CORVMDFSFileID";
-// Set by content extraction when the content could not be read (with the
-// reason); the document then holds the file-system fields only.
-inline constexpr char kFieldExtractionFailed[] = "CORVMDExtractionFailed";
-inline constexpr char kFieldExtractionError[] = "CORVMDExtractionError";
 // Content-extraction option: also extract the file's metadata.
 inline constexpr char kOptionNeedMeta[] = "need_meta";
 

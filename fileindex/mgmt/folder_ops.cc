@@ -4,6 +4,7 @@
 
 #include "common/json_util.h"
 #include "common/log.h"
+#include "common/path_below.h"
 #include "fileindex/custom_event.h"
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/elastic/schema.h"
@@ -39,7 +40,6 @@ bool AnyKind(const Json::Value& index_cfg) {
   return false;
 }
 
-bool IsBelow(const std::string& path, const std::string& folder) { return path.compare(0, folder.size() + 1, folder + "/") == 0; }
 
 // Lists the index work of removing `removed` from `folder_mgr` (already
 // without them), share by share.
@@ -70,7 +70,7 @@ std::map<std::string, ShareDeletion> PlanDeletion(const FolderMgr& folder_mgr,
     }
     share.orphaned_paths.push_back(full_path);
     for (const std::shared_ptr<Folder>& inner : FoldersOfShare(folder_mgr, share_name)) {
-      if (IsBelow(inner->GetFullPath(), full_path)) share.to_reindex.insert(inner->GetFullPath());
+      if (IsPathStrictlyBelow(inner->GetFullPath(), full_path)) share.to_reindex.insert(inner->GetFullPath());
     }
   }
   return plan;
@@ -185,7 +185,7 @@ void UpdateTermSuggestion() {
   const FolderLock lock;
   const FolderMgr folder_mgr;
   for (const std::string& share_name : folder_mgr.GetIndexedShares()) {
-    elastic::UpdateTermSuggestion(sdk::SDKShare(share_name).GetDBName(), {elastic::kFieldSearchFileName});
+    elastic::UpdateTermSuggestion(sdk::SDKShare(share_name).GetDBName(), {kFieldSearchFileName});
   }
 }
 

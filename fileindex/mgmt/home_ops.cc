@@ -2,6 +2,7 @@
 // switched on and off, and a user's folders follow the user's new name.
 #include "common/file_util.h"
 #include "common/log.h"
+#include "common/path_below.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/mgmt/mgmt_util.h"
@@ -41,7 +42,7 @@ std::vector<std::shared_ptr<Folder>> FoldersMovedHome(const FolderMgr& folder_mg
   std::vector<std::shared_ptr<Folder>> moved;
   for (const std::shared_ptr<Folder>& folder : FoldersOfShare(folder_mgr, kHomesShare)) {
     const std::string& path = folder->GetPath();
-    if (path != move.old_home && path.compare(0, move.old_home.size() + 1, move.old_home + "/") != 0) continue;
+    if (!IsPathAtOrBelow(path, move.old_home)) continue;
     Json::Value data = folder->GetData();
     data["path"] = move.new_home + path.substr(move.old_home.size());
     auto renamed = std::make_shared<Folder>(data);

@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "common/log.h"
+#include "common/path_below.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/mgmt/mgmt_util.h"
@@ -23,7 +24,7 @@ std::vector<std::string> SharesOnVolume(std::string volume_path) {
   std::vector<std::string> shares;
   for (const std::string& share_name : sdk::SDKShare::Enum()) {
     const std::string dir = sdk::SDKShare(share_name).GetPath();
-    if (dir.compare(0, volume_path.size() + 1, volume_path + "/") == 0) shares.push_back(share_name);
+    if (IsPathStrictlyBelow(dir, volume_path)) shares.push_back(share_name);
   }
   return shares;
 }

@@ -7,6 +7,8 @@
 #include <cstring>
 #include <vector>
 
+#include "common/index_fields.h"
+#include "common/path_below.h"
 #include "fileindex/elastic/schema.h"
 #include "fileindex/file_type.h"
 
@@ -14,11 +16,6 @@ namespace corvlumex {
 namespace fileindex {
 namespace {
 
-constexpr char kAll[] = "_all";
-constexpr char kFieldIsDir[] = "CORVMDIsDir";
-constexpr char kFieldSize[] = "CORVMDFSSize";
-constexpr char kFieldModified[] = "CORVMDFSContentChangeDate";
-constexpr char kFieldOwner[] = "CORVMDOwnerUserID";
 // Deep nesting only comes from a runaway script; the daemon refuses more anyway.
 constexpr int kMaxDepth = 30;
 
@@ -307,7 +304,7 @@ class Parser {
     if (Peek().kind == Token::Kind::kOr) {
       throw UserQuerySyntaxError(Peek().position, "\"OR\" needs something to search for on its left");
     }
-    if (!words.empty()) must.insert(must.begin(), Clause("match", kAll, words));
+    if (!words.empty()) must.insert(must.begin(), Clause("match", kFieldAll, words));
     if (must.empty() && must_not.empty()) {
       if (Peek().kind == Token::Kind::kClose) {
         throw UserQuerySyntaxError(Peek().position, "this \")\" closes no \"(\"; remove it or add the \"(\"");
@@ -349,7 +346,7 @@ class Parser {
   // An operand as a clause that stands on its own inside an OR.
   static Json::Value Positive(const Json::Value& clause, bool negated, std::string* word) {
     if (!word->empty()) {
-      Json::Value match = Clause("match", kAll, *word);
+      Json::Value match = Clause("match", kFieldAll, *word);
       word->clear();
       return match;
     }
@@ -367,7 +364,7 @@ class Parser {
       std::string inner_word;
       Json::Value inner = Primary(depth, &inner_negated, &inner_word);
       *negated = true;
-      return inner_word.empty() ? inner : Clause("match", kAll, inner_word);
+      return inner_word.empty() ? inner : Clause("match", kFieldAll, inner_word);
     }
     return Primary(depth, negated, word);
   }
@@ -383,14 +380,14 @@ class Parser {
     }
     *negated = token.minus;
     if (!token.filter.empty()) return Filter(token);
-    if (token.star) return Clause("prefix", kAll, token.value);
+    if (token.star) return Clause("prefix", kFieldAll, token.value);
     if (token.quoted) {
       if (token.value.find_first_not_of(" \t\n\r") == std::string::npos) {
         throw UserQuerySyntaxError(token.position, "these quotes hold no words");
       }
-      return Clause("match_phrase", kAll, token.value);
+      return Clause("match_phrase", kFieldAll, token.value);
     }
-    if (token.minus) return Clause("match", kAll, token.value);
+    if (token.minus) return Clause("match", kFieldAll, token.value);
     *word = token.value;  // never empty: a bare word holds at least one character
     return Json::Value();
   }
@@ -403,7 +400,7 @@ class Parser {
       std::string text = value;
       while (!token.quoted && !text.empty() && text.back() == '*') text.pop_back();  // name:rep* = name:rep
       if (text.empty()) bad("\"name:\" needs part of a file name");
-      return Clause("match", elastic::kFieldSearchFileName, text);
+      return Clause("match", kFieldSearchFileName, text);
     }
     if (name == "ext") return Extensions(value, bad);
     if (name == "type") return Category(value, bad);
@@ -411,7 +408,7 @@ class Parser {
       if (value[0] != '/') bad("\"" + name + ":\" needs a folder's full path, like " + name + ":/volume1/docs");
       std::string folder = value;
       while (folder.size() > 1 && folder.back() == '/') folder.pop_back();
-      return Clause("prefix", elastic::kFieldPath, folder == "/" ? folder : folder + "/");
+      return Clause("prefix", kFieldPath, PrefixOfPathsBelow(folder));
     }
     if (name == "size") return SizeFilter(value, bad);
     if (name == "modified") return DateFilter(value, bad);
@@ -431,7 +428,7 @@ class Parser {
       if (comma == std::string::npos) break;
       start = comma + 1;
     }
-    return list.size() == 1 ? Clause("term", elastic::kFieldExtension, list[0]) : Clause("terms", elastic::kFieldExtension, list);
+    return list.size() == 1 ? Clause("term", kFieldExtension, list[0]) : Clause("terms", kFieldExtension, list);
   }
 
   template <typename Bad>
@@ -444,7 +441,7 @@ class Parser {
     }
     Json::Value list(Json::arrayValue);
     for (const std::string& ext : GetExtensionsByCategory(category)) list.append(ext);
-    return Clause("terms", elastic::kFieldExtension, list);
+    return Clause("terms", kFieldExtension, list);
   }
 
   template <typename Bad>
@@ -464,8 +461,8 @@ class Parser {
     double bytes = 0;
     if (!ParseSize(value, &bytes)) bad("\"size:\" takes a comparison and a size, like size:>10M, size:<=200k or size:4096");
     const auto number = static_cast<Json::Int64>(bytes);
-    if (op.empty() || op == "=") return Clause("term", kFieldSize, number);
-    return Range(kFieldSize, op, number, bad);
+    if (op.empty() || op == "=") return Clause("term", kFieldFSSize, number);
+    return Range(kFieldFSSize, op, number, bad);
   }
 
   // A date is a whole UTC day; an age ("7d") counts back from now, so
@@ -477,36 +474,36 @@ class Parser {
     time_t day = 0;
     if (ParseAge(value, &age)) {
       const auto moment = static_cast<Json::Int64>(now_ - age);
-      if (op.empty() || op == "=" || op == "<") return Range(kFieldModified, ">", moment, bad);
-      if (op == "<=") return Range(kFieldModified, ">=", moment, bad);
-      return Range(kFieldModified, op == ">" ? "<" : "<=", moment, bad);
+      if (op.empty() || op == "=" || op == "<") return Range(kFieldContentChangeDate, ">", moment, bad);
+      if (op == "<=") return Range(kFieldContentChangeDate, ">=", moment, bad);
+      return Range(kFieldContentChangeDate, op == ">" ? "<" : "<=", moment, bad);
     }
     if (!ParseDay(value, &day)) {
       bad("\"modified:\" takes a date or an age, like modified:>2026-01-01, modified:2026-03-15 or modified:<7d "
           "(h, d, w, y: hours, days, weeks, years)");
     }
     const auto start = static_cast<Json::Int64>(day), next = static_cast<Json::Int64>(day + 86400);
-    if (op == ">") return Range(kFieldModified, ">=", next, bad);
-    if (op == ">=") return Range(kFieldModified, ">=", start, bad);
-    if (op == "<") return Range(kFieldModified, "<", start, bad);
-    if (op == "<=") return Range(kFieldModified, "<", next, bad);
+    if (op == ">") return Range(kFieldContentChangeDate, ">=", next, bad);
+    if (op == ">=") return Range(kFieldContentChangeDate, ">=", start, bad);
+    if (op == "<") return Range(kFieldContentChangeDate, "<", start, bad);
+    if (op == "<=") return Range(kFieldContentChangeDate, "<", next, bad);
     Json::Value bounds(Json::objectValue);
     bounds["gte"] = start;
     bounds["lt"] = next;
-    return Clause("range", kFieldModified, bounds);
+    return Clause("range", kFieldContentChangeDate, bounds);
   }
 
   // Documents store the owner's user id; a name is looked up here.
   template <typename Bad>
   static Json::Value Owner(const std::string& value, const Bad& bad) {
-    if (value.find_first_not_of("0123456789") == std::string::npos) return Clause("term", kFieldOwner, value);
+    if (value.find_first_not_of("0123456789") == std::string::npos) return Clause("term", kFieldOwnerUserID, value);
     struct passwd entry;
     struct passwd* found = nullptr;
     std::vector<char> buffer(16384);
     if (getpwnam_r(value.c_str(), &entry, buffer.data(), buffer.size(), &found) != 0 || found == nullptr) {
       bad("no user named \"" + value + "\"; give a user name or a numeric user id");
     }
-    return Clause("term", kFieldOwner, std::to_string(found->pw_uid));
+    return Clause("term", kFieldOwnerUserID, std::to_string(found->pw_uid));
   }
 
   std::vector<Token> tokens_;

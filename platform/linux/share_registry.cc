@@ -9,6 +9,7 @@
 
 #include "common/file_util.h"
 #include "common/log.h"
+#include "common/path_below.h"
 #include "common/sys.h"
 
 namespace corvlumex {
@@ -181,8 +182,7 @@ bool LoadShareRegistry(std::vector<ShareInfo>* shares) {
 const ShareInfo* FindShareByFullPath(const std::vector<ShareInfo>& shares, const std::string& full_path) {
   const ShareInfo* found = nullptr;
   for (const ShareInfo& share : shares) {
-    const bool inside = full_path == share.path ||
-                        (StringStartWith(full_path, share.path) && full_path[share.path.size()] == '/');
+    const bool inside = IsPathAtOrBelow(full_path, share.path);
     if (inside && (found == nullptr || share.path.size() > found->path.size())) found = &share;
   }
   return found;

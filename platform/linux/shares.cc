@@ -7,6 +7,7 @@
 #include <cstring>
 
 #include "common/file_util.h"
+#include "common/path_below.h"
 #include "platform/linux/linux_platform.h"
 #include "platform/linux/share_registry.h"
 
@@ -52,10 +53,6 @@ bool SplitByShare(const std::string& full_path, ShareInfo* share, std::string* r
   *share = *found;
   *rest = full_path.substr(found->path.size());
   return true;
-}
-
-bool IsAtOrBelow(const std::string& path, const std::string& dir) {
-  return path == dir || StringStartWith(path, dir + "/");
 }
 
 // Composes `share_path` + `suffix`; the share path must be absolute.
@@ -184,7 +181,7 @@ int LinuxPlatform::ShareIsShareRecycle(const std::string& full_path) {
   if (!SplitByShare(full_path, &share, &rest)) return -1;
   // The bin is "#recycle" right under the share's directory, whether or not
   // the bin is switched on now: what it holds was deleted either way.
-  return IsAtOrBelow(rest, std::string("/") + kRecycleBin) ? 1 : 0;
+  return IsPathAtOrBelow(rest, std::string("/") + kRecycleBin) ? 1 : 0;
 }
 
 int LinuxPlatform::RecycleUserHomePathIsExist(const std::string& full_path, int) {
@@ -195,7 +192,7 @@ int LinuxPlatform::RecycleUserHomePathIsExist(const std::string& full_path, int)
   // /<user>/#recycle[/...] below the home folders.
   const size_t user_end = rest.find('/', 1);
   if (rest.size() < 2 || user_end == std::string::npos || user_end == 1) return 0;
-  return IsAtOrBelow(rest.substr(user_end), std::string("/") + kRecycleBin) ? 1 : 0;
+  return IsPathAtOrBelow(rest.substr(user_end), std::string("/") + kRecycleBin) ? 1 : 0;
 }
 
 int LinuxPlatform::ServiceUserHomeIsEnabled() {

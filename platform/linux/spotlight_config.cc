@@ -2,6 +2,7 @@
 
 #include <algorithm>
 
+#include "common/index_fields.h"
 #include "platform/platform.h"
 
 #ifndef CORVLUMEX_SPOTLIGHT_MAPPINGS
@@ -61,7 +62,7 @@ std::string WriteSpotlightConfig(const SpotlightConfig& config,
   text += "\telasticsearch:port = " + std::to_string(kSpotlightResponderPort) + "\n";
   text += "\telasticsearch:use tls = no\n";
   text += "\telasticsearch:mappings = " CORVLUMEX_SPOTLIGHT_MAPPINGS "\n";
-  text += "\telasticsearch:default_fields = \"CORVMDFSName\", \"CORVMDTextContent\"\n";
+  text += std::string("\telasticsearch:default_fields = \"") + kFieldFSName + "\", \"" + kFieldTextContent + "\"\n";
   // Finder asks for attributes and kinds we do not index: those parts of a
   // search are dropped instead of failing the whole search.
   text += "\telasticsearch:ignore unknown attribute = yes\n";

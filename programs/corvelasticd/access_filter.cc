@@ -79,19 +79,13 @@ std::vector<gid_t> GroupsOfUser(uid_t uid, gid_t gid) {
 
 }  // namespace
 
-PeerIdentity ReadPeerIdentity(int fd) {
+PeerIdentity ReadPeerIdentity(int fd, const fileindex::PeerCredentials& credentials) {
   PeerIdentity peer;
-  struct ucred credentials;
-  socklen_t length = sizeof(credentials);
-  if (getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &credentials, &length) != 0) {
-    CORV_LOG_FAILED("getsockopt(SO_PEERCRED)");
-    return peer;
-  }
   peer.uid = credentials.uid;
   peer.gid = credentials.gid;
   peer.pid = credentials.pid;
   std::vector<gid_t> groups(256);
-  length = static_cast<socklen_t>(groups.size() * sizeof(gid_t));
+  socklen_t length = static_cast<socklen_t>(groups.size() * sizeof(gid_t));
   if (getsockopt(fd, SOL_SOCKET, SO_PEERGROUPS, groups.data(), &length) == 0) {
     groups.resize(length / sizeof(gid_t));
     peer.groups = groups;

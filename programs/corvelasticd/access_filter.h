@@ -10,6 +10,8 @@
 #include <string>
 #include <vector>
 
+#include "fileindex/unix_listener.h"
+
 namespace corvlumex {
 namespace elasticd {
 
@@ -20,9 +22,10 @@ struct PeerIdentity {
   std::vector<gid_t> groups;  // supplementary groups
 };
 
-// The connected process's credentials (SO_PEERCRED, SO_PEERGROUPS). An
-// identity that cannot be read is left as uid -1, which may read nothing.
-PeerIdentity ReadPeerIdentity(int fd);
+// The connected process's identity: its credentials as the listener read
+// them, with its supplementary groups (SO_PEERGROUPS, else the account
+// database's groups of the user).
+PeerIdentity ReadPeerIdentity(int fd, const fileindex::PeerCredentials& credentials);
 
 // The identity of the user `name` as the system's account database gives it:
 // uid, primary gid and every group the user belongs to (getgrouplist), so a

@@ -7,6 +7,7 @@
 #include <cstring>
 #include <optional>
 
+#include "common/index_fields.h"
 #include "programs/corvelasticd/daemon_error.h"
 #include "programs/corvelasticd/text_analysis.h"
 
@@ -24,7 +25,6 @@ constexpr size_t kMaxClauseWords = 64;        // words of one match/term on a te
 constexpr size_t kMaxQueryWords = 256;        // words of the whole query
 constexpr size_t kMaxQueryTextBytes = 64u << 10;  // bytes of every text in the query
 constexpr size_t kMaxSubstringBytes = 1024;   // a name substring (names are at most 255 bytes)
-constexpr const char* kAllField = "_all";
 
 [[noreturn]] void Bad(const std::string& what) { throw DaemonError(kCodeBadQuery, "Bad query: " + what); }
 
@@ -157,7 +157,7 @@ class Parser {
       }
       groups.push_back({field_def.analyzer, {field_def.Column()}});
     };
-    if (field == kAllField) {
+    if (field == kFieldAll) {
       for (const FieldSpec* field_def : schema_.TextFields()) {
         if (field_def->in_all) add(*field_def);
       }
@@ -170,7 +170,7 @@ class Parser {
   // The word columns of the file names searched by the catch-all field.
   std::vector<std::string> NameWordColumns(const std::string& field) const {
     std::vector<std::string> columns;
-    if (field != kAllField) return columns;
+    if (field != kFieldAll) return columns;
     for (const FieldSpec* field_def : schema_.TextFields()) {
       if (field_def->in_all && field_def->kind == FieldKind::kNgram) columns.push_back(field_def->Column());
     }
@@ -305,7 +305,7 @@ class Parser {
     } else {
       text = ScalarText(field, argument);
     }
-    if (field == kAllField) return Words(field, text, any, negated);
+    if (field == kFieldAll) return Words(field, text, any, negated);
     const FieldSpec& field_def = Field(field);
     if (IsKey(field_def)) return KeyIn({text});
     switch (field_def.kind) {
@@ -327,7 +327,7 @@ class Parser {
       text = ScalarText(field, argument);
     }
     CountText(text);
-    if (field != kAllField) {
+    if (field != kFieldAll) {
       const FieldSpec& field_def = Field(field);
       if (IsKey(field_def)) return KeyIn({text});
       switch (field_def.kind) {
@@ -366,7 +366,7 @@ class Parser {
 
   QueryNode Term(const std::string& field, const Json::Value& argument, bool negated) {
     const Json::Value& value = argument.isObject() ? argument["value"] : argument;
-    if (field == kAllField) return Words(field, ScalarText(field, value), false, negated);
+    if (field == kFieldAll) return Words(field, ScalarText(field, value), false, negated);
     const FieldSpec& field_def = Field(field);
     if (IsKey(field_def)) return KeyIn({ScalarText(field, value)});
     switch (field_def.kind) {
@@ -379,7 +379,7 @@ class Parser {
 
   QueryNode Terms(const std::string& field, const Json::Value& argument, bool negated) {
     if (!argument.isArray()) Bad("\"terms\" on \"" + field + "\" needs an array");
-    const FieldSpec* field_def = field == kAllField ? nullptr : &Field(field);
+    const FieldSpec* field_def = field == kFieldAll ? nullptr : &Field(field);
     if (field_def != nullptr && IsKey(*field_def)) {
       std::vector<std::string> keys;
       for (const Json::Value& value : argument) {
@@ -413,7 +413,7 @@ class Parser {
     CountText(text);
     std::vector<std::string> columns;
     std::vector<std::string> tokens;
-    if (field == kAllField) {
+    if (field == kFieldAll) {
       for (const FieldSpec* field_def : schema_.TextFields()) {
         if (field_def->in_all && field_def->kind != FieldKind::kKeyword) columns.push_back(field_def->Column());
       }

@@ -4,6 +4,7 @@
 #include <chrono>
 #include <map>
 
+#include "common/index_fields.h"
 #include "programs/corvelasticd/daemon_error.h"
 #include "programs/corvelasticd/highlight.h"
 #include "programs/corvelasticd/request_args.h"
@@ -25,7 +26,7 @@ constexpr size_t kMaxMarkBytes = 64;         // highlight marks: "<em>", a termi
 constexpr std::chrono::milliseconds kOpeningWait{2000};
 
 struct SortRequest {
-  std::string field = "_score";
+  std::string field = kSortByScore;
   bool descending = true;
   bool given = false;
 };
@@ -38,12 +39,12 @@ SortRequest ParseSort(const Json::Value& sort) {
   request.given = true;
   if (first.isString()) {
     request.field = first.asString();
-    request.descending = request.field == "_score";
+    request.descending = request.field == kSortByScore;
   } else if (first.isObject() && first["field"].isString()) {
     request.field = first["field"].asString();
     const Json::Value& given = first["order"];
     if (!given.isNull() && !given.isString()) throw DaemonError(kCodeBadArgument, "\"order\" must be \"asc\" or \"desc\"");
-    const std::string order = given.isNull() ? (request.field == "_score" ? "desc" : "asc") : given.asString();
+    const std::string order = given.isNull() ? (request.field == kSortByScore ? "desc" : "asc") : given.asString();
     if (order != "asc" && order != "desc") throw DaemonError(kCodeBadArgument, "\"order\" must be \"asc\" or \"desc\"");
     request.descending = order == "desc";
   } else {
@@ -55,9 +56,9 @@ SortRequest ParseSort(const Json::Value& sort) {
 SortSpec SortFor(const SortRequest& request, const IndexSchema& schema) {
   SortSpec field_def;
   field_def.descending = request.descending;
-  if (request.field == "_score") {
+  if (request.field == kSortByScore) {
     field_def.by = SortSpec::By::kScore;
-  } else if (request.field == "_key" || request.field == schema.property_id()) {
+  } else if (request.field == kSortByKey || request.field == schema.property_id()) {
     field_def.by = SortSpec::By::kKey;
   } else {
     const FieldSpec* field = schema.Find(request.field);
@@ -127,9 +128,9 @@ Json::Value RunSearch(const IndexRegistry& registry, const Json::Value& data, co
   std::string highlight_field;
   const Json::Value& highlight = data["highlight"];
   if (highlight.isBool() && highlight.asBool()) {
-    highlight_field = "CORVMDTextContent";
+    highlight_field = kFieldTextContent;
   } else if (highlight.isObject()) {
-    highlight_field = OptionalString(highlight, "field", "CORVMDTextContent");
+    highlight_field = OptionalString(highlight, "field", kFieldTextContent);
     style.size = static_cast<size_t>(std::clamp<int64_t>(OptionalInt(highlight, "size", 160), 20, 2000));
     style.pre = OptionalString(highlight, "pre", style.pre);
     style.post = OptionalString(highlight, "post", style.post);
@@ -177,7 +178,7 @@ Json::Value RunSearch(const IndexRegistry& registry, const Json::Value& data, co
   // Each index gave its hits in order; merge them into one order.
   std::stable_sort(found.begin(), found.end(), [&](const Found& a, const Found& b) {
     int order = 0;
-    if (sort.field == "_score") {
+    if (sort.field == kSortByScore) {
       order = a.hit.score > b.hit.score ? -1 : a.hit.score < b.hit.score ? 1 : 0;
       if (!sort.descending) order = -order;
     } else if (!std::holds_alternative<std::nullptr_t>(a.hit.sort_value) || !std::holds_alternative<std::nullptr_t>(b.hit.sort_value)) {
@@ -185,7 +186,7 @@ Json::Value RunSearch(const IndexRegistry& registry, const Json::Value& data, co
       if (sort.descending) order = -order;
     } else {
       order = a.hit.key.compare(b.hit.key);
-      if (sort.descending && sort.field != "_score") order = -order;
+      if (sort.descending && sort.field != kSortByScore) order = -order;
     }
     if (order != 0) return order < 0;
     return a.index < b.index;

@@ -2,6 +2,7 @@
 
 #include <vector>
 
+#include "common/index_fields.h"
 #include "programs/corvelasticd/text_analysis.h"
 
 namespace corvlumex {
@@ -69,7 +70,7 @@ std::string WeightedRank(const IndexSchema& schema) {
   const std::vector<const FieldSpec*> fields = schema.TextFields();
   for (const FieldSpec* field : fields) {
     const double weight = field->kind == FieldKind::kNgram        ? kNameWeight
-                          : field->name == kRankContentField      ? kContentWeight
+                          : field->name == kFieldTextContent      ? kContentWeight
                                                                   : kMetadataWeight;
     out += ", " + std::to_string(weight);
   }
@@ -78,7 +79,7 @@ std::string WeightedRank(const IndexSchema& schema) {
 }
 
 int RecencyCode(const IndexSchema& schema) {
-  const FieldSpec* field = schema.Find(kRankRecencyField);
+  const FieldSpec* field = schema.Find(kFieldContentChangeDate);
   return field != nullptr && field->kind == FieldKind::kNumber ? field->code : -1;
 }
 

@@ -16,10 +16,6 @@
 namespace corvlumex {
 namespace elasticd {
 
-// Fields the daemon knows by name, as it knows the highlight's default.
-inline constexpr char kRankContentField[] = "CORVMDTextContent";
-inline constexpr char kRankRecencyField[] = "CORVMDFSContentChangeDate";
-
 class NameTiers {
  public:
   // Reads, in the reader's open transaction, which documents match the

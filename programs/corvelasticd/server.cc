@@ -35,25 +35,6 @@ constexpr int kMaxIdleWorkers = 4;
 // A request at least this large gives its memory back to the system once answered.
 constexpr size_t kTrimAfterBytes = 1u << 20;
 
-sockaddr_un Address(const std::string& path) {
-  sockaddr_un address;
-  memset(&address, 0, sizeof(address));
-  address.sun_family = AF_UNIX;
-  strncpy(address.sun_path, path.c_str(), sizeof(address.sun_path) - 1);
-  return address;
-}
-
-// True when a daemon answers on the socket file.
-bool SomeoneListens(const std::string& path) {
-  const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  if (fd < 0) return false;
-  const sockaddr_un address = Address(path);
-  const bool listening = connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof(address)) == 0;
-  close(fd);
-  errno = 0;
-  return listening;
-}
-
 void SendAnswer(int fd, const std::string& answer) {
   try {
     fileindex::WriteFrame(fd, answer);
@@ -69,38 +50,20 @@ Server::Server(ServerOptions options, Dispatcher& dispatcher) : options_(std::mo
 }
 
 Server::~Server() {
-  if (listen_fd_ >= 0) {
-    close(listen_fd_);
-    unlink(options_.socket_path.c_str());
-  }
+  listener_.reset();
   close(wake_pipe_[0]);
   close(wake_pipe_[1]);
 }
 
 void Server::Listen() {
-  const std::string& path = options_.socket_path;
-  if (path.size() >= sizeof(sockaddr_un::sun_path)) throw std::runtime_error("socket path too long: " + path);
-  struct stat info;
-  if (lstat(path.c_str(), &info) == 0) {
-    if (!S_ISSOCK(info.st_mode)) throw std::runtime_error(path + " exists and is not a socket");
-    if (SomeoneListens(path)) throw std::runtime_error("another daemon already answers on " + path);
-    unlink(path.c_str());
+  fileindex::UnixListenerOptions listen_options;
+  listen_options.mode = options_.socket_mode;
+  listen_options.group = options_.socket_group;
+  try {
+    listener_ = std::make_unique<fileindex::UnixListener>(options_.socket_path, listen_options);
+  } catch (const Error& error) {
+    throw std::runtime_error(error.reason);
   }
-  // Non-blocking: every waiting worker may be told of a connection another one takes.
-  listen_fd_ = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
-  if (listen_fd_ < 0) throw std::runtime_error(std::string("socket: ") + strerror(errno));
-  const sockaddr_un address = Address(path);
-  // Nobody may connect before the mode below is in place.
-  const mode_t old_mask = umask(0177);
-  const int bound = bind(listen_fd_, reinterpret_cast<const sockaddr*>(&address), sizeof(address));
-  umask(old_mask);
-  if (bound != 0) throw std::runtime_error("bind " + path + ": " + strerror(errno));
-  if (options_.socket_group != static_cast<gid_t>(-1) && chown(path.c_str(), static_cast<uid_t>(-1), options_.socket_group) != 0) {
-    throw std::runtime_error("chown " + path + ": " + strerror(errno));
-  }
-  if (chmod(path.c_str(), options_.socket_mode) != 0) throw std::runtime_error("chmod " + path + ": " + strerror(errno));
-  if (listen(listen_fd_, 128) != 0) throw std::runtime_error(std::string("listen: ") + strerror(errno));
-  errno = 0;
 }
 
 void Server::Stop() {
@@ -144,7 +107,7 @@ void Server::StartWorker() {
   }
 }
 
-int Server::Accept(int poll_fd) {
+int Server::Accept(int poll_fd, fileindex::PeerCredentials* peer) {
   for (;;) {
     struct epoll_event event;
     const int ready = epoll_wait(poll_fd, &event, 1, -1);
@@ -154,13 +117,13 @@ int Server::Accept(int poll_fd) {
     }
     if (ready <= 0) continue;
     if (event.data.fd == wake_pipe_[0]) return -1;
-    const int fd = accept4(listen_fd_, nullptr, nullptr, SOCK_CLOEXEC);
+    const int fd = listener_->Accept(peer);
     if (fd >= 0) return fd;
     if (errno == EMFILE || errno == ENFILE || errno == ENOBUFS || errno == ENOMEM) {
       // Out of descriptors or memory: let the connections in progress end.
       SleepFor(std::chrono::milliseconds(10));
     }
-    errno = 0;  // another worker took it, or the client gave up
+    errno = 0;  // another worker took it, or the client gave up (or hid who it is)
   }
 }
 
@@ -168,18 +131,20 @@ void Server::WorkerLoop() {
   // Each worker waits on its own epoll set; EPOLLEXCLUSIVE wakes one waiting
   // worker per connection, while a stop wakes them all.
   const int poll_fd = epoll_create1(EPOLL_CLOEXEC);
+  const int listen_fd = listener_->fd();
   struct epoll_event listen_event = {EPOLLIN | EPOLLEXCLUSIVE, {}};
-  listen_event.data.fd = listen_fd_;
+  listen_event.data.fd = listen_fd;
   struct epoll_event wake_event = {EPOLLIN, {}};
   wake_event.data.fd = wake_pipe_[0];
-  if (poll_fd < 0 || epoll_ctl(poll_fd, EPOLL_CTL_ADD, listen_fd_, &listen_event) != 0 ||
+  if (poll_fd < 0 || epoll_ctl(poll_fd, EPOLL_CTL_ADD, listen_fd, &listen_event) != 0 ||
       epoll_ctl(poll_fd, EPOLL_CTL_ADD, wake_pipe_[0], &wake_event) != 0) {
     CORV_LOG_FAILED("epoll(listen socket)");
   }
   std::unique_lock<std::mutex> lock(mutex_);
   while (!stopping_) {
     lock.unlock();
-    const int fd = poll_fd >= 0 ? Accept(poll_fd) : -1;
+    fileindex::PeerCredentials credentials;
+    const int fd = poll_fd >= 0 ? Accept(poll_fd, &credentials) : -1;
     lock.lock();
     --waiting_;
     if (fd < 0 || stopping_) {
@@ -194,7 +159,7 @@ void Server::WorkerLoop() {
       ++waiting_;
       continue;
     }
-    const PeerIdentity peer = ReadPeerIdentity(fd);
+    const PeerIdentity peer = ReadPeerIdentity(fd, credentials);
     const bool counted = peer.uid != 0 && std::find(options_.trusted_uids.begin(), options_.trusted_uids.end(), peer.uid) ==
                                               options_.trusted_uids.end();
     if (counted && per_user_[peer.uid] >= options_.max_clients_per_user) {

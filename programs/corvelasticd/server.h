@@ -12,10 +12,12 @@
 #include <condition_variable>
 #include <mutex>
 #include <map>
+#include <memory>
 #include <set>
 #include <string>
 #include <vector>
 
+#include "fileindex/unix_listener.h"
 #include "programs/corvelasticd/dispatcher.h"
 
 namespace corvlumex {
@@ -57,12 +59,12 @@ class Server {
   // With mutex_ held.
   void StartWorker();
   void WorkerLoop();
-  // The next connection, or -1 when the server stops.
-  int Accept(int poll_fd);
+  // The next connection and its peer, or -1 when the server stops.
+  int Accept(int poll_fd, fileindex::PeerCredentials* peer);
 
   ServerOptions options_;
   Dispatcher& dispatcher_;
-  int listen_fd_ = -1;
+  std::unique_ptr<fileindex::UnixListener> listener_;
   int wake_pipe_[2] = {-1, -1};
   std::mutex mutex_;
   std::condition_variable all_done_;

@@ -1,4 +1,5 @@
 #include "programs/corvnotifyd/watch_tree.h"
+#include "common/path_below.h"
 
 #include <dirent.h>
 #include <sys/inotify.h>
@@ -17,11 +18,6 @@ namespace {
 constexpr uint32_t kWatchEvents = IN_CREATE | IN_DELETE | IN_CLOSE_WRITE | IN_ATTRIB | IN_MOVED_FROM |
                                   IN_MOVED_TO | IN_DELETE_SELF | IN_MOVE_SELF;
 
-bool IsBelow(const std::string& path, const std::string& dir) {
-  if (dir == "/") return path.size() > 1 && path[0] == '/';
-  return path.size() > dir.size() && path[dir.size()] == '/' && path.compare(0, dir.size(), dir) == 0;
-}
-
 std::string Rebase(const std::string& path, const std::string& from, const std::string& to) {
   return to + path.substr(from.size());
 }
@@ -36,7 +32,7 @@ bool WatchRoot::Ignores(std::string_view name) const {
 
 bool WatchRoot::Covers(const std::string& candidate) const {
   if (candidate == path) return true;
-  if (!IsBelow(candidate, path)) return false;
+  if (!IsPathStrictlyBelow(candidate, path)) return false;
   size_t start = path == "/" ? 1 : path.size() + 1;
   while (start <= candidate.size()) {
     size_t end = candidate.find('/', start);
@@ -124,8 +120,8 @@ void WatchTree::RemoveSubtree(const std::string& path) {
   std::vector<int> doomed;
   const auto self = by_path_.find(path);
   if (self != by_path_.end()) doomed.push_back(self->second);
-  const std::string prefix = path == "/" ? "/" : path + "/";
-  for (auto it = by_path_.lower_bound(prefix); it != by_path_.end() && IsBelow(it->first, path); ++it) {
+  const std::string prefix = PrefixOfPathsBelow(path);
+  for (auto it = by_path_.lower_bound(prefix); it != by_path_.end() && IsPathStrictlyBelow(it->first, path); ++it) {
     doomed.push_back(it->second);
   }
   for (int wd : doomed) {
@@ -138,8 +134,8 @@ void WatchTree::MoveSubtree(const std::string& from, const std::string& to) {
   std::vector<int> moved;
   const auto self = by_path_.find(from);
   if (self != by_path_.end()) moved.push_back(self->second);
-  const std::string prefix = from == "/" ? "/" : from + "/";
-  for (auto it = by_path_.lower_bound(prefix); it != by_path_.end() && IsBelow(it->first, from); ++it) {
+  const std::string prefix = PrefixOfPathsBelow(from);
+  for (auto it = by_path_.lower_bound(prefix); it != by_path_.end() && IsPathStrictlyBelow(it->first, from); ++it) {
     moved.push_back(it->second);
   }
   for (int wd : moved) by_path_.erase(by_wd_[wd].path);

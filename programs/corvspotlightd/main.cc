@@ -12,6 +12,7 @@
 #include <cstdio>
 
 #include "common/log.h"
+#include "common/index_fields.h"
 #include "fileindex/elastic/schema.h"
 #include "programs/corvspotlightd/http_listener.h"
 #include "programs/corvspotlightd/search_handler.h"
@@ -23,7 +24,7 @@ using corvlumex::spotlightd::ListenerOptions;
 
 // Words without a field: the file's name and its text, as Finder means them.
 std::vector<std::string> DefaultFields() {
-  return {corvlumex::fileindex::elastic::kFieldFSName, "CORVMDTextContent"};
+  return {corvlumex::kFieldFSName, corvlumex::kFieldTextContent};
 }
 
 }  // namespace

@@ -190,7 +190,7 @@ FieldTable FieldTable::FromMappings(const Json::Value& mappings) {
       kind = FieldKind::kNumber;
     } else if (type == "bool") {
       kind = FieldKind::kBool;
-    } else if (name == fileindex::elastic::kFieldFSName) {
+    } else if (name == kFieldFSName) {
       kind = FieldKind::kName;
     } else if (name == table.key_field_) {
       kind = FieldKind::kKey;

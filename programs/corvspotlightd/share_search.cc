@@ -1,7 +1,10 @@
 #include "programs/corvspotlightd/share_search.h"
 
 #include "common/error.h"
+#include "common/index_fields.h"
+#include "common/path_below.h"
 #include "fileindex/elastic/comm.h"
+#include "fileindex/elastic/daemon_codes.h"
 #include "fileindex/elastic/schema.h"
 #include "fileindex/util.h"
 #include "sdk/share.h"
@@ -11,15 +14,6 @@ namespace spotlightd {
 namespace {
 
 constexpr char kAllIndexes[] = "_all";
-// corvelasticd's answers that mean "the query is at fault" and "no index".
-constexpr int kElasticBadQuery = 2030;
-constexpr int kElasticBadArgument = 2002;
-constexpr int kElasticNoIndex = 2010;
-
-bool IsBelow(const std::string& path, const std::string& folder) {
-  return path.size() > folder.size() && path.compare(0, folder.size(), folder) == 0 &&
-         (folder.back() == '/' || path[folder.size()] == '/');
-}
 
 std::string WithoutTrailingSlash(std::string path) {
   while (path.size() > 1 && path.back() == '/') path.pop_back();
@@ -33,7 +27,7 @@ ShareTarget ShareByName(const std::string& share_name) {
 
 Json::Value PathPrefix(const std::string& folder) {
   Json::Value clause(Json::objectValue);
-  clause["prefix"][fileindex::elastic::kFieldPath] = folder.back() == '/' ? folder : folder + "/";
+  clause["prefix"][kFieldPath] = PrefixOfPathsBelow(folder);
   return clause;
 }
 
@@ -56,7 +50,7 @@ ShareTarget ResolveShare(const std::string& index_name, const std::vector<std::s
     if (target.index_id != index_name) continue;
     for (const std::string& scope : scopes) {
       const std::string folder = WithoutTrailingSlash(scope);
-      if (folder != target.share_path && !IsBelow(folder, target.share_path)) {
+      if (!IsPathAtOrBelow(folder, target.share_path)) {
         throw SearchFailure(400, "parsing_exception",
                             "the scope \"" + scope + "\" is not in the share of index \"" + index_name + "\"");
       }
@@ -83,8 +77,8 @@ SearchPage SearchShare(const ShareTarget& share, const std::vector<std::string>&
   data["from"] = from;
   data["size"] = size;
   // Key order: pages of one search never overlap or skip, and no scoring.
-  data["sort"] = "_key";
-  data["load_field"].append(fileindex::elastic::kFieldPath);
+  data["sort"] = kSortByKey;
+  data["load_field"].append(kFieldPath);
   data["track_total"] = true;
 
   Json::Value answer;
@@ -92,17 +86,17 @@ SearchPage SearchShare(const ShareTarget& share, const std::vector<std::string>&
     SendRequestImpl(answer, request);
   } catch (const Error& error) {
     const int code = static_cast<int>(error.code);
-    if (code == kElasticBadQuery || code == kElasticBadArgument) {
+    if (code == elasticd::kCodeBadQuery || code == elasticd::kCodeBadArgument) {
       throw SearchFailure(400, "query_shard_exception", error.reason);
     }
-    if (code == kElasticNoIndex) throw SearchFailure(404, "index_not_found_exception", error.reason);
+    if (code == elasticd::kCodeIndexNotFound) throw SearchFailure(404, "index_not_found_exception", error.reason);
     throw SearchFailure(503, "unavailable_shards_exception", std::string("the search daemon: ") + error.what());
   }
   SearchPage page;
   const Json::Value& result = answer["data"];
   page.total = result["total"].asInt64();
   for (const Json::Value& hit : result["hits"]) {
-    const Json::Value& path = hit["fields"][fileindex::elastic::kFieldPath];
+    const Json::Value& path = hit["fields"][kFieldPath];
     if (path.isString()) page.paths.push_back(path.asString());
   }
   return page;

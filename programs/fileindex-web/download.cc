@@ -13,6 +13,7 @@
 #include <cstring>
 
 #include "common/error.h"
+#include "common/path_below.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/util.h"
 #include "platform/linux/extract/worker_protocol.h"
@@ -111,7 +112,7 @@ OpenedFile OpenForDownload(const std::string& path, const Account& account) {
   opened.real_path = RealPath("/proc/self/fd/" + std::to_string(fd));
   struct stat info;
   const bool regular = fstat(fd, &info) == 0 && S_ISREG(info.st_mode);
-  const bool inside = opened.real_path.compare(0, share_dir.size() + 1, share_dir + "/") == 0;
+  const bool inside = IsPathStrictlyBelow(opened.real_path, share_dir);
   if (!regular || !inside) {
     close(fd);
     throw ApiError(403, inside ? path + " is not a file" : path + " leads outside its share",

@@ -2,6 +2,7 @@
 
 #include "common/json_util.h"
 #include "fileindex/elastic/comm.h"
+#include "fileindex/elastic/daemon_codes.h"
 #include "programs/fileindex-web/api_error.h"
 
 namespace corvlumex {
@@ -21,7 +22,7 @@ Json::Value AskSearchDaemon(const Json::Value& request) {
   const int code = answer["error"]["code"].asInt();
   const std::string reason = answer["error"]["msg"].isString() ? answer["error"]["msg"].asString() : answer["error"]["reason"].asString();
   if (IsElasticBusyCode(code)) throw ApiError(503, "the search index is busy: " + reason, "try again in a moment", code);
-  if (code >= 2000 && code < 2099) throw ApiError(400, "the search was refused: " + reason, "change the search", code);
+  if (code >= elasticd::kCodeBadRequest && code < elasticd::kCodeInternal) throw ApiError(400, "the search was refused: " + reason, "change the search", code);
   throw ApiError(500, "the search failed: " + reason, "ask an administrator", code);
 }
 

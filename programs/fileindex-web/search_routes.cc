@@ -5,6 +5,7 @@
 #include <memory>
 
 #include "common/error.h"
+#include "common/index_fields.h"
 #include "fileindex/elastic/schema.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/util.h"
@@ -62,7 +63,7 @@ std::vector<std::string> SharesParam(const Params& params) {
 
 Json::Value HitOut(const Json::Value& hit) {
   const Json::Value& fields = hit["fields"];
-  const std::string full_path = fields[elastic::kFieldPath].asString();
+  const std::string full_path = fields[kFieldPath].asString();
   Json::Value out(Json::objectValue);
   out["path"] = full_path;
   // Shown as /share/folder/name: the form people see on their network drives.
@@ -76,9 +77,9 @@ Json::Value HitOut(const Json::Value& hit) {
   out["name"] = share_path.substr(slash + 1);
   out["folder"] = slash == 0 ? "/" : share_path.substr(0, slash);
   out["share"] = share;
-  out["is_dir"] = fields["CORVMDIsDir"].asBool();
-  out["size"] = fields["CORVMDFSSize"].asInt64();
-  out["modified"] = fields["CORVMDFSContentChangeDate"].asInt64();
+  out["is_dir"] = fields[kFieldIsDir].asBool();
+  out["size"] = fields[kFieldFSSize].asInt64();
+  out["modified"] = fields[kFieldContentChangeDate].asInt64();
   if (hit.isMember("highlight")) out["highlight"] = SnippetPieces(hit["highlight"].asString());
   return out;
 }

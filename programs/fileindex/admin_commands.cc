@@ -7,6 +7,7 @@
 #include <iostream>
 
 #include "common/error.h"
+#include "common/path_below.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/status_mgr.h"
@@ -107,7 +108,7 @@ void AddUser(CLI::App& app, Output& output) {
     const fileindex::FolderMgr configured;
     for (const auto& folder : configured.Folders()) {
       const std::string& path = folder->GetPath();
-      if (path == home || path.compare(0, home.size() + 1, home + "/") == 0) ++moved;
+      if (IsPathAtOrBelow(path, home)) ++moved;
     }
     if (moved == 0) throw Error(kErrorFolderNotFound, "no indexed folder lies in the home of " + from + " (" + home + ")");
     fileindex::UserRename(from, to);

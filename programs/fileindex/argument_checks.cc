@@ -6,6 +6,7 @@
 #include <set>
 
 #include "common/error.h"
+#include "common/path_below.h"
 #include "common/sys.h"
 #include "fileindex/elastic/comm.h"
 #include "fileindex/folder_mgr.h"
@@ -106,7 +107,7 @@ std::vector<std::string> SharesOnVolume(const std::string& volume) {
   std::vector<std::string> shares;
   for (const std::string& name : sdk::SDKShare::Enum()) {
     const std::string dir = sdk::SDKShare(name).GetPath();
-    if (dir.compare(0, path.size() + 1, path + "/") == 0) shares.push_back(name);
+    if (IsPathStrictlyBelow(dir, path)) shares.push_back(name);
   }
   if (shares.empty()) throw Error(kErrorBadArgument, "no share lies on " + path + "; the shares are: " + KnownShares());
   return shares;

@@ -7,6 +7,7 @@
 #include <sstream>
 
 #include "common/error.h"
+#include "common/index_fields.h"
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/elastic/schema.h"
 #include "fileindex/file_type.h"
@@ -35,7 +36,7 @@ struct SearchArgs {
   unsigned size = 20;
 };
 
-// Points the query's text clauses (those on "_all") at file names only:
+// Points the query's text clauses (those on kFieldAll) at file names only:
 // each word, phrase or prefix becomes a part of the name to find.
 Json::Value NamesOnly(const Json::Value& clause) {
   if (!clause.isObject() || clause.size() != 1) return clause;
@@ -48,9 +49,9 @@ Json::Value NamesOnly(const Json::Value& clause) {
     }
     return out;
   }
-  if ((kind != "match" && kind != "match_phrase" && kind != "prefix") || !body.isMember("_all")) return clause;
+  if ((kind != "match" && kind != "match_phrase" && kind != "prefix") || !body.isMember(kFieldAll)) return clause;
   std::vector<std::string> parts;
-  const std::string text = body["_all"].asString();
+  const std::string text = body[kFieldAll].asString();
   if (kind == "match") {
     std::istringstream words(text);
     for (std::string word; words >> word;) parts.push_back(word);
@@ -60,7 +61,7 @@ Json::Value NamesOnly(const Json::Value& clause) {
   Json::Value out(Json::objectValue);
   for (const std::string& part : parts) {
     Json::Value match(Json::objectValue);
-    match["match"][elastic::kFieldSearchFileName] = part;
+    match["match"][kFieldSearchFileName] = part;
     out["bool"]["must"].append(match);
   }
   return out;
@@ -76,7 +77,7 @@ Json::Value ContentOnly(const Json::Value& clause) {
         out.append(converted);
       } else {
         const std::string key = member.name();
-        out[key == "_all" ? "CORVMDTextContent" : key] = converted;
+        out[key == kFieldAll ? kFieldTextContent : key] = converted;
       }
     }
     return out;
@@ -127,10 +128,10 @@ void PrintHits(const SearchArgs& args, const Json::Value& result) {
   std::vector<std::vector<std::string>> rows;
   for (const Json::Value& hit : hits) {
     const Json::Value& fields = hit["fields"];
-    const bool dir = fields["CORVMDIsDir"].asBool();
-    rows.push_back({fields[elastic::kFieldPath].asString() + (dir ? "/" : ""),
-                    dir ? "-" : HumanSize(fields["CORVMDFSSize"].asInt64()),
-                    HumanTime(fields["CORVMDFSContentChangeDate"].asInt64())});
+    const bool dir = fields[kFieldIsDir].asBool();
+    rows.push_back({fields[kFieldPath].asString() + (dir ? "/" : ""),
+                    dir ? "-" : HumanSize(fields[kFieldFSSize].asInt64()),
+                    HumanTime(fields[kFieldContentChangeDate].asInt64())});
   }
   if (!rows.empty()) PrintTable({"PATH", "SIZE", "MODIFIED"}, rows);
   for (const Json::Value& hit : hits) {
@@ -140,7 +141,7 @@ void PrintHits(const SearchArgs& args, const Json::Value& result) {
       if (c == '\n' || c == '\r' || c == '\t') c = ' ';
     }
     // A file's own control characters are shown escaped; only our bold reaches the terminal.
-    std::cout << "  " << Printable(hit["fields"][elastic::kFieldPath].asString()) << ": "
+    std::cout << "  " << Printable(hit["fields"][kFieldPath].asString()) << ": "
               << PrintableKeeping(snippet, {kBoldOn, kBoldOff}) << "\n";
   }
   const long long total = result["total"].asInt64();
@@ -198,12 +199,12 @@ void AddSuggest(CLI::App& app, Output& output) {
 Json::Value FailedRequest(const std::vector<std::string>& shares, unsigned from, unsigned size) {
   Json::Value data(Json::objectValue);
   if (!shares.empty()) data["ids"] = frontend::IndexIds(shares);
-  data["query"]["qsl"]["term"][elastic::kFieldExtractionFailed] = true;
+  data["query"]["qsl"]["term"][kFieldExtractionFailed] = true;
   data["from"] = from;
   data["size"] = size;
   data["track_total"] = true;
-  data["load_field"].append(elastic::kFieldPath);
-  data["load_field"].append(elastic::kFieldExtractionError);
+  data["load_field"].append(kFieldPath);
+  data["load_field"].append(kFieldExtractionError);
   Json::Value request(Json::objectValue);
   request["command"] = "search";
   request["data"] = data;
@@ -226,7 +227,7 @@ void AddFailed(CLI::App& app, Output& output) {
     if (output.json) return PrintJson(answer);
     std::vector<std::vector<std::string>> rows;
     for (const Json::Value& hit : answer["hits"]) {
-      rows.push_back({hit["fields"][elastic::kFieldPath].asString(), hit["fields"][elastic::kFieldExtractionError].asString()});
+      rows.push_back({hit["fields"][kFieldPath].asString(), hit["fields"][kFieldExtractionError].asString()});
     }
     if (!rows.empty()) PrintTable({"PATH", "REASON"}, rows);
     std::cout << answer["total"].asInt64() << " file(s) whose content could not be read\n";

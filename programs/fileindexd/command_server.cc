@@ -39,40 +39,20 @@ CommandServer::CommandServer(std::string socket_path, Handler handler, ReadOnly 
     : socket_path_(std::move(socket_path)), handler_(std::move(handler)), read_only_(std::move(read_only)), limits_(limits) {}
 
 CommandServer::~CommandServer() {
-  if (listen_fd_ >= 0) {
-    close(listen_fd_);
-    unlink(socket_path_.c_str());
-  }
+  listener_.reset();
   for (int fd : stop_pipe_) {
     if (fd >= 0) close(fd);
   }
 }
 
 void CommandServer::Listen() {
-  struct sockaddr_un address;
-  memset(&address, 0, sizeof(address));
-  address.sun_family = AF_UNIX;
-  CORV_CHECK_THROW(socket_path_.size() >= sizeof(address.sun_path), kErrorBadArgument,
-                   "socket path too long: " + socket_path_);
-  memcpy(address.sun_path, socket_path_.c_str(), socket_path_.size());
   CORV_CHECK_THROW(pipe2(stop_pipe_, O_CLOEXEC | O_NONBLOCK) != 0, kErrorSystem, "pipe failed");
-  listen_fd_ = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  CORV_CHECK_THROW(listen_fd_ < 0, kErrorSystem, "socket failed");
-  // A socket file nobody answers on is left from a crash: replace it.
-  const int probe = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  const bool live = probe >= 0 && connect(probe, reinterpret_cast<sockaddr*>(&address), sizeof(address)) == 0;
-  if (probe >= 0) close(probe);
-  errno = 0;
-  CORV_CHECK_THROW(live, kErrorSystem, "another fileindexd is serving " + socket_path_);
-  unlink(socket_path_.c_str());
-  errno = 0;
   const std::string dir = Dirname(socket_path_);
   if (!IsDirExist(dir, true)) mkdir(dir.c_str(), 0755);
   errno = 0;
-  CORV_CHECK_THROW(bind(listen_fd_, reinterpret_cast<sockaddr*>(&address), sizeof(address)) != 0, kErrorSystem,
-                   "bind failed: " + socket_path_);
-  chmod(socket_path_.c_str(), 0666);
-  CORV_CHECK_THROW(listen(listen_fd_, 64) != 0, kErrorSystem, "listen failed: " + socket_path_);
+  fileindex::UnixListenerOptions options;
+  options.mode = 0666;
+  listener_ = std::make_unique<fileindex::UnixListener>(socket_path_, options);
 }
 
 void CommandServer::Stop() {
@@ -83,7 +63,7 @@ void CommandServer::Stop() {
 
 void CommandServer::Run() {
   for (;;) {
-    struct pollfd fds[2] = {{listen_fd_, POLLIN, 0}, {stop_pipe_[0], POLLIN, 0}};
+    struct pollfd fds[2] = {{listener_->fd(), POLLIN, 0}, {stop_pipe_[0], POLLIN, 0}};
     if (poll(fds, 2, -1) < 0) {
       if (errno == EINTR) {
         errno = 0;
@@ -94,16 +74,10 @@ void CommandServer::Run() {
     }
     if (fds[1].revents & POLLIN) break;
     if (!(fds[0].revents & POLLIN)) continue;
-    const int fd = accept4(listen_fd_, nullptr, nullptr, SOCK_CLOEXEC);
-    if (fd < 0) {
+    fileindex::PeerCredentials peer;
+    const int fd = listener_->Accept(&peer);
+    if (fd < 0) {  // taken back by the client, or it hid who it is
       errno = 0;
-      continue;
-    }
-    struct ucred peer;
-    socklen_t peer_size = sizeof(peer);
-    if (getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &peer, &peer_size) != 0) {
-      errno = 0;
-      close(fd);
       continue;
     }
     // Root and the daemon's own user (the management operations) are never

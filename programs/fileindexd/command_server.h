@@ -16,6 +16,8 @@
 #include <set>
 #include <string>
 
+#include "fileindex/unix_listener.h"
+
 namespace corvlumex {
 namespace fileindexd {
 
@@ -38,8 +40,10 @@ class CommandServer {
   CommandServer(std::string socket_path, Handler handler, ReadOnly read_only, CommandLimits limits = {});
   ~CommandServer();
 
-  // Binds the socket (a stale socket file is replaced; a live one is an
-  // Error: another daemon runs). Mode 0666: any user may ask for status.
+  // Binds the socket (a stale socket file is replaced; a live one, or a
+  // file that is not a socket, is an Error: another daemon runs, or the path
+  // is wrong). Mode 0666: any user may ask for status. The socket's folder
+  // is made when missing.
   void Listen();
   // Serves until Stop(), then waits for the connections in progress. Each
   // connection's request is read on its own thread (so a client that sends
@@ -59,7 +63,7 @@ class CommandServer {
   Handler handler_;
   ReadOnly read_only_;
   CommandLimits limits_;
-  int listen_fd_ = -1;
+  std::unique_ptr<fileindex::UnixListener> listener_;
   int stop_pipe_[2] = {-1, -1};
   std::mutex handler_mutex_;
   // The connections being served. Shared with their threads, which touch it

@@ -1,6 +1,7 @@
 #include "programs/fileindexd/index_rules.h"
 
 #include "common/file_util.h"
+#include "common/path_below.h"
 #include "fileindex/file_type.h"
 #include "fileindex/util.h"
 #include "platform/platform.h"
@@ -28,7 +29,7 @@ bool IndexRules::IsExcludedName(const std::string& name) { return fileindex::IsS
 bool IndexRules::IsExcluded(const std::string& full_path) const {
   // Components below the share directory; the share's own path is the
   // administrator's choice and is not judged by name.
-  size_t start = StringStartWith(full_path, share_dir_ + "/") ? share_dir_.size() + 1 : 1;
+  size_t start = IsPathStrictlyBelow(full_path, share_dir_) ? share_dir_.size() + 1 : 1;
   while (start < full_path.size()) {
     size_t end = full_path.find('/', start);
     if (end == std::string::npos) end = full_path.size();

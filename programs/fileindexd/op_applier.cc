@@ -12,6 +12,7 @@
 #include "common/file_util.h"
 #include "common/json_util.h"
 #include "common/log.h"
+#include "fileindex/elastic/daemon_codes.h"
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/elastic/schema.h"
 #include "programs/fileindexd/folder_walker.h"
@@ -21,20 +22,6 @@ namespace fileindexd {
 namespace elastic = fileindex::elastic;
 
 namespace {
-
-// Codes of the search daemon (docs/corvelasticd.md) that concern the index
-// as a whole.
-constexpr int kSearchBusy = 1400;
-constexpr int kSearchOpening = 1401;
-constexpr int kSearchIndexNotFound = 2010;
-constexpr int kSearchIndexFailed = 2014;
-constexpr int kSearchStorage = 2040;
-constexpr int kSearchNoSpace = 2041;
-constexpr int kSearchDocumentNotFound = 2020;
-
-constexpr char kFieldContentDate[] = "CORVMDFSContentChangeDate";
-constexpr char kFieldAttrDate[] = "CORVMDAttributeChangeDate";
-constexpr char kFieldSize[] = "CORVMDFSSize";
 
 using Kind = OpApplier::Kind;
 
@@ -58,12 +45,13 @@ bool IsBatchError(const Error& error) {
   switch (static_cast<int>(error.code)) {
     case kErrorSearchRequest:  // the daemon cannot be reached or answered nonsense
     case kErrorNoSpace:
-    case kSearchBusy:
-    case kSearchOpening:
-    case kSearchIndexNotFound:
-    case kSearchIndexFailed:
-    case kSearchStorage:
-    case kSearchNoSpace:
+    // the search daemon's codes that concern the index as a whole
+    case elasticd::kCodeBusy:
+    case elasticd::kCodeOpening:
+    case elasticd::kCodeIndexNotFound:
+    case elasticd::kCodeIndexFailed:
+    case elasticd::kCodeStorage:
+    case elasticd::kCodeNoSpace:
       return true;
     default:
       return false;
@@ -185,7 +173,7 @@ void OpApplier::Attr(const std::string& path) {
       progress_.Extracted(share_);
     } catch (const Error& error) {
       // Never stored (its category was off, or its create was lost): store it whole.
-      if (error.code != kSearchDocumentNotFound) throw;
+      if (error.code != elasticd::kCodeDocumentNotFound) throw;
       elastic::IndexUpsert(share_, path, verdict.need_meta);
       progress_.Extracted(share_);
     }
@@ -245,7 +233,7 @@ void OpApplier::Rename(const std::string& from, const std::string& to) {
       } catch (const Error& error) {
         // Nothing stored under the old name (it was never indexed, or the
         // queue folded a chain of renames): the new place is read from disk.
-        if (error.code != kSearchDocumentNotFound) throw;
+        if (error.code != elasticd::kCodeDocumentNotFound) throw;
       }
     });
   }
@@ -278,23 +266,14 @@ void OpApplier::Rename(const std::string& from, const std::string& to) {
 }
 
 std::unordered_map<std::string, OpApplier::Stamp> OpApplier::LoadIndexed(const std::string& prefix) {
-  Json::Value req(Json::objectValue);
-  req["command"] = "document_get_by_query";
-  req["data"]["id"] = elastic::GetFileIndexID(share_);
-  req["data"]["query"]["qsl"]["prefix"][elastic::kFieldPath] = prefix + "/";
-  Json::Value fields(Json::arrayValue);
-  for (const char* field : {elastic::kFieldPath, kFieldContentDate, kFieldAttrDate, kFieldSize}) fields.append(field);
-  req["data"]["query"]["load_field"] = fields;
-  Json::Value res;
-  elastic::SendRequestWithRetry(res, req);
+  const Json::Value docs =
+      elastic::IndexDocumentsBelow(share_, prefix, {kFieldPath, kFieldContentChangeDate, kFieldAttributeChangeDate, kFieldFSSize});
   std::unordered_map<std::string, Stamp> indexed;
-  const Json::Value& docs = res["data"];
-  CORV_CHECK_THROW(!docs.isArray(), kErrorQueryAnswer, "Malformed answer to the documents below " + prefix);
   indexed.reserve(docs.size());
   for (const Json::Value& doc : docs) {
-    if (!doc[elastic::kFieldPath].isString()) continue;
-    indexed[doc[elastic::kFieldPath].asString()] =
-        Stamp{IntField(doc, kFieldContentDate), IntField(doc, kFieldAttrDate), IntField(doc, kFieldSize)};
+    if (!doc[kFieldPath].isString()) continue;
+    indexed[doc[kFieldPath].asString()] =
+        Stamp{IntField(doc, kFieldContentChangeDate), IntField(doc, kFieldAttributeChangeDate), IntField(doc, kFieldFSSize)};
   }
   return indexed;
 }

@@ -11,6 +11,7 @@
 #include "fileindex/constants.h"
 #include "fileindex/custom_event.h"
 #include "fileindex/elastic/comm.h"
+#include "fileindex/elastic/daemon_codes.h"
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/elastic/schema.h"
 #include "fileindex/folder_mgr.h"
@@ -28,8 +29,6 @@ namespace corvlumex {
 namespace fileindexd {
 namespace {
 
-constexpr int kSearchIndexNotFound = 2010;
-constexpr int kSearchNoSpace = 2041;  // the search daemon's volume is full
 // Saved beside the queue: the files whose extraction waits out their settle interval.
 constexpr char kSettleSuffix[] = ".settle";
 
@@ -129,7 +128,7 @@ void ShareWorker::Run() {
 void ShareWorker::RebuildSuggestions() {
   try {
     fileindex::elastic::UpdateTermSuggestion(sdk::SDKShare(share_).GetDBName(),
-                                             {fileindex::elastic::kFieldSearchFileName});
+                                             {kFieldSearchFileName});
   } catch (const Error& error) {
     // Suggestions are a convenience: the next round tries again.
     CORV_LOG("suggestions of share %s not rebuilt: code=%d, reason=%s", share_.c_str(), error.code,
@@ -140,7 +139,7 @@ void ShareWorker::RebuildSuggestions() {
 
 bool ShareWorker::IsVolumeFull(const Error& error) const {
   if (error.code == kErrorNoSpace) return true;  // IndexCommit marked the share already
-  if (static_cast<int>(error.code) != kSearchNoSpace) return false;
+  if (static_cast<int>(error.code) != elasticd::kCodeNoSpace) return false;
   try {
     if (sdk::SDKShare(share_).IsSpaceEnough()) return false;  // another volume's trouble: retry
     fileindex::StatusMgr().SetShareStatus(share_, fileindex::kShareStatusNeedReindex);
@@ -153,7 +152,7 @@ bool ShareWorker::IsVolumeFull(const Error& error) const {
 void ShareWorker::OnFailure(const Error& error, std::chrono::milliseconds& backoff) {
   CORV_LOG("indexing of share %s failed, retrying: code=%d, reason=%s", share_.c_str(), error.code,
            error.reason.c_str());
-  if (error.code == kSearchIndexNotFound) {
+  if (error.code == elasticd::kCodeIndexNotFound) {
     // The search daemon lost the share's index: make it again and rebuild it
     // whole, unless the share stopped being indexed meanwhile.
     try {

@@ -1,5 +1,6 @@
 #include "programs/frontend/search_request.h"
 
+#include "common/index_fields.h"
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/elastic/schema.h"
 #include "fileindex/file_type.h"
@@ -20,8 +21,8 @@ Json::Value Range(const char* field, const std::optional<long long>& low, const 
 }  // namespace
 
 const std::vector<std::string>& HitFields() {
-  static const std::vector<std::string> fields = {elastic::kFieldPath, "CORVMDIsDir", "CORVMDFSSize",
-                                                  "CORVMDFSContentChangeDate"};
+  static const std::vector<std::string> fields = {kFieldPath, kFieldIsDir, kFieldFSSize,
+                                                  kFieldContentChangeDate};
   return fields;
 }
 
@@ -37,11 +38,11 @@ Json::Value SearchRequest(const SearchParams& params) {
     Json::Value extensions(Json::arrayValue);
     for (const std::string& ext : fileindex::GetExtensionsByCategory(params.category)) extensions.append(ext);
     Json::Value terms(Json::objectValue);
-    terms["terms"][elastic::kFieldExtension] = extensions;
+    terms["terms"][kFieldExtension] = extensions;
     filters.append(terms);
   }
-  if (params.modified_from || params.modified_to) filters.append(Range("CORVMDFSContentChangeDate", params.modified_from, params.modified_to));
-  if (params.size_min || params.size_max) filters.append(Range("CORVMDFSSize", params.size_min, params.size_max));
+  if (params.modified_from || params.modified_to) filters.append(Range(kFieldContentChangeDate, params.modified_from, params.modified_to));
+  if (params.size_min || params.size_max) filters.append(Range(kFieldFSSize, params.size_min, params.size_max));
 
   Json::Value qsl = params.qsl;
   if (!filters.empty()) {
@@ -74,7 +75,7 @@ Json::Value SuggestRequest(const std::vector<std::string>& shares, const std::st
   Json::Value request(Json::objectValue);
   request["command"] = "suggest";
   if (!shares.empty()) request["data"]["ids"] = IndexIds(shares);
-  request["data"]["field"] = elastic::kFieldSearchFileName;
+  request["data"]["field"] = kFieldSearchFileName;
   request["data"]["text"] = text;
   request["data"]["size"] = size;
   if (!as_user.empty()) request["data"]["as_user"] = as_user;
@@ -89,7 +90,7 @@ Json::Value PathsPageRequest(const std::string& share, const Json::Value& qsl, u
   request["data"]["sort"] = "_key";
   request["data"]["from"] = from;
   request["data"]["size"] = size;
-  request["data"]["load_field"].append(elastic::kFieldPath);
+  request["data"]["load_field"].append(kFieldPath);
   return request;
 }
 

@@ -11,6 +11,7 @@
 #include <thread>
 
 #include "common/json_util.h"
+#include "fileindex/elastic/daemon_codes.h"
 #include "tests/corvelasticd/daemon_harness.h"
 
 namespace corvlumex {
@@ -24,7 +25,7 @@ using Ids = std::vector<std::string>;
 // 30 seconds: a loaded machine can take a while to reopen it.
 Json::Value WhileOpening(const std::function<Json::Value()>& ask) {
   Json::Value answer;
-  testing_support::PollUntil([&] { return (answer = ask())["error"]["code"].asInt() != 1401; }, std::chrono::seconds(30),
+  testing_support::PollUntil([&] { return (answer = ask())["error"]["code"].asInt() != elasticd::kCodeOpening; }, std::chrono::seconds(30),
                              std::chrono::milliseconds(10));
   return answer;
 }
@@ -62,7 +63,7 @@ TEST_F(CommandsTest, WordQueriesThroughTheWriterSeeUncommittedWritesInOrder) {
   const Json::Value got = Run("document_get_by_query", R"({"query": {"qsl": {"match": {"_all": "alpha"}}, "load_field": ["CORVMDPath"]}})");
   EXPECT_EQ(got["data"].size(), 2u);
   const Json::Value bad = Run("document_set_by_id", R"({"doc_id": "/volume1/share/a.txt", "data": {"CORVMDFSSize": "not a number"}})");
-  EXPECT_EQ(bad["error"]["code"].asInt(), 2021);
+  EXPECT_EQ(bad["error"]["code"].asInt(), elasticd::kCodeBadDocument);
   Upsert("/volume1/share/a.txt", "gamma");
   EXPECT_EQ(Run("document_del_by_query", R"({"query": {"qsl": {"match": {"_all": "alpha"}}}})")["data"]["deleted"].asInt(), 1);
   Upsert("/volume1/share/c.txt", "beta gamma");
@@ -125,7 +126,7 @@ TEST_F(CommandsTest, WordSearchesFollowRenamesDeletesAndReusedRowsCommittedAfter
   Json::Value missing;
   missing["doc_id"] = "/volume1/share/none.txt";
   missing["data"]["CORVMDPath"] = "/volume1/share/a.txt";
-  EXPECT_EQ(Run("document_set_by_id", missing)["error"]["code"].asInt(), 2020);
+  EXPECT_EQ(Run("document_set_by_id", missing)["error"]["code"].asInt(), elasticd::kCodeDocumentNotFound);
   EXPECT_EQ(HitIds(Search(needle)), Ids({"/volume1/share/a.txt", "/volume1/share/b.txt", "/volume1/share/c.txt"}));
   Commit();
   EXPECT_EQ(HitIds(Search(needle)), Ids({"/volume1/share/a.txt", "/volume1/share/d.txt", "/volume1/share/z.txt"}));
@@ -143,7 +144,7 @@ TEST_F(CommandsTest, UpsertReplacesTheWholeDocumentAndSetByIdMergesIntoAnExistin
   ASSERT_TRUE(Run("document_set_by_id", R"({"doc_id": "/volume1/share/b.txt", "data": {"CORVMDFSSize": 9}})")["success"].asBool());
   const Json::Value missing = Run("document_set_by_id", R"({"doc_id": "/volume1/share/none", "data": {"CORVMDFSSize": 9}})");
   EXPECT_FALSE(missing["success"].asBool());
-  EXPECT_EQ(missing["error"]["code"].asInt(), 2020);
+  EXPECT_EQ(missing["error"]["code"].asInt(), elasticd::kCodeDocumentNotFound);
   Commit();
   EXPECT_EQ(Search(R"({"match": {"_all": "old"}})")["data"]["total"].asInt(), 0);
   const Json::Value replaced = Search(R"({"term": {"CORVMDFSSize": 7}})");
@@ -183,8 +184,8 @@ TEST_F(CommandsTest, CompoundAnswersOneResultPerElementAndFlagsFailures) {
   EXPECT_TRUE(answer["has_fail"].asBool());
   ASSERT_EQ(answer["data"].size(), 3u);
   EXPECT_TRUE(answer["data"][0]["success"].asBool());
-  EXPECT_EQ(answer["data"][1]["error"]["code"].asInt(), 2002);
-  EXPECT_EQ(answer["data"][2]["error"]["code"].asInt(), 2001);
+  EXPECT_EQ(answer["data"][1]["error"]["code"].asInt(), elasticd::kCodeBadArgument);
+  EXPECT_EQ(answer["data"][2]["error"]["code"].asInt(), elasticd::kCodeUnknownCommand);
   const Json::Value suggestions = Run("suggest", R"({"field": "CORVMDTextContent", "text": "TO"})");
   ASSERT_EQ(suggestions["data"]["suggestions"].size(), 2u) << JsonToString(suggestions);
   EXPECT_EQ(suggestions["data"]["suggestions"][0]["term"].asString(), "tokyo");
@@ -197,11 +198,11 @@ TEST_F(CommandsTest, APausedIndexAnswersBusyForWritesAndStillSearchesAcrossARest
   Json::Value data;
   data["doc_id"] = "/volume1/share/q.txt";
   data["data"] = FileDocument("/volume1/share/q.txt", "", 1);
-  EXPECT_EQ(Run("document_upsert_by_id", data)["error"]["code"].asInt(), 1400);
+  EXPECT_EQ(Run("document_upsert_by_id", data)["error"]["code"].asInt(), elasticd::kCodeBusy);
   EXPECT_EQ(Search(R"({"match": {"_all": "paused"}})")["data"]["total"].asInt(), 1);
   daemon_->Terminate();
   daemon_->Start();
-  EXPECT_EQ(WhileOpening([&] { return Run("document_upsert_by_id", data); })["error"]["code"].asInt(), 1400);
+  EXPECT_EQ(WhileOpening([&] { return Run("document_upsert_by_id", data); })["error"]["code"].asInt(), elasticd::kCodeBusy);
   ASSERT_TRUE(Run("index_resume")["success"].asBool());
   EXPECT_TRUE(Run("document_upsert_by_id", data)["success"].asBool());
 }
@@ -236,7 +237,7 @@ TEST_F(CommandsTest, ConfigSetMovesOrAdoptsTheDatabaseButNeverOverwritesAnother)
       << daemon_->LogText();
   struct stat info;
   EXPECT_EQ(stat((moved + "/corvelasticd.db").c_str(), &info), 0);
-  EXPECT_EQ(Run("commit")["error"]["code"].asInt(), 2010);
+  EXPECT_EQ(Run("commit")["error"]["code"].asInt(), elasticd::kCodeIndexNotFound);
   EXPECT_EQ(Run("search", R"({"id": "fileindex_share2", "query": {"qsl": {"match": {"_all": "moving"}}}})")["data"]["total"].asInt(), 1);
 
   ASSERT_EQ(rename((root_.path() + "/volume2/share2").c_str(), (root_.path() + "/volume2/share3").c_str()), 0);
@@ -271,7 +272,7 @@ TEST_F(CommandsTest, IndexLifecycleOverOneConnection) {
   const Json::Value again = create(kIndex, "/volume1/share/@eaDir/index");
   EXPECT_TRUE(again["success"].asBool()) << "the same index again is harmless";
   EXPECT_FALSE(again["data"]["created"].asBool());
-  EXPECT_EQ(create(kIndex, "/elsewhere")["error"]["code"].asInt(), 2011);
+  EXPECT_EQ(create(kIndex, "/elsewhere")["error"]["code"].asInt(), elasticd::kCodeIndexExists);
   // A missing event handler is said once, however many indexes name it.
   ASSERT_TRUE(create("fileindex_b", "/b")["success"].asBool());
   EXPECT_TRUE(ask("commit", Data(R"({"id": "fileindex_b"})"))["success"].asBool());
@@ -284,8 +285,8 @@ TEST_F(CommandsTest, IndexLifecycleOverOneConnection) {
   ASSERT_TRUE(ask("index_delete", Json::Value())["success"].asBool());
   struct stat info;
   EXPECT_NE(stat((root_.path() + "/volume1/share/@eaDir/index/corvelasticd.db").c_str(), &info), 0);
-  EXPECT_EQ(ask("commit", Json::Value())["error"]["code"].asInt(), 2010);
-  EXPECT_EQ(ask("index_delete", Json::Value())["error"]["code"].asInt(), 2010);
+  EXPECT_EQ(ask("commit", Json::Value())["error"]["code"].asInt(), elasticd::kCodeIndexNotFound);
+  EXPECT_EQ(ask("index_delete", Json::Value())["error"]["code"].asInt(), elasticd::kCodeIndexNotFound);
   close(fd);
 }
 
@@ -300,15 +301,15 @@ TEST_F(OpeningDaemonTest, AnIndexStillOpeningAnswers1401) {
   daemon_->Kill9();
   daemon_->Start();
   const Json::Value answer = Search(R"({"match_all": {}})", R"({"id": "fileindex_share"})");
-  EXPECT_EQ(answer["error"]["code"].asInt(), 1401) << JsonToString(answer);
-  EXPECT_EQ(Run("document_del_by_id", R"({"doc_id": "/volume1/share/o.txt"})")["error"]["code"].asInt(), 1401);
+  EXPECT_EQ(answer["error"]["code"].asInt(), elasticd::kCodeOpening) << JsonToString(answer);
+  EXPECT_EQ(Run("document_del_by_id", R"({"doc_id": "/volume1/share/o.txt"})")["error"]["code"].asInt(), elasticd::kCodeOpening);
   // A search naming no index waits a little for it and then says it is still
   // opening: never an answer that silently leaves it out.
   const Json::Value unnamed = Search(R"({"match_all": {}})");
   if (unnamed["success"].asBool()) {
     EXPECT_EQ(HitIds(unnamed), Ids({"/volume1/share/o.txt"}));
   } else {
-    EXPECT_EQ(unnamed["error"]["code"].asInt(), 1401) << JsonToString(unnamed);
+    EXPECT_EQ(unnamed["error"]["code"].asInt(), elasticd::kCodeOpening) << JsonToString(unnamed);
   }
 }
 
@@ -321,7 +322,7 @@ TEST_F(BacklogDaemonTest, WritesOverTheBacklogBoundAnswer1400) {
   data["doc_id"] = "/volume1/share/x";
   data["data"] = FileDocument("/volume1/share/x", "", 1);
   const Json::Value answer = Run("document_upsert_by_id", data);
-  EXPECT_EQ(answer["error"]["code"].asInt(), 1400);
+  EXPECT_EQ(answer["error"]["code"].asInt(), elasticd::kCodeBusy);
   EXPECT_NE(answer["error"]["msg"].asString().find("too many writes"), std::string::npos);
 }
 
@@ -343,13 +344,13 @@ TEST_F(ClientLimitDaemonTest, ClientsOverTheLimitAnswer1400AndTheOthersGoOn) {
     if (answer["success"].asBool()) {
       held.push_back(fd);
     } else {
-      EXPECT_EQ(answer["error"]["code"].asInt(), 1400);
+      EXPECT_EQ(answer["error"]["code"].asInt(), elasticd::kCodeBusy);
       close(fd);
     }
   }
   ASSERT_EQ(held.size(), 2u);
   const Json::Value refused = Send(daemon_->socket_path(), list);
-  EXPECT_EQ(refused["error"]["code"].asInt(), 1400) << JsonToString(refused);
+  EXPECT_EQ(refused["error"]["code"].asInt(), elasticd::kCodeBusy) << JsonToString(refused);
   for (const int fd : held) {
     EXPECT_TRUE(Exchange(fd, list)["success"].asBool());
     close(fd);

@@ -12,6 +12,7 @@
 #include <functional>
 
 #include "common/json_util.h"
+#include "fileindex/elastic/daemon_codes.h"
 #include "tests/corvelasticd/daemon_harness.h"
 
 namespace corvlumex {
@@ -61,44 +62,44 @@ TEST_F(DaemonInputTest, BadRequestsAreAnsweredWithTheirCode) {
   const std::string search = R"({"command": "search", "data": {"query": {"qsl": )";
   const std::pair<std::string, int> cases[] = {
       // Envelopes.
-      {"", 2000}, {"{not json", 2000}, {"[1, 2]", 2000}, {R"({"data": {}})", 2000}, {R"({"command": 5})", 2000},
-      {R"({"command": "commit", "data": "x"})", 2000}, {R"({"compound": 3})", 2000}, {R"({"command": "no_such"})", 2001},
+      {"", elasticd::kCodeBadRequest}, {"{not json", elasticd::kCodeBadRequest}, {"[1, 2]", elasticd::kCodeBadRequest}, {R"({"data": {}})", elasticd::kCodeBadRequest}, {R"({"command": 5})", elasticd::kCodeBadRequest},
+      {R"({"command": "commit", "data": "x"})", elasticd::kCodeBadRequest}, {R"({"compound": 3})", elasticd::kCodeBadRequest}, {R"({"command": "no_such"})", elasticd::kCodeUnknownCommand},
       // Arguments of the wrong type or meaning.
-      {upsert + R"("doc_id": "/a", "data": []}})", 2002},
-      {upsert + R"("doc_id": "/a", "data": {"CORVMDFSSize": "big"}}})", 2021},
-      {upsert + R"("doc_id": "/a", "data": {"CORVMDTitle": {"x": 1}}}})", 2021},
-      {R"({"command": "document_upsert_by_id", "data": {"id": "nope", "doc_id": "/a", "data": {}}})", 2010},
-      {R"({"command": "index_create", "data": {"id": "x", "path": "/tmp/x", "mappings": {"property_id": "P", "properties": {}}}})", 2013},
+      {upsert + R"("doc_id": "/a", "data": []}})", elasticd::kCodeBadArgument},
+      {upsert + R"("doc_id": "/a", "data": {"CORVMDFSSize": "big"}}})", elasticd::kCodeBadDocument},
+      {upsert + R"("doc_id": "/a", "data": {"CORVMDTitle": {"x": 1}}}})", elasticd::kCodeBadDocument},
+      {R"({"command": "document_upsert_by_id", "data": {"id": "nope", "doc_id": "/a", "data": {}}})", elasticd::kCodeIndexNotFound},
+      {R"({"command": "index_create", "data": {"id": "x", "path": "/tmp/x", "mappings": {"property_id": "P", "properties": {}}}})", elasticd::kCodeBadMappings},
       {R"({"command": "index_create", "data": {"id": "x", "path": "relative",
-          "mappings": {"property_id": "P", "properties": {"P": {"analyzer": "keyword"}}}}})", 2012},
-      {R"({"command": "search", "data": {"size": -1}})", 2002},
-      {R"({"command": "search", "data": {"ids": "fileindex_share"}})", 2002},
+          "mappings": {"property_id": "P", "properties": {"P": {"analyzer": "keyword"}}}}})", elasticd::kCodeIndexPath},
+      {R"({"command": "search", "data": {"size": -1}})", elasticd::kCodeBadArgument},
+      {R"({"command": "search", "data": {"ids": "fileindex_share"}})", elasticd::kCodeBadArgument},
       // Queries.
-      {search + R"({"match": {"NoSuchField": "x"}}}}})", 2030}, {search + R"({"range": {"CORVMDFSName": {"gt": 1}}}}}})", 2030},
-      {search + R"({"range": {"CORVMDFSSize": {"between": 1}}}}}})", 2030}, {search + R"({"bool": {"must": 5}}}}})", 2030},
-      {search + R"({"match": {"a": 1}, "term": {"b": 2}}}}})", 2030}, {search + R"({"fuzzy": {"CORVMDFSName": "x"}}}}})", 2030},
-      {search + R"({"term": {"CORVMDIsDir": "maybe"}}}}})", 2030}, {search + R"("text"}}})", 2030}, {search + deep + "}}}", 2030},
+      {search + R"({"match": {"NoSuchField": "x"}}}}})", elasticd::kCodeBadQuery}, {search + R"({"range": {"CORVMDFSName": {"gt": 1}}}}}})", elasticd::kCodeBadQuery},
+      {search + R"({"range": {"CORVMDFSSize": {"between": 1}}}}}})", elasticd::kCodeBadQuery}, {search + R"({"bool": {"must": 5}}}}})", elasticd::kCodeBadQuery},
+      {search + R"({"match": {"a": 1}, "term": {"b": 2}}}}})", elasticd::kCodeBadQuery}, {search + R"({"fuzzy": {"CORVMDFSName": "x"}}}}})", elasticd::kCodeBadQuery},
+      {search + R"({"term": {"CORVMDIsDir": "maybe"}}}}})", elasticd::kCodeBadQuery}, {search + R"("text"}}})", elasticd::kCodeBadQuery}, {search + deep + "}}}", elasticd::kCodeBadQuery},
   };
   for (const auto& [request, code] : cases) EXPECT_EQ(ErrorCode(request), code) << request;
   // The member at fault is named.
   const Json::Value answer = Send(daemon_->socket_path(), Data(upsert + R"("doc_id": 7, "data": {}}})"));
-  EXPECT_EQ(answer["error"]["code"].asInt(), 2002);
+  EXPECT_EQ(answer["error"]["code"].asInt(), elasticd::kCodeBadArgument);
   EXPECT_NE(answer["error"]["msg"].asString().find("doc_id"), std::string::npos);
   // Elements of a compound are judged one by one.
   const Json::Value nested = Send(daemon_->socket_path(), Data(R"({"compound": [{"compound": []}, "text"]})"));
   EXPECT_TRUE(nested["has_fail"].asBool());
-  EXPECT_EQ(nested["data"][0]["error"]["code"].asInt(), 2000);
-  EXPECT_EQ(nested["data"][1]["error"]["code"].asInt(), 2000);
+  EXPECT_EQ(nested["data"][0]["error"]["code"].asInt(), elasticd::kCodeBadRequest);
+  EXPECT_EQ(nested["data"][1]["error"]["code"].asInt(), elasticd::kCodeBadRequest);
   ExpectAlive();
 }
 
 TEST_F(DaemonInputTest, OversizeFramesAndClientsThatVanishMidFrameDisturbNobody) {
   Json::Value answer;
   ASSERT_TRUE(JsonFromString(answer, SendRaw(daemon_->socket_path(), Frame(std::string(5000, 'x')))));
-  EXPECT_EQ(answer["error"]["code"].asInt(), 2003);
+  EXPECT_EQ(answer["error"]["code"].asInt(), elasticd::kCodeFrameTooLarge);
   const uint32_t huge = 0xFFFFFFF0u;
   ASSERT_TRUE(JsonFromString(answer, SendRaw(daemon_->socket_path(), std::string(reinterpret_cast<const char*>(&huge), 4))));
-  EXPECT_EQ(answer["error"]["code"].asInt(), 2003);
+  EXPECT_EQ(answer["error"]["code"].asInt(), elasticd::kCodeFrameTooLarge);
   for (const std::string& partial : {std::string("\x10"), Frame(R"({"command": "index_list"})").substr(0, 9)}) {
     const int fd = ConnectTo(daemon_->socket_path());
     ASSERT_GE(fd, 0);
@@ -140,23 +141,23 @@ TEST_F(HostileInputTest, EveryHostileRequestIsAnsweredWithItsCodeAndTheDaemonSer
     int code;
     const char* message;  // a part of the answer's message
   } cases[] = {
-      {"arrays nested past the JSON reader's limit", Repeat("[", 1001) + Repeat("]", 1001), 2000, "JSON"},
-      {"objects nested past the limit", Repeat(R"({"a":)", 1001) + "1" + Repeat("}", 1001), 2000, "JSON"},
-      {"nesting past the limit inside a request", SearchOf(Repeat("[", 1200) + Repeat("]", 1200)), 2000, "JSON"},
-      {"a match of 100,000 words", SearchOf(Match(Words(100000))), 2030, "words"},
-      {"65 words in one clause", SearchOf(Match(Words(65))), 2030, "64 words"},
-      {"300 words over five clauses", SearchOf(R"({"bool": {"should": [)" + wide_bool + "]}}"), 2030, "256 words"},
-      {"one word of 70,000 letters", SearchOf(Match(std::string(70000, 'a'))), 2030, "bytes"},
-      {"a word that analyzes to 100 words", SearchOf(Match(Repeat("ab-", 100))), 2030, "64 words"},
-      {"a name substring longer than any name", SearchOf(R"({"match": {"CORVMDSearchFileName": ")" + std::string(2000, 'n') + R"("}})"), 2030, "1024"},
-      {"2,000 terms", SearchOf(R"({"terms": {"CORVMDExtension": [)" + many_terms + "]}}"), 2030, "terms"},
-      {"a huge from", SearchOf(R"({"match_all": {}})", R"("from": 9223372036854775807, "size": 10, )"), 2002, "from"},
-      {"a size beyond 64 bits", SearchOf(R"({"match_all": {}})", R"("size": 1e300, )"), 2002, "size"},
-      {"a sort order that is an array", SearchOf(R"({"match_all": {}})", R"("sort": {"field": "CORVMDFSSize", "order": []}, )"), 2002, "order"},
-      {"an operator that is an object", SearchOf(R"({"match": {"_all": {"query": "x", "operator": {}}}})"), 2030, "operator"},
-      {"bytes that are not UTF-8", "{\"command\": \"\xff\xfe\x80\"}", 2001, "Unknown"},
-      {"highlight marks of 1 MB", SearchOf(R"({"match_all": {}})", R"("highlight": {"pre": ")" + std::string(1 << 20, '<') + R"("}, )"), 2002, "pre"},
-      {"10,000 fields to load", SearchOf(R"({"match_all": {}})", R"("load_field": [)" + Repeat(R"("a", )", 10000) + R"("a"], )"), 2002, "load_field"},
+      {"arrays nested past the JSON reader's limit", Repeat("[", 1001) + Repeat("]", 1001), elasticd::kCodeBadRequest, "JSON"},
+      {"objects nested past the limit", Repeat(R"({"a":)", 1001) + "1" + Repeat("}", 1001), elasticd::kCodeBadRequest, "JSON"},
+      {"nesting past the limit inside a request", SearchOf(Repeat("[", 1200) + Repeat("]", 1200)), elasticd::kCodeBadRequest, "JSON"},
+      {"a match of 100,000 words", SearchOf(Match(Words(100000))), elasticd::kCodeBadQuery, "words"},
+      {"65 words in one clause", SearchOf(Match(Words(65))), elasticd::kCodeBadQuery, "64 words"},
+      {"300 words over five clauses", SearchOf(R"({"bool": {"should": [)" + wide_bool + "]}}"), elasticd::kCodeBadQuery, "256 words"},
+      {"one word of 70,000 letters", SearchOf(Match(std::string(70000, 'a'))), elasticd::kCodeBadQuery, "bytes"},
+      {"a word that analyzes to 100 words", SearchOf(Match(Repeat("ab-", 100))), elasticd::kCodeBadQuery, "64 words"},
+      {"a name substring longer than any name", SearchOf(R"({"match": {"CORVMDSearchFileName": ")" + std::string(2000, 'n') + R"("}})"), elasticd::kCodeBadQuery, "1024"},
+      {"2,000 terms", SearchOf(R"({"terms": {"CORVMDExtension": [)" + many_terms + "]}}"), elasticd::kCodeBadQuery, "terms"},
+      {"a huge from", SearchOf(R"({"match_all": {}})", R"("from": 9223372036854775807, "size": 10, )"), elasticd::kCodeBadArgument, "from"},
+      {"a size beyond 64 bits", SearchOf(R"({"match_all": {}})", R"("size": 1e300, )"), elasticd::kCodeBadArgument, "size"},
+      {"a sort order that is an array", SearchOf(R"({"match_all": {}})", R"("sort": {"field": "CORVMDFSSize", "order": []}, )"), elasticd::kCodeBadArgument, "order"},
+      {"an operator that is an object", SearchOf(R"({"match": {"_all": {"query": "x", "operator": {}}}})"), elasticd::kCodeBadQuery, "operator"},
+      {"bytes that are not UTF-8", "{\"command\": \"\xff\xfe\x80\"}", elasticd::kCodeUnknownCommand, "Unknown"},
+      {"highlight marks of 1 MB", SearchOf(R"({"match_all": {}})", R"("highlight": {"pre": ")" + std::string(1 << 20, '<') + R"("}, )"), elasticd::kCodeBadArgument, "pre"},
+      {"10,000 fields to load", SearchOf(R"({"match_all": {}})", R"("load_field": [)" + Repeat(R"("a", )", 10000) + R"("a"], )"), elasticd::kCodeBadArgument, "load_field"},
   };
   for (const auto& c : cases) {
     const std::string answer_text = SendRaw(daemon_->socket_path(), Frame(c.request));
@@ -356,7 +357,7 @@ TEST_F(DaemonInputTest, OrdinaryUsersSeeOnlyFilesTheyCanReadAndCannotChangeIndex
     return JsonToString(Command(socket, "document_del_by_id", data));
   });
   ASSERT_TRUE(JsonFromString(answer, refused)) << refused;
-  EXPECT_EQ(answer["error"]["code"].asInt(), 2004);
+  EXPECT_EQ(answer["error"]["code"].asInt(), elasticd::kCodePermissionDenied);
   // Root sees everything.
   EXPECT_EQ(Search(R"({"match": {"_all": "common"}})")["data"]["total"].asInt(), 153);
 }
@@ -382,7 +383,7 @@ TEST_F(DaemonInputTest, SearchOnBehalfOfAUserSeesOnlyThatUsersFiles) {
   } cases[] = {
       {"nobody", 0, 1},
       {"root", 0, 6},
-      {"no-such-user-here", 2002, 0},
+      {"no-such-user-here", elasticd::kCodeBadArgument, 0},
   };
   for (const auto& c : cases) {
     Json::Value data = Data(query);
@@ -413,7 +414,7 @@ TEST_F(DaemonInputTest, SearchOnBehalfOfAUserSeesOnlyThatUsersFiles) {
   });
   Json::Value answer;
   ASSERT_TRUE(JsonFromString(answer, refused)) << refused;
-  EXPECT_EQ(answer["error"]["code"].asInt(), 2004);
+  EXPECT_EQ(answer["error"]["code"].asInt(), elasticd::kCodePermissionDenied);
 }
 
 }  // namespace

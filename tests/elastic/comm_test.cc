@@ -9,6 +9,7 @@
 #include "common/error.h"
 #include "common/json_util.h"
 #include "common/sys.h"
+#include "fileindex/elastic/daemon_codes.h"
 #include "tests/elastic/fake_search_daemon.h"
 #include "tests/support/log_capture.h"
 
@@ -158,7 +159,7 @@ TEST_F(SendRequestTest, FailureAnswersCarryTheDaemonsCodeWithoutALogLineOrAreABa
     const char* reason;  // its start
   } cases[] = {
       {R"({"success": false, "error": {"code": 1300, "msg": "no such index"}})", 1300, "Request failed, msg=no such index"},
-      {R"({"success": false, "error": {"code": 1401, "msg": "not ready"}})", 1401, "Request failed, msg=not ready"},
+      {R"({"success": false, "error": {"code": 1401, "msg": "not ready"}})", elasticd::kCodeOpening, "Request failed, msg=not ready"},
       {R"({"success": false, "error": {"msg": "x"}})", kErrorBadArgument, "Missing property: code"},
       {R"({"success": false, "error": {"code": 1300}})", kErrorBadArgument, "Missing property: msg"},
       {R"({"success": false})", kErrorBadArgument, ""},
@@ -206,7 +207,7 @@ TEST_F(CompoundTest, BusySubRequestFailsTheWholeRequestWithTheBareMessage) {
       {"success": false, "error": {"code": 1400, "msg": "busy"}},
       {"success": false, "error": {"code": 1300, "msg": "never looked at"}}]})"));
   const Error error = ExchangeError(compound_);
-  EXPECT_EQ(error.code, 1400);
+  EXPECT_EQ(error.code, elasticd::kCodeBusy);
   EXPECT_EQ(error.reason, "busy");
   EXPECT_EQ(log_.Matching("Compound failed").size(), 1u) << "stops at the busy element";
 }

@@ -9,6 +9,7 @@
 
 #include "common/error.h"
 #include "common/json_util.h"
+#include "fileindex/elastic/daemon_codes.h"
 #include "fileindex/elastic/schema.h"
 #include "fileindex/status_mgr.h"
 #include "platform/linux/linux_platform.h"
@@ -101,11 +102,11 @@ TEST_F(ElasticControlTest, AnIndexIsReadyUnlessTheDaemonIsBusyOrStillOpeningIt) 
     bool ready;
   } cases[] = {
       {"opening", FakeAnswer::Success(JsonOf(R"([{"id": "fileindex_music", "state": "opening"}])")), false},
-      {"busy", FakeAnswer::Failure(1401, "opening"), false},
+      {"busy", FakeAnswer::Failure(elasticd::kCodeOpening, "opening"), false},
       {"ready", FakeAnswer::Success(JsonOf(R"([{"id": "fileindex_other", "state": "opening"},
                                                 {"id": "fileindex_music", "state": "ready"}])")), true},
       {"not listed", FakeAnswer::Success(JsonOf("[]")), true},
-      {"another failure", FakeAnswer::Failure(2000, "bad request"), true},
+      {"another failure", FakeAnswer::Failure(elasticd::kCodeBadRequest, "bad request"), true},
   };
   for (const auto& c : cases) {
     daemon_.Enqueue(c.answer);
@@ -257,12 +258,12 @@ TEST_F(ElasticControlTest, TermSuggestionIsOneCompoundRequest) {
 }
 
 TEST_F(ElasticControlTest, BusyDaemonIsRetriedWithLongSleepsAndOneMemoryNoticeAfterTen) {
-  daemon_.Enqueue(FakeAnswer::Failure(1400, "busy"), 10);
+  daemon_.Enqueue(FakeAnswer::Failure(elasticd::kCodeBusy, "busy"), 10);
   ShareIndexPause("music");
   EXPECT_EQ(sleeps_.Sleeps().size(), 10u);
   EXPECT_EQ(platform_->Notices("error:lack_of_memory"), 0) << "ten busy answers send no notice";
-  daemon_.Enqueue(FakeAnswer::Failure(1400, "busy"), 7);
-  daemon_.Enqueue(FakeAnswer::Failure(1401, "not ready"), 6);
+  daemon_.Enqueue(FakeAnswer::Failure(elasticd::kCodeBusy, "busy"), 7);
+  daemon_.Enqueue(FakeAnswer::Failure(elasticd::kCodeOpening, "not ready"), 6);
   ShareIndexDelete("music");
   EXPECT_EQ(daemon_.Requests().size(), 11u + 14u);
   const auto sleeps = sleeps_.Sleeps();

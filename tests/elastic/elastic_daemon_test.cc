@@ -11,6 +11,7 @@
 #include "common/file_util.h"
 #include "common/sys.h"
 #include "fileindex/elastic/comm.h"
+#include "fileindex/elastic/daemon_codes.h"
 #include "fileindex/elastic/elastic_control.h"
 #include "platform/linux/linux_platform.h"
 #include "tests/corvelasticd/daemon_harness.h"
@@ -86,7 +87,7 @@ TEST_F(ElasticDaemonTest, DocumentsFollowUpsertsRenamesAndDeletes) {
   EXPECT_TRUE(Below(share_ + "/a2").empty());
 
   ShareIndexDelete("music");
-  EXPECT_EQ(testing_support::ErrorOrNone([] { IndexCommit("music"); }).code, 2010) << "no such index";
+  EXPECT_EQ(testing_support::ErrorOrNone([] { IndexCommit("music"); }).code, elasticd::kCodeIndexNotFound) << "no such index";
 }
 
 }  // namespace

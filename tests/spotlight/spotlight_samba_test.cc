@@ -294,6 +294,37 @@ TEST_F(SpotlightSambaTest, MdsearchFindsWhatAScanOfTheTreeFinds) {
     EXPECT_FALSE(wanted.empty()) << test.query << " is a test that cannot fail";
     EXPECT_EQ(MdSearch(test.query), wanted) << test.query;
   }
+
+  // The switch off and on again, each time with a reload: a client connected
+  // all along keeps its session (a restart would have dropped it).
+  const std::string held_output = sandbox_->root() + "/held-client.out";
+  FILE* held = popen(("smbclient --configfile=" + config_ + " -U " + user_ + "%" + kPassword +
+                      " //127.0.0.1/share > " + held_output + " 2>&1").c_str(),
+                     "w");
+  ASSERT_NE(held, nullptr);
+  ASSERT_TRUE(PollUntil(
+      [&] {
+        std::string sessions;
+        RunShell("smbstatus --configfile=" + config_ + " -b", &sessions);
+        return sessions.find(user_) != std::string::npos;
+      },
+      std::chrono::seconds(20)));
+  const std::string reload = "smbcontrol --configfile=" + config_ + " smbd reload-config";
+  const std::string name_query = "kMDItemFSName==\"report*\"";
+  const std::set<std::string> named = MdSearch(name_query);
+  ASSERT_EQ(platform::Current()->SMBSetSpotlight(false), 0) << platform::LastError().message;
+  ASSERT_EQ(RunShell(reload), 0);
+  std::string refused;
+  RunShell("mdsearch --configfile=" + config_ + " -U " + user_ + "%" + kPassword + " //127.0.0.1 share '" +
+               name_query + "'",
+           &refused);
+  for (const std::string& path : named) EXPECT_EQ(refused.find(path), std::string::npos) << refused;
+  ASSERT_EQ(platform::Current()->SMBSetSpotlight(true), 0) << platform::LastError().message;
+  ASSERT_EQ(RunShell(reload), 0);
+  EXPECT_EQ(MdSearch(name_query), named);
+  fputs("ls\nexit\n", held);
+  EXPECT_EQ(pclose(held), 0) << ReadFileText(held_output);
+  EXPECT_NE(ReadFileText(held_output).find("Report 2023.pdf.txt"), std::string::npos) << ReadFileText(held_output);
 }
 
 }  // namespace

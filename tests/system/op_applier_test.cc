@@ -11,6 +11,7 @@
 #include <memory>
 
 #include "common/error.h"
+#include "fileindex/elastic/daemon_codes.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/optree.h"
 #include "platform/linux/linux_platform.h"
@@ -94,14 +95,14 @@ TEST_F(OpApplierTest, UpsertStoresDeletesOrClearsByWhatIsOnDisk) {
 
 TEST_F(OpApplierTest, AnAttributeChangeOfAFileNeverStoredStoresItWhole) {
   root_.WriteFile("volume1/share/docs/a.c", "x");
-  daemon_.Enqueue(FakeAnswer::Failure(2020, "No document with the id"));
+  daemon_.Enqueue(FakeAnswer::Failure(elasticd::kCodeDocumentNotFound, "No document with the id"));
   applier_->Attr(Docs("a.c"));
   EXPECT_EQ(Sent(), (Lines{"document_set_by_id " + Docs("a.c"), "document_upsert_by_id " + Docs("a.c")}));
 }
 
 TEST_F(OpApplierTest, ARenameWithoutAnOldDocumentIsReadFromDisk) {
   root_.WriteFile("volume1/share/docs/new.c", "x");
-  daemon_.Enqueue(FakeAnswer::Failure(2020, "No document with the id"));
+  daemon_.Enqueue(FakeAnswer::Failure(elasticd::kCodeDocumentNotFound, "No document with the id"));
   applier_->Rename(Docs("old.c"), Docs("new.c"));
   EXPECT_EQ(Sent(), (Lines{"document_set_by_id " + Docs("old.c"), "document_del_by_id " + Docs("old.c"),
                                   "document_del_by_query " + Docs("old.c") + "/", "document_upsert_by_id " + Docs("new.c")}));
@@ -140,7 +141,7 @@ TEST_F(OpApplierTest, ARenameWhoseSourceIsGoneRemovesWhatIsLeftUnderIt) {
       daemon_.Enqueue(FakeAnswer::Success(Json::Value(Json::objectValue)));
       daemon_.Enqueue(FakeAnswer::Success(below));
     } else {
-      daemon_.Enqueue(FakeAnswer::Failure(2020, "No document with the id"));
+      daemon_.Enqueue(FakeAnswer::Failure(elasticd::kCodeDocumentNotFound, "No document with the id"));
     }
     applier_->Rename(Docs("B"), Docs(c.to));
     const Lines sent = Sent();
@@ -263,12 +264,12 @@ TEST_F(OpApplierTest, OneFileFailsAloneButAnIndexFailureStopsTheBatch) {
   applier_->Upsert(Docs("broken.c"));  // extraction fails: logged and skipped
   EXPECT_EQ(progress_.Snapshot()["share"]["total_failed"].asUInt64(), 1u);
   EXPECT_EQ(log_.Matching("upsert of " + Docs("broken.c") + " skipped: code=914").size(), 1u);
-  daemon_.Enqueue(FakeAnswer::Failure(2010, "No index fileindex_share"));
+  daemon_.Enqueue(FakeAnswer::Failure(elasticd::kCodeIndexNotFound, "No index fileindex_share"));
   try {
     applier_->Upsert(Docs("ok.c"));
     FAIL() << "a missing index must stop the batch";
   } catch (const Error& error) {
-    EXPECT_EQ(error.code, 2010);
+    EXPECT_EQ(error.code, elasticd::kCodeIndexNotFound);
   }
 }
 

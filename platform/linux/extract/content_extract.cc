@@ -44,8 +44,8 @@ class OpenFile {
 };
 
 void MarkFailed(const std::string& reason, Json::Value& fields) {
-  fields[extract::kFieldExtractionFailed] = true;
-  fields[extract::kFieldExtractionError] = reason;
+  fields[kFieldExtractionFailed] = true;
+  fields[kFieldExtractionError] = reason;
 }
 
 }  // namespace

@@ -67,18 +67,8 @@ std::string PrivilegeString(mode_t mode, bool has_acl) {
 }
 
 void FillFileFields(const std::string& path, const FileStatus& status, Json::Value& document) {
-  const std::string name = Basename(path);
   const bool is_dir = S_ISDIR(status.mode);
-  // Taken from the name alone, folders included, exactly as a rename
-  // rewrites it, so a document reads the same however it was last touched.
-  const std::string extension = GetFileExtension(path, true);
-  document[kFieldPath] = path;
-  document[kFieldParent] = Dirname(path);
-  document[kFieldFSName] = name;
-  document[kFieldDisplayName] = name;
-  document[kFieldExtension] = extension;
-  // The kind follows the extension, as a rename rewrites it.
-  document[kFieldKind] = extension;
+  SetNameFields(path, document);
   document[kFieldIsDir] = is_dir;
   document[kFieldPrivilege] = PrivilegeString(status.mode, status.has_acl);
   document[kFieldOwnerUserID] = std::to_string(status.uid);
