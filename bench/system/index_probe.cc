@@ -19,24 +19,15 @@
 
 #include "common/error.h"
 #include "fileindex/elastic/comm.h"
-#include "fileindex/elastic/elastic_control.h"
+#include "programs/frontend/search_request.h"
 
 namespace {
 
-namespace elastic = corvlumex::fileindex::elastic;
 using Clock = std::chrono::steady_clock;
 
-Json::Value Search(const std::string& share, const Json::Value& qsl, int from, int size) {
-  Json::Value request(Json::objectValue);
-  request["command"] = "search";
-  request["data"]["ids"].append(elastic::GetFileIndexID(share));
-  request["data"]["query"]["qsl"] = qsl;
-  request["data"]["sort"] = "_key";
-  request["data"]["from"] = from;
-  request["data"]["size"] = size;
-  request["data"]["load_field"].append("CORVMDPath");
+Json::Value Search(const std::string& share, const Json::Value& qsl, unsigned from, unsigned size) {
   Json::Value answer;
-  corvlumex::SendRequestImpl(answer, request);
+  corvlumex::SendRequestImpl(answer, corvlumex::frontend::PathsPageRequest(share, qsl, from, size));
   return answer["data"]["hits"];
 }
 
@@ -44,11 +35,11 @@ std::set<std::string> AllPaths(const std::string& share) {
   Json::Value all(Json::objectValue);
   all["match_all"] = Json::Value(Json::objectValue);
   std::set<std::string> paths;
-  constexpr int kPage = 1000;
-  for (int from = 0;; from += kPage) {
+  constexpr unsigned kPage = 1000;
+  for (unsigned from = 0;; from += kPage) {
     const Json::Value hits = Search(share, all, from, kPage);
     for (const Json::Value& hit : hits) paths.insert(hit["fields"]["CORVMDPath"].asString());
-    if (hits.size() < static_cast<unsigned>(kPage)) return paths;
+    if (hits.size() < kPage) return paths;
   }
 }
 

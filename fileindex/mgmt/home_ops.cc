@@ -26,6 +26,68 @@ void RestoreHomesMonitorCfg(const FolderMgr& folder_mgr, bool watched) {
   }
 }
 
+// A user's home folder, /homes/<user>, renamed with the user.
+struct HomeMove {
+  HomeMove(const std::string& user_from, const std::string& user_to)
+      : old_home(std::string("/") + kHomesShare + "/" + user_from), new_home(std::string("/") + kHomesShare + "/" + user_to) {}
+  // The share path in the old home that `renamed` (in the new home) had.
+  std::string OldPath(const Folder& renamed) const { return old_home + renamed.GetPath().substr(new_home.size()); }
+
+  std::string old_home, new_home;
+};
+
+// The configured folders of the old home, as records under the new home.
+// Throws when one of them is configured there already.
+std::vector<std::shared_ptr<Folder>> FoldersMovedHome(const FolderMgr& folder_mgr, const HomeMove& move) {
+  std::vector<std::shared_ptr<Folder>> moved;
+  for (const std::shared_ptr<Folder>& folder : FoldersOfShare(folder_mgr, kHomesShare)) {
+    const std::string& path = folder->GetPath();
+    if (!IsPathAtOrBelow(path, move.old_home)) continue;
+    Json::Value data = folder->GetData();
+    data["path"] = move.new_home + path.substr(move.old_home.size());
+    auto renamed = std::make_shared<Folder>(data);
+    CORV_CHECK_THROW(folder_mgr.HasFolder(renamed->GetPath()), kErrorDuplicatedId,
+                     "Duplicated ID: " + renamed->GetPath());
+    moved.push_back(renamed);
+  }
+  return moved;
+}
+
+// The full paths whose documents went with the old home: a folder governs
+// the whole old home, or only the moved folders held documents.
+std::vector<std::string> OldHomeTrees(const FolderMgr& folder_mgr, const HomeMove& move, const std::string& volume,
+                                      const std::vector<std::shared_ptr<Folder>>& moved) {
+  std::vector<std::string> old_trees;
+  if (folder_mgr.IsFullPathIndexed(volume + move.old_home)) {
+    old_trees.push_back(volume + move.old_home);
+  } else {
+    for (const std::shared_ptr<Folder>& renamed : moved) old_trees.push_back(volume + move.OldPath(*renamed));
+  }
+  return old_trees;
+}
+
+// Replaces the old home's folders by `moved` in the folder file and the
+// monitor configuration; a failed monitor update puts both back.
+void SaveMovedFolders(FolderMgr& folder_mgr, const FolderMgr& folder_mgr_before, const HomeMove& move,
+                      const std::vector<std::shared_ptr<Folder>>& moved) {
+  for (const std::shared_ptr<Folder>& renamed : moved) {
+    const std::string old_path = move.OldPath(*renamed);
+    CORV_LOG("Update homes rule: [%s] -> [%s]", old_path.c_str(), renamed->GetPath().c_str());
+    std::shared_ptr<Folder> removed;
+    folder_mgr.Delete(removed, old_path);
+    std::shared_ptr<Folder> reindex;
+    folder_mgr.Upsert(reindex, renamed);
+  }
+  folder_mgr.Save();
+  try {
+    UpsertCORVNotifydCfg(kHomesShare, folder_mgr);
+  } catch (const Error&) {
+    folder_mgr_before.Save();
+    RestoreHomesMonitorCfg(folder_mgr_before, true);
+    throw;
+  }
+}
+
 }  // namespace
 
 void HomeDisable() {
@@ -73,51 +135,11 @@ void UserRename(const std::string& user_from, const std::string& user_to) {
   const FolderMgr folder_mgr_before;
   if (!folder_mgr.IsShareIndexed(kHomesShare)) return;
 
-  const std::string old_home = std::string("/") + kHomesShare + "/" + user_from;
-  const std::string new_home = std::string("/") + kHomesShare + "/" + user_to;
-  std::vector<std::shared_ptr<Folder>> moved;
-  for (const std::shared_ptr<Folder>& folder : FoldersOfShare(folder_mgr, kHomesShare)) {
-    const std::string& path = folder->GetPath();
-    if (!IsPathAtOrBelow(path, old_home)) continue;
-    Json::Value data = folder->GetData();
-    data["path"] = new_home + path.substr(old_home.size());
-    auto renamed = std::make_shared<Folder>(data);
-    CORV_CHECK_THROW(folder_mgr.HasFolder(renamed->GetPath()), kErrorDuplicatedId,
-                     "Duplicated ID: " + renamed->GetPath());
-    moved.push_back(renamed);
-  }
-  const sdk::SDKShare share(kHomesShare);
-  const std::string volume = Dirname(share.GetPath());
-  const std::string old_full = volume + old_home;
-  const std::string new_full = volume + new_home;
-  // A folder governs the whole old home, or only the moved folders held documents.
-  std::vector<std::string> old_trees;
-  if (folder_mgr.IsFullPathIndexed(old_full)) {
-    old_trees.push_back(old_full);
-  } else {
-    for (const std::shared_ptr<Folder>& renamed : moved) {
-      old_trees.push_back(volume + old_home + renamed->GetPath().substr(new_home.size()));
-    }
-  }
-
-  for (const std::shared_ptr<Folder>& renamed : moved) {
-    const std::string old_path = old_home + renamed->GetPath().substr(new_home.size());
-    CORV_LOG("Update homes rule: [%s] -> [%s]", old_path.c_str(), renamed->GetPath().c_str());
-    std::shared_ptr<Folder> removed;
-    folder_mgr.Delete(removed, old_path);
-    std::shared_ptr<Folder> reindex;
-    folder_mgr.Upsert(reindex, renamed);
-  }
-  if (!moved.empty()) {
-    folder_mgr.Save();
-    try {
-      UpsertCORVNotifydCfg(kHomesShare, folder_mgr);
-    } catch (const Error&) {
-      folder_mgr_before.Save();
-      RestoreHomesMonitorCfg(folder_mgr_before, true);
-      throw;
-    }
-  }
+  const HomeMove move(user_from, user_to);
+  const std::vector<std::shared_ptr<Folder>> moved = FoldersMovedHome(folder_mgr, move);
+  const std::string volume = Dirname(sdk::SDKShare(kHomesShare).GetPath());
+  const std::vector<std::string> old_trees = OldHomeTrees(folder_mgr, move, volume, moved);
+  if (!moved.empty()) SaveMovedFolders(folder_mgr, folder_mgr_before, move, moved);
   // The home folder was renamed on disk: what was indexed in it is keyed by
   // its old paths.
   try {
@@ -129,7 +151,7 @@ void UserRename(const std::string& user_from, const std::string& user_to) {
   if (!moved.empty()) SendSettingChanged(kHomesShare, true);
   // A reindex of the whole new home, when a folder governs it, covers the
   // moved folders; AddCustomEvent skips what a queued reindex covers.
-  if (folder_mgr.IsFullPathIndexed(new_full)) QueueReindex(new_full);
+  if (folder_mgr.IsFullPathIndexed(volume + move.new_home)) QueueReindex(volume + move.new_home);
   QueueFoldersReindex(moved);
 }
 

@@ -57,95 +57,127 @@ struct CommandInfo {
 
 Json::Value Empty() { return Json::Value(Json::objectValue); }
 
+// The writer's turn at the index the request names ("id").
+WriterTurn TurnAt(const Request& r, bool takes_writes) {
+  return WriterTurn(r.registry.Get(NonEmptyString(r.data, "id")), takes_writes, r.backlog);
+}
+
+// Commits the index and tells its event handler what changed.
+void CommitAndTell(WriterTurn& turn) {
+  const CommitChanges changes = turn.store().Commit();
+  if (turn.plugin() != nullptr) turn.plugin()->Committed(changes);
+}
+
+// ---- one function per command
+
+Json::Value Search(const Request& r) { return RunSearch(r.registry, r.data, AccessFilter(r.peer)); }
+
+Json::Value Suggest(const Request& r) { return RunSuggest(r.registry, r.data, AccessFilter(r.peer)); }
+
+Json::Value IndexList(const Request& r) { return r.registry.List(); }
+
+Json::Value IndexCreate(const Request& r) {
+  const Json::Value settings = r.data.isMember("settings") ? RequiredObject(r.data, "settings") : Empty();
+  const Json::Value handler = r.data.isMember("event_handler") ? RequiredObject(r.data, "event_handler") : Empty();
+  Json::Value out(Json::objectValue);
+  out["created"] = r.registry.Create(NonEmptyString(r.data, "id"), NonEmptyString(r.data, "path"),
+                                     RequiredObject(r.data, "mappings"), settings, handler);
+  return out;
+}
+
+Json::Value IndexDelete(const Request& r) {
+  r.registry.Delete(NonEmptyString(r.data, "id"));
+  return Empty();
+}
+
+Json::Value IndexPause(const Request& r) {
+  r.registry.SetPaused(NonEmptyString(r.data, "id"), true);
+  return Empty();
+}
+
+Json::Value IndexResume(const Request& r) {
+  r.registry.SetPaused(NonEmptyString(r.data, "id"), false);
+  return Empty();
+}
+
+Json::Value IndexConfigSet(const Request& r) {
+  const Json::Value& changes = RequiredObject(r.data, "data");
+  const std::string new_id = OptionalString(changes, "id", "");
+  const std::string new_path = OptionalString(changes, "path", "");
+  if (new_id.empty() && new_path.empty()) throw DaemonError(kCodeBadArgument, "\"data\" needs a new \"id\" or \"path\"");
+  r.registry.Configure(NonEmptyString(r.data, "id"), new_id, new_path);
+  return Empty();
+}
+
+Json::Value DocumentUpsertById(const Request& r) {
+  WriterTurn turn = TurnAt(r, true);
+  turn.store().Upsert(NonEmptyString(r.data, "doc_id"), RequiredObject(r.data, "data"));
+  return Empty();
+}
+
+Json::Value DocumentSetById(const Request& r) {
+  WriterTurn turn = TurnAt(r, true);
+  turn.store().SetById(NonEmptyString(r.data, "doc_id"), RequiredObject(r.data, "data"));
+  return Empty();
+}
+
+Json::Value DocumentDelById(const Request& r) {
+  WriterTurn turn = TurnAt(r, true);
+  Json::Value out(Json::objectValue);
+  out["deleted"] = turn.store().DeleteById(NonEmptyString(r.data, "doc_id")) ? 1 : 0;
+  return out;
+}
+
+Json::Value DocumentDelByQuery(const Request& r) {
+  WriterTurn turn = TurnAt(r, true);
+  const Query query = Query::Parse(QueryClause(r.data), turn.store().schema());
+  Json::Value out(Json::objectValue);
+  out["deleted"] = static_cast<Json::Int64>(turn.store().DeleteByQuery(query));
+  return out;
+}
+
+Json::Value DocumentGetByQuery(const Request& r) {
+  // Read through the writer so a rename sees its own uncommitted writes.
+  WriterTurn turn = TurnAt(r, false);
+  const Query query = Query::Parse(QueryClause(r.data), turn.store().schema());
+  std::vector<std::string> fields = OptionalStrings(QueryObject(r.data), "load_field");
+  if (fields.empty()) fields = OptionalStrings(r.data, "load_field");
+  return turn.store().GetByQuery(query, fields);
+}
+
+Json::Value Commit(const Request& r) {
+  WriterTurn turn = TurnAt(r, false);
+  CommitAndTell(turn);
+  return Empty();
+}
+
+Json::Value UpdateTermSuggestion(const Request& r) {
+  const std::string id = r.data.isMember("id") ? NonEmptyString(r.data, "id") : NonEmptyString(r.data, "db_name");
+  WriterTurn turn(r.registry.Get(id), true, r.backlog);
+  turn.store().UpdateSuggestions(NonEmptyString(r.data, "doc_id_field"));
+  // Suggestions are for searches, which see committed data only.
+  CommitAndTell(turn);
+  return Empty();
+}
+
 // Built once: every request looks its command up here.
 const std::unordered_map<std::string, CommandInfo>& Commands() {
   static const auto* const commands = new std::unordered_map<std::string, CommandInfo>{
-      {"search", {[](const Request& r) { return RunSearch(r.registry, r.data, AccessFilter(r.peer)); }, false, true}},
-      {"suggest", {[](const Request& r) { return RunSuggest(r.registry, r.data, AccessFilter(r.peer)); }, false, true}},
-      {"index_list", {[](const Request& r) { return r.registry.List(); }, false}},
-      {"index_create",
-       {[](const Request& r) {
-          const Json::Value settings = r.data.isMember("settings") ? RequiredObject(r.data, "settings") : Empty();
-          const Json::Value handler = r.data.isMember("event_handler") ? RequiredObject(r.data, "event_handler") : Empty();
-          Json::Value out(Json::objectValue);
-          out["created"] = r.registry.Create(NonEmptyString(r.data, "id"), NonEmptyString(r.data, "path"),
-                                             RequiredObject(r.data, "mappings"), settings, handler);
-          return out;
-        },
-        true}},
-      {"index_delete", {[](const Request& r) { r.registry.Delete(NonEmptyString(r.data, "id")); return Empty(); }, true}},
-      {"index_pause", {[](const Request& r) { r.registry.SetPaused(NonEmptyString(r.data, "id"), true); return Empty(); }, true}},
-      {"index_resume", {[](const Request& r) { r.registry.SetPaused(NonEmptyString(r.data, "id"), false); return Empty(); }, true}},
-      {"index_config_set",
-       {[](const Request& r) {
-          const Json::Value& changes = RequiredObject(r.data, "data");
-          const std::string new_id = OptionalString(changes, "id", "");
-          const std::string new_path = OptionalString(changes, "path", "");
-          if (new_id.empty() && new_path.empty()) throw DaemonError(kCodeBadArgument, "\"data\" needs a new \"id\" or \"path\"");
-          r.registry.Configure(NonEmptyString(r.data, "id"), new_id, new_path);
-          return Empty();
-        },
-        true}},
-      {"document_upsert_by_id",
-       {[](const Request& r) {
-          WriterTurn turn(r.registry.Get(NonEmptyString(r.data, "id")), true, r.backlog);
-          turn.store().Upsert(NonEmptyString(r.data, "doc_id"), RequiredObject(r.data, "data"));
-          return Empty();
-        },
-        true}},
-      {"document_set_by_id",
-       {[](const Request& r) {
-          WriterTurn turn(r.registry.Get(NonEmptyString(r.data, "id")), true, r.backlog);
-          turn.store().SetById(NonEmptyString(r.data, "doc_id"), RequiredObject(r.data, "data"));
-          return Empty();
-        },
-        true}},
-      {"document_del_by_id",
-       {[](const Request& r) {
-          WriterTurn turn(r.registry.Get(NonEmptyString(r.data, "id")), true, r.backlog);
-          Json::Value out(Json::objectValue);
-          out["deleted"] = turn.store().DeleteById(NonEmptyString(r.data, "doc_id")) ? 1 : 0;
-          return out;
-        },
-        true}},
-      {"document_del_by_query",
-       {[](const Request& r) {
-          WriterTurn turn(r.registry.Get(NonEmptyString(r.data, "id")), true, r.backlog);
-          const Query query = Query::Parse(QueryClause(r.data), turn.store().schema());
-          Json::Value out(Json::objectValue);
-          out["deleted"] = static_cast<Json::Int64>(turn.store().DeleteByQuery(query));
-          return out;
-        },
-        true}},
-      {"document_get_by_query",
-       {[](const Request& r) {
-          // Read through the writer so a rename sees its own uncommitted writes.
-          WriterTurn turn(r.registry.Get(NonEmptyString(r.data, "id")), false, r.backlog);
-          const Query query = Query::Parse(QueryClause(r.data), turn.store().schema());
-          std::vector<std::string> fields = OptionalStrings(QueryObject(r.data), "load_field");
-          if (fields.empty()) fields = OptionalStrings(r.data, "load_field");
-          return turn.store().GetByQuery(query, fields);
-        },
-        true}},
-      {"commit",
-       {[](const Request& r) {
-          WriterTurn turn(r.registry.Get(NonEmptyString(r.data, "id")), false, r.backlog);
-          const CommitChanges changes = turn.store().Commit();
-          if (turn.plugin() != nullptr) turn.plugin()->Committed(changes);
-          return Empty();
-        },
-        true}},
-      {"update_term_suggestion",
-       {[](const Request& r) {
-          const std::string id = r.data.isMember("id") ? NonEmptyString(r.data, "id") : NonEmptyString(r.data, "db_name");
-          WriterTurn turn(r.registry.Get(id), true, r.backlog);
-          turn.store().UpdateSuggestions(NonEmptyString(r.data, "doc_id_field"));
-          // Suggestions are for searches, which see committed data only.
-          const CommitChanges changes = turn.store().Commit();
-          if (turn.plugin() != nullptr) turn.plugin()->Committed(changes);
-          return Empty();
-        },
-        true}},
+      {"search", {Search, false, true}},
+      {"suggest", {Suggest, false, true}},
+      {"index_list", {IndexList, false}},
+      {"index_create", {IndexCreate, true}},
+      {"index_delete", {IndexDelete, true}},
+      {"index_pause", {IndexPause, true}},
+      {"index_resume", {IndexResume, true}},
+      {"index_config_set", {IndexConfigSet, true}},
+      {"document_upsert_by_id", {DocumentUpsertById, true}},
+      {"document_set_by_id", {DocumentSetById, true}},
+      {"document_del_by_id", {DocumentDelById, true}},
+      {"document_del_by_query", {DocumentDelByQuery, true}},
+      {"document_get_by_query", {DocumentGetByQuery, true}},
+      {"commit", {Commit, true}},
+      {"update_term_suggestion", {UpdateTermSuggestion, true}},
   };
   return *commands;
 }
@@ -168,33 +200,40 @@ Json::Value Dispatcher::HandleRequest(const Json::Value& request, const PeerIden
   if (!request.isObject()) return fileindex::FailureAnswer(kCodeBadRequest, "The request must be a JSON object");
   if (request.isMember("compound")) {
     if (nested) return fileindex::FailureAnswer(kCodeBadRequest, "Compound requests cannot be nested");
-    const Json::Value& elements = request["compound"];
-    if (!elements.isArray()) return fileindex::FailureAnswer(kCodeBadRequest, "\"compound\" must be an array of requests");
-    // The library renames a folder's descendants in one compound of any
-    // size; anybody else's compound is bounded, or one frame could carry a
-    // million searches.
-    if (!MayWrite(peer) && elements.size() > kMaxUserCompound) {
-      return fileindex::FailureAnswer(kCodeBadRequest, "A compound request may hold at most " + std::to_string(kMaxUserCompound) +
-                                                           " requests; send the others separately");
-    }
-    Json::Value answer(Json::objectValue);
-    answer["success"] = true;
-    answer["data"] = Json::Value(Json::arrayValue);
-    bool has_fail = false;
-    for (const Json::Value& element : elements) {
-      Json::Value result = HandleRequest(element, peer, true);
-      has_fail = has_fail || !result["success"].asBool();
-      answer["data"].append(std::move(result));
-    }
-    answer["has_fail"] = has_fail;
-    return answer;
+    return HandleCompound(request["compound"], peer);
   }
   if (!request["command"].isString()) return fileindex::FailureAnswer(kCodeBadRequest, "The request has no string \"command\"");
   const std::string command = request["command"].asString();
   const Json::Value& data = request["data"];
   if (!data.isNull() && !data.isObject()) return fileindex::FailureAnswer(kCodeBadRequest, "\"data\" must be an object");
+  return AnswerCommand(command, data.isNull() ? Json::Value(Json::objectValue) : data, peer);
+}
+
+Json::Value Dispatcher::HandleCompound(const Json::Value& elements, const PeerIdentity& peer) {
+  if (!elements.isArray()) return fileindex::FailureAnswer(kCodeBadRequest, "\"compound\" must be an array of requests");
+  // The library renames a folder's descendants in one compound of any
+  // size; anybody else's compound is bounded, or one frame could carry a
+  // million searches.
+  if (!MayWrite(peer) && elements.size() > kMaxUserCompound) {
+    return fileindex::FailureAnswer(kCodeBadRequest, "A compound request may hold at most " + std::to_string(kMaxUserCompound) +
+                                                         " requests; send the others separately");
+  }
+  Json::Value answer(Json::objectValue);
+  answer["success"] = true;
+  answer["data"] = Json::Value(Json::arrayValue);
+  bool has_fail = false;
+  for (const Json::Value& element : elements) {
+    Json::Value result = HandleRequest(element, peer, true);
+    has_fail = has_fail || !result["success"].asBool();
+    answer["data"].append(std::move(result));
+  }
+  answer["has_fail"] = has_fail;
+  return answer;
+}
+
+Json::Value Dispatcher::AnswerCommand(const std::string& command, const Json::Value& data, const PeerIdentity& peer) {
   try {
-    return Success(Run(command, data.isNull() ? Json::Value(Json::objectValue) : data, peer));
+    return Success(Run(command, data, peer));
   } catch (const DaemonError& error) {
     return fileindex::FailureAnswer(error.code(), error.what());
   } catch (const std::exception& error) {

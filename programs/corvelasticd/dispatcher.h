@@ -31,6 +31,10 @@ class Dispatcher {
 
  private:
   Json::Value HandleRequest(const Json::Value& request, const PeerIdentity& peer, bool nested);
+  // {"success": true, "data": [answers], "has_fail"} for a compound's elements.
+  Json::Value HandleCompound(const Json::Value& elements, const PeerIdentity& peer);
+  // The command's result, or its failure, as an answer.
+  Json::Value AnswerCommand(const std::string& command, const Json::Value& data, const PeerIdentity& peer);
   Json::Value Run(const std::string& command, const Json::Value& data, const PeerIdentity& peer);
   bool MayWrite(const PeerIdentity& peer) const;
 

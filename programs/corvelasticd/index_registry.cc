@@ -268,70 +268,84 @@ void IndexRegistry::Configure(const std::string& id, const std::string& new_id, 
   const std::string target_id = new_id.empty() ? id : new_id;
   const std::string target_path = new_path.empty() ? old_path : new_path;
   const bool moves = target_path != old_path;
+  CheckNewName(*handle, id, target_id, moves ? &target_path : nullptr);
+  CommitUnderOldName(*handle, moves);
+  std::string failure;
+  const std::string final_path = moves ? MoveDatabase(old_path, target_path, &failure) : target_path;
+  if (failure.empty()) Rename(handle, id, target_id, target_path);
+  const std::string open_failure = Reopen(*handle, moves, final_path);
+  if (!failure.empty()) throw DaemonError(kCodeIndexPath, failure);
+  if (!open_failure.empty()) throw DaemonError(kCodeIndexFailed, "Index " + target_id + " could not be reopened: " + open_failure);
+}
+
+void IndexRegistry::CheckNewName(const IndexHandle& handle, const std::string& id, const std::string& target_id,
+                                 const std::string* target_path) const {
   {
     std::lock_guard<std::mutex> guard(mutex_);
-    if (handle->state_ != IndexHandle::State::kReady) throw DaemonError(kCodeIndexNotFound, "No index " + id);
+    if (handle.state_ != IndexHandle::State::kReady) throw DaemonError(kCodeIndexNotFound, "No index " + id);
     if (target_id != id && indexes_.count(target_id) != 0) throw DaemonError(kCodeIndexExists, "Index " + target_id + " already exists");
     for (const auto& [other_id, other] : indexes_) {
-      if (moves && other->path() == target_path) throw DaemonError(kCodeIndexExists, "Index " + other_id + " already uses " + target_path);
+      if (target_path != nullptr && other->path() == *target_path) throw DaemonError(kCodeIndexExists, "Index " + other_id + " already uses " + *target_path);
     }
   }
-  if (moves && (target_path.empty() || target_path[0] != '/')) {
-    throw DaemonError(kCodeIndexPath, "The index path must be absolute: \"" + target_path + "\"");
+  if (target_path != nullptr && (target_path->empty() || (*target_path)[0] != '/')) {
+    throw DaemonError(kCodeIndexPath, "The index path must be absolute: \"" + *target_path + "\"");
   }
+}
+
+void IndexRegistry::CommitUnderOldName(IndexHandle& handle, bool closes) {
+  std::lock_guard<std::mutex> state(handle.state_mutex_);
+  const CommitChanges changes = handle.store_->Commit();
+  if (handle.plugin_ != nullptr) handle.plugin_->Committed(changes);
+  handle.plugin_.reset();
+  if (closes) {
+    handle.store_->Close(true);
+    handle.store_.reset();
+    handle.state_ = IndexHandle::State::kOpening;
+  }
+}
+
+std::string IndexRegistry::MoveDatabase(const std::string& old_path, const std::string& target_path, std::string* failure) {
+  try {
+    MoveIndexFiles(old_path, target_path);
+  } catch (const DaemonError& error) {
+    *failure = error.what();
+    return old_path;  // the database stays where it was and is opened there again
+  }
+  return target_path;
+}
+
+void IndexRegistry::Rename(const std::shared_ptr<IndexHandle>& handle, const std::string& id, const std::string& new_id,
+                           const std::string& new_path) {
+  std::lock_guard<std::mutex> guard(mutex_);
   {
-    // What was written so far is committed under the old id and place.
     std::lock_guard<std::mutex> state(handle->state_mutex_);
-    const CommitChanges changes = handle->store_->Commit();
-    if (handle->plugin_ != nullptr) handle->plugin_->Committed(changes);
-    handle->plugin_.reset();
-    if (moves) {
-      handle->store_->Close(true);
-      handle->store_.reset();
-      handle->state_ = IndexHandle::State::kOpening;
-    }
+    handle->id_ = new_id;
+    handle->path_ = new_path;
   }
-  std::string failure;
-  std::string final_path = target_path;
-  if (moves) {
-    try {
-      MoveIndexFiles(old_path, target_path);
-    } catch (const DaemonError& error) {
-      failure = error.what();
-      final_path = old_path;  // the database stays where it was and is opened there again
-    }
-  }
-  {
-    std::lock_guard<std::mutex> guard(mutex_);
-    {
-      std::lock_guard<std::mutex> state(handle->state_mutex_);
-      handle->id_ = failure.empty() ? target_id : id;
-      handle->path_ = final_path;
-    }
-    if (failure.empty()) {
-      indexes_.erase(id);
-      indexes_[target_id] = handle;
-      Save();
-    }
-  }
+  indexes_.erase(id);
+  indexes_[new_id] = handle;
+  Save();
+}
+
+std::string IndexRegistry::Reopen(IndexHandle& handle, bool moved, const std::string& final_path) {
   std::string open_failure;
   std::shared_ptr<IndexStore> store;
-  if (moves) {
+  if (moved) {
     try {
       store = IndexStore::Open(final_path);
     } catch (const std::exception& error) {
       open_failure = error.what();
     }
   }
-  std::lock_guard<std::mutex> state(handle->state_mutex_);
-  if (moves) {
-    handle->store_ = store;
-    handle->failure_ = open_failure;
-    handle->state_ = open_failure.empty() ? IndexHandle::State::kReady : IndexHandle::State::kFailed;
+  std::lock_guard<std::mutex> state(handle.state_mutex_);
+  if (moved) {
+    handle.store_ = store;
+    handle.failure_ = open_failure;
+    handle.state_ = open_failure.empty() ? IndexHandle::State::kReady : IndexHandle::State::kFailed;
   }
-  if (handle->store_ != nullptr) handle->plugin_ = std::make_unique<EventPlugin>(handle->id_, handle->event_handler_);
-  if (!failure.empty()) throw DaemonError(kCodeIndexPath, failure);
-  if (!open_failure.empty()) throw DaemonError(kCodeIndexFailed, "Index " + target_id + " could not be reopened: " + open_failure);
+  if (handle.store_ != nullptr) handle.plugin_ = std::make_unique<EventPlugin>(handle.id_, handle.event_handler_);
+  return open_failure;
 }
 
 void IndexRegistry::SetPaused(const std::string& id, bool paused) {

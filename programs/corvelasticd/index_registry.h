@@ -2,6 +2,15 @@
 // are paused, and their state (opening, ready, failed). The list survives
 // restarts in a small JSON file written atomically; at start every listed
 // index is reopened in the background (requests meanwhile get 1401).
+//
+// Lock order. A thread that holds one of these locks takes only locks lower
+// in the list, so no two threads ever wait for each other:
+//   1. IndexHandle::writer_mutex_  one index's writer: a write request, its
+//                                  opening, reconfiguration, deletion, closing
+//   2. IndexRegistry::mutex_       the map of indexes and the registry file
+//   3. IndexHandle::state_mutex_   one index's id, path, state, store, plug-in
+// A search takes 2 then 3 and never a writer lock, so a long write does not
+// hold up searches of other indexes, nor of this one's committed data.
 #pragma once
 
 #include <json/json.h>
@@ -105,6 +114,23 @@ class IndexRegistry {
   void Save();  // with mutex_ held
   void OpenInBackground();
   void OpenOne(const std::shared_ptr<IndexHandle>& handle);
+
+  // Steps of Configure, with the index's writer lock held.
+  // Refuses a new id taken by another index, a new directory (when
+  // `target_path` is not null) used by one or not absolute.
+  void CheckNewName(const IndexHandle& handle, const std::string& id, const std::string& target_id,
+                    const std::string* target_path) const;
+  // Commits what was written under the old id and place; `closes` closes
+  // the store too, for a move.
+  static void CommitUnderOldName(IndexHandle& handle, bool closes);
+  // Where the database is after trying to move it: `target_path`, or the
+  // old path with the reason in `failure`.
+  static std::string MoveDatabase(const std::string& old_path, const std::string& target_path, std::string* failure);
+  void Rename(const std::shared_ptr<IndexHandle>& handle, const std::string& id, const std::string& new_id,
+              const std::string& new_path);
+  // Opens the store again after a move (`moved`) and gives the index a
+  // plug-in under its current id; the reason when the store did not open.
+  static std::string Reopen(IndexHandle& handle, bool moved, const std::string& final_path);
 
   std::string file_;
   int open_delay_ms_;

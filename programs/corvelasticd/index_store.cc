@@ -52,6 +52,28 @@ void ForEachValue(const Json::Value& value, Visit visit) {
 
 std::string ValueText(const Json::Value& value) { return value.isString() ? value.asString() : value.asString(); }
 
+// The next candidates, as many as one access check takes, with their rows;
+// false when the candidates ran out.
+bool NextBatch(SearchCandidates& candidates, std::vector<Hit>* batch, std::vector<int64_t>* rowids) {
+  batch->clear();
+  rowids->clear();
+  while (batch->size() < kFilterBatch) {
+    Hit hit;
+    int64_t rowid = 0;
+    if (!candidates.Next(&rowid, &hit)) return false;
+    rowids->push_back(rowid);
+    batch->push_back(std::move(hit));
+  }
+  return true;
+}
+
+std::vector<std::string> KeysOf(const std::vector<Hit>& hits) {
+  std::vector<std::string> keys;
+  keys.reserve(hits.size());
+  for (const Hit& hit : hits) keys.push_back(hit.key);
+  return keys;
+}
+
 }  // namespace
 
 std::string IndexStore::DatabasePath(const std::string& directory) { return directory + "/" + kDatabaseName; }
@@ -644,33 +666,125 @@ void IndexStore::BuildKeyDirectory(Database& reader) {
   keys_.FinishBuild(at, complete);
 }
 
-SearchResult IndexStore::Search(const Query& query, const SortSpec& sort, size_t want, size_t check_budget,
-                                const ReadableFilter& readable) {
-  const bool ranked = sort.by == SortSpec::By::kScore && query.HasRankedClause();
+// What a search asks of SQL: its condition, the candidates' source and
+// order. Ranked searches read "s.rank" from a full-text match joined to "docs".
+struct IndexStore::SearchPlan {
+  bool ranked = false;
   std::string condition;
-  std::vector<SqlValue> values;
-  if (ranked) values.push_back(query.RankedExpression());
-  query.Compile(ranked, &condition, &values);
-  const std::string rank_expression = WeightedRank(schema_);
-  const int recency_code = RecencyCode(schema_);
-  const std::string from = ranked ? "(SELECT rowid, " + rank_expression +
-                                        " AS rank FROM fts_text WHERE fts_text MATCH ?) s JOIN docs d ON d.rowid = s.rowid"
-                                  : "docs d";
+  std::vector<SqlValue> values;  // of `condition` (and the match, when ranked)
+  std::string rank_expression;
+  int recency_code = -1;
+  std::string from;
   std::string sort_expression = "NULL";
   std::string order = "d.key";
-  std::vector<SqlValue> select_values = values;
-  if (ranked) {
-    order = "s.rank, d.key";
+  // A word query alone (the usual search) is ordered from the full-text
+  // index's scores; anything else by SQL.
+  bool ranked_alone() const { return ranked && condition == "1"; }
+};
+
+IndexStore::SearchPlan IndexStore::PlanSearch(const Query& query, const SortSpec& sort) const {
+  SearchPlan plan;
+  plan.ranked = sort.by == SortSpec::By::kScore && query.HasRankedClause();
+  if (plan.ranked) plan.values.push_back(query.RankedExpression());
+  query.Compile(plan.ranked, &plan.condition, &plan.values);
+  plan.rank_expression = WeightedRank(schema_);
+  plan.recency_code = RecencyCode(schema_);
+  plan.from = plan.ranked ? "(SELECT rowid, " + plan.rank_expression +
+                                " AS rank FROM fts_text WHERE fts_text MATCH ?) s JOIN docs d ON d.rowid = s.rowid"
+                          : "docs d";
+  if (plan.ranked) {
+    plan.order = "s.rank, d.key";
   } else if (sort.by == SortSpec::By::kKey) {
-    order = std::string("d.key") + (sort.descending ? " DESC" : "");
+    plan.order = std::string("d.key") + (sort.descending ? " DESC" : "");
   } else if (sort.by == SortSpec::By::kField) {
-    sort_expression = "corv_field(d.key, d.doc, " + std::to_string(sort.code) + ")";
-    if (sort.text) sort_expression = "corv_fold(" + sort_expression + ")";
-    order = sort_expression + (sort.descending ? " DESC" : "") + ", d.key";
+    plan.sort_expression = "corv_field(d.key, d.doc, " + std::to_string(sort.code) + ")";
+    if (sort.text) plan.sort_expression = "corv_fold(" + plan.sort_expression + ")";
+    plan.order = plan.sort_expression + (sort.descending ? " DESC" : "") + ", d.key";
   }
+  return plan;
+}
+
+std::unique_ptr<SearchCandidates> IndexStore::OpenCandidates(Database& reader, const Query& query, const SearchPlan& plan,
+                                                             const NameTiers& tiers, uint64_t keys_at) {
+  if (plan.ranked_alone()) {
+    return std::make_unique<RankedMatchCandidates>(reader, query.RankedExpression(), plan.rank_expression, tiers,
+                                                   plan.recency_code, &keys_, keys_at);
+  }
+  std::vector<SqlValue> select_values = plan.values;
+  std::string order = plan.order;
+  if (plan.ranked) {
+    // Exact names, then names holding the words, then the rest; newest first on ties.
+    std::string tier = "2";
+    if (!tiers.name_expression().empty()) {
+      std::string exact = "-1";
+      for (const int64_t rowid : tiers.exact()) exact += ", " + std::to_string(rowid);
+      tier = "CASE WHEN d.rowid IN (" + exact +
+             ") THEN 0 WHEN d.rowid IN (SELECT rowid FROM fts_text WHERE fts_text MATCH ?) THEN 1 ELSE 2 END";
+      select_values.push_back(tiers.name_expression());
+    }
+    const std::string recency =
+        plan.recency_code >= 0 ? "corv_field(d.key, d.doc, " + std::to_string(plan.recency_code) + ") DESC, " : "";
+    order = tier + ", s.rank, " + recency + "d.key";
+  }
+  const std::string sql = "SELECT d.rowid, d.key, " + std::string(plan.ranked ? "s.rank" : "0") + ", " +
+                          plan.sort_expression + " FROM " + plan.from + " WHERE " + plan.condition + " ORDER BY " + order;
+  auto select = reader.Prepare(sql);
+  select->BindAll(select_values);
+  return std::make_unique<StatementCandidates>(std::move(select), plan.ranked, &tiers);
+}
+
+void IndexStore::CollectHits(Database& reader, SearchCandidates& candidates, const SearchPlan& plan, size_t want,
+                             size_t check_budget, const ReadableFilter& readable, SearchResult* result) const {
+  std::vector<Hit> batch;
+  std::vector<int64_t> rowids;
+  size_t checked_past_page = 0;
+  bool more = true;
+  Statement& load = reader.Cached("SELECT doc FROM docs WHERE rowid = ?");
+  while (more) {
+    more = NextBatch(candidates, &batch, &rowids);
+    if (batch.empty()) break;
+    const std::vector<bool> allowed = readable ? readable(KeysOf(batch)) : std::vector<bool>(batch.size(), true);
+    for (size_t i = 0; i < batch.size(); ++i) {
+      if (result->hits.size() >= want) ++checked_past_page;
+      if (!allowed[i]) continue;
+      ++result->total;
+      if (result->hits.size() < want) {
+        // Documents are read only for the hits that make the page.
+        load.Reset();
+        load.Bind(1, rowids[i]);
+        if (load.Step()) batch[i].document = DecodeDocument(batch[i].key, load.Bytes(0));
+        load.Reset();
+        result->hits.push_back(std::move(batch[i]));
+      }
+    }
+    if (result->hits.size() >= want) {
+      if (!readable) {
+        // Every hit is readable: the count needs no checks.
+        result->total = CountMatches(reader, plan);
+        return;
+      }
+      if (checked_past_page >= check_budget) {
+        Hit rest;
+        int64_t rowid = 0;
+        result->total_exact = !candidates.Next(&rowid, &rest);
+        return;
+      }
+    }
+  }
+}
+
+int64_t IndexStore::CountMatches(Database& reader, const SearchPlan& plan) {
+  auto count = reader.Prepare("SELECT count(*) FROM " + plan.from + " WHERE " + plan.condition);
+  count->BindAll(plan.values);
+  count->Step();
+  return count->Int(0);
+}
+
+SearchResult IndexStore::Search(const Query& query, const SortSpec& sort, size_t want, size_t check_budget,
+                                const ReadableFilter& readable) {
+  const SearchPlan plan = PlanSearch(query, sort);
   std::unique_ptr<Database> reader = TakeReader();
-  const bool ranked_alone = ranked && condition == "1";
-  if (ranked_alone && !keys_.ready()) BuildKeyDirectory(*reader);
+  if (plan.ranked_alone() && !keys_.ready()) BuildKeyDirectory(*reader);
   const uint64_t keys_at = keys_.generation();
   SearchResult result;
   // One read transaction: the hits, their documents and the count come from one snapshot.
@@ -678,82 +792,9 @@ SearchResult IndexStore::Search(const Query& query, const SortSpec& sort, size_t
   try {
     // The snapshot is taken by the first read, here: the key directory
     // serves it when no commit began before that.
-    const NameTiers tiers = ranked ? NameTiers::Find(*reader, query, schema_) : NameTiers();
-    // A word query alone (the usual search) is ordered from the full-text
-    // index's scores; anything else by SQL.
-    std::unique_ptr<SearchCandidates> candidates;
-    if (ranked_alone) {
-      candidates = std::make_unique<RankedMatchCandidates>(*reader, query.RankedExpression(), rank_expression, tiers,
-                                                           recency_code, &keys_, keys_at);
-    } else {
-      if (ranked) {
-        // Exact names, then names holding the words, then the rest; newest first on ties.
-        std::string tier = "2";
-        if (!tiers.name_expression().empty()) {
-          std::string exact = "-1";
-          for (const int64_t rowid : tiers.exact()) exact += ", " + std::to_string(rowid);
-          tier = "CASE WHEN d.rowid IN (" + exact +
-                 ") THEN 0 WHEN d.rowid IN (SELECT rowid FROM fts_text WHERE fts_text MATCH ?) THEN 1 ELSE 2 END";
-          select_values.push_back(tiers.name_expression());
-        }
-        const std::string recency = recency_code >= 0 ? "corv_field(d.key, d.doc, " + std::to_string(recency_code) + ") DESC, " : "";
-        order = tier + ", s.rank, " + recency + "d.key";
-      }
-      const std::string sql = "SELECT d.rowid, d.key, " + std::string(ranked ? "s.rank" : "0") + ", " + sort_expression +
-                              " FROM " + from + " WHERE " + condition + " ORDER BY " + order;
-      auto select = reader->Prepare(sql);
-      select->BindAll(select_values);
-      candidates = std::make_unique<StatementCandidates>(std::move(select), ranked, &tiers);
-    }
-    std::vector<Hit> batch;
-    std::vector<int64_t> rowids;
-    size_t checked_past_page = 0;
-    bool more = true;
-    Statement& load = reader->Cached("SELECT doc FROM docs WHERE rowid = ?");
-    while (more) {
-      batch.clear();
-      rowids.clear();
-      std::vector<std::string> keys;
-      while (batch.size() < kFilterBatch) {
-        Hit hit;
-        int64_t rowid = 0;
-        if (!(more = candidates->Next(&rowid, &hit))) break;
-        rowids.push_back(rowid);
-        keys.push_back(hit.key);
-        batch.push_back(std::move(hit));
-      }
-      if (batch.empty()) break;
-      const std::vector<bool> allowed = readable ? readable(keys) : std::vector<bool>(keys.size(), true);
-      for (size_t i = 0; i < batch.size(); ++i) {
-        if (result.hits.size() >= want) ++checked_past_page;
-        if (!allowed[i]) continue;
-        ++result.total;
-        if (result.hits.size() < want) {
-          // Documents are read only for the hits that make the page.
-          load.Reset();
-          load.Bind(1, rowids[i]);
-          if (load.Step()) batch[i].document = DecodeDocument(batch[i].key, load.Bytes(0));
-          load.Reset();
-          result.hits.push_back(std::move(batch[i]));
-        }
-      }
-      if (result.hits.size() >= want) {
-        if (!readable) {
-          // Every hit is readable: the count needs no checks.
-          auto count = reader->Prepare("SELECT count(*) FROM " + from + " WHERE " + condition);
-          count->BindAll(values);
-          count->Step();
-          result.total = count->Int(0);
-          break;
-        }
-        if (checked_past_page >= check_budget) {
-          Hit rest;
-          int64_t rowid = 0;
-          result.total_exact = !candidates->Next(&rowid, &rest);
-          break;
-        }
-      }
-    }
+    const NameTiers tiers = plan.ranked ? NameTiers::Find(*reader, query, schema_) : NameTiers();
+    const std::unique_ptr<SearchCandidates> candidates = OpenCandidates(*reader, query, plan, tiers, keys_at);
+    CollectHits(*reader, *candidates, plan, want, check_budget, readable, &result);
   } catch (...) {
     reader->Exec("ROLLBACK");
     throw;

@@ -34,6 +34,9 @@
 namespace corvlumex {
 namespace elasticd {
 
+class NameTiers;
+class SearchCandidates;
+
 // Keys changed since the last commit, for the event handler.
 struct CommitChanges {
   std::vector<std::string> upserted;
@@ -150,6 +153,18 @@ class IndexStore {
   void NoteKeyChange(int64_t rowid, std::optional<std::string> key);
   // Fills the key directory from one snapshot of "docs" (once, by one reader).
   void BuildKeyDirectory(Database& reader);
+
+  // Search steps, in one read transaction of `reader`.
+  struct SearchPlan;
+  SearchPlan PlanSearch(const Query& query, const SortSpec& sort) const;
+  // The candidates in the answer's order; `tiers` must outlive them.
+  std::unique_ptr<SearchCandidates> OpenCandidates(Database& reader, const Query& query, const SearchPlan& plan,
+                                                   const NameTiers& tiers, uint64_t keys_at);
+  // Filters the candidates by `readable` in batches, reads the documents of
+  // the page and counts readable hits as far as `check_budget` allows.
+  void CollectHits(Database& reader, SearchCandidates& candidates, const SearchPlan& plan, size_t want,
+                   size_t check_budget, const ReadableFilter& readable, SearchResult* result) const;
+  static int64_t CountMatches(Database& reader, const SearchPlan& plan);
 
   // Reader pool.
   std::unique_ptr<Database> TakeReader();

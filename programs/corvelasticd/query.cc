@@ -182,8 +182,7 @@ class Parser {
     const auto groups = ColumnsFor(field);
     std::vector<std::string> word_expressions;
     // Words are split on blanks first so each word is analyzed per column kind.
-    std::vector<std::string> raw_words;
-    ForEachBlankSeparated(CountText(text), &raw_words);
+    const std::vector<std::string> raw_words = SplitOnBlanks(CountText(text));
     size_t clause_words = 0;
     const std::vector<std::string> name_columns = NameWordColumns(field);
     std::vector<std::string> name_expressions, exact_tokens;
@@ -231,16 +230,19 @@ class Parser {
     return node;
   }
 
-  static void ForEachBlankSeparated(const std::string& text, std::vector<std::string>* out) {
+  // The runs of text between spaces, tabs and line ends.
+  static std::vector<std::string> SplitOnBlanks(const std::string& text) {
+    std::vector<std::string> pieces;
     size_t start = std::string::npos;
     for (size_t i = 0; i <= text.size(); ++i) {
       const bool blank = i == text.size() || text[i] == ' ' || text[i] == '\t' || text[i] == '\n' || text[i] == '\r';
       if (!blank && start == std::string::npos) start = i;
       if (blank && start != std::string::npos) {
-        out->push_back(text.substr(start, i - start));
+        pieces.push_back(text.substr(start, i - start));
         start = std::string::npos;
       }
     }
+    return pieces;
   }
 
   QueryNode Substring(const FieldSpec& field_def, const std::string& text) {

@@ -5,17 +5,16 @@
 //
 // SIGTERM or SIGINT stops it after every event read so far is written.
 #include <fcntl.h>
-#include <pthread.h>
-#include <signal.h>
 #include <sys/file.h>
 #include <syslog.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <optional>
 #include <string>
-#include <thread>
 
 #include "common/error.h"
 #include "common/log.h"
@@ -23,6 +22,7 @@
 #include "platform/linux/config_files.h"
 #include "platform/linux/notifier_presence.h"
 #include "programs/corvnotifyd/notifier.h"
+#include "programs/daemon_support/stop_signals.h"
 
 namespace {
 
@@ -50,18 +50,16 @@ void ApplyTestHooks(NotifierOptions* options) {
   }
 }
 
-}  // namespace
-
-int main(int argc, char** argv) {
-  bool foreground = false;
-  NotifierOptions options;
-  options.config_dir = corvlumex::platform::NotifierConfigDir();
+// The exit status when the arguments end the program (help, a mistake);
+// nothing when it is to run.
+std::optional<int> ParseArguments(int argc, char** argv, bool* foreground, NotifierOptions* options) {
+  options->config_dir = corvlumex::platform::NotifierConfigDir();
   for (int i = 1; i < argc; ++i) {
     const std::string arg = argv[i];
     if (arg == "--foreground") {
-      foreground = true;
+      *foreground = true;
     } else if (arg == "--config-dir" && i + 1 < argc && argv[i + 1][0] != '\0') {
-      options.config_dir = argv[++i];
+      options->config_dir = argv[++i];
     } else if (arg == "--help" || arg == "-h") {
       Usage(stdout);
       return 0;
@@ -72,78 +70,76 @@ int main(int argc, char** argv) {
       return 2;
     }
   }
-  while (options.config_dir.size() > 1 && options.config_dir.back() == '/') options.config_dir.pop_back();
-  ApplyTestHooks(&options);
+  while (options->config_dir.size() > 1 && options->config_dir.back() == '/') options->config_dir.pop_back();
+  return std::nullopt;
+}
 
-  // Two notifiers reading one configuration would append every change twice:
-  // the configuration folder stays locked while this one runs (the lock goes
-  // with the process, also into the background child). It also carries the
-  // mark by which `fileindex status` tells that a notifier runs. The folder
-  // is made first, so that even the first run is locked and seen.
-  if (!corvlumex::platform::MakeDirs(options.config_dir)) {
-    fprintf(stderr, "corvnotifyd: cannot create the configuration folder %s: %s\n", options.config_dir.c_str(),
-            strerror(errno));
-    return 1;
+// Two notifiers reading one configuration would append every change twice:
+// the configuration folder stays locked while this one runs (the lock goes
+// with the process, also into the background child; its descriptors stay
+// open until the process ends). It also carries the mark by which
+// `fileindex status` tells that a notifier runs. The folder is made first,
+// so that even the first run is locked and seen. False, said on standard
+// error, when the locks cannot be had.
+bool HoldConfigLocks(const std::string& config_dir) {
+  if (!corvlumex::platform::MakeDirs(config_dir)) {
+    fprintf(stderr, "corvnotifyd: cannot create the configuration folder %s: %s\n", config_dir.c_str(), strerror(errno));
+    return false;
   }
-  const int config_lock = open(options.config_dir.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  const int config_lock = open(config_dir.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
   if (config_lock < 0) {
-    fprintf(stderr, "corvnotifyd: cannot open the configuration folder %s: %s\n", options.config_dir.c_str(),
-            strerror(errno));
-    return 1;
+    fprintf(stderr, "corvnotifyd: cannot open the configuration folder %s: %s\n", config_dir.c_str(), strerror(errno));
+    return false;
   }
   // The one-notifier lock is taken on a file only this daemon's user can
   // open: a lock on the folder itself (readable by every local user) could be
   // taken by anyone, and would keep the notifier from ever starting.
-  const std::string instance_path = options.config_dir + "/.corvnotifyd.lock";
+  const std::string instance_path = config_dir + "/.corvnotifyd.lock";
   const int instance_lock = open(instance_path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
   if (instance_lock < 0) {
     fprintf(stderr, "corvnotifyd: cannot open its lock file %s: %s\n", instance_path.c_str(), strerror(errno));
-    return 1;
+    return false;
   }
   if (flock(instance_lock, LOCK_EX | LOCK_NB) != 0) {
-    fprintf(stderr, "corvnotifyd: another corvnotifyd already watches as configured in %s\n",
-            options.config_dir.c_str());
-    return 1;
+    fprintf(stderr, "corvnotifyd: another corvnotifyd already watches as configured in %s\n", config_dir.c_str());
+    return false;
   }
   if (!corvlumex::platform::HoldNotifierPresence(config_lock)) {
-    fprintf(stderr, "corvnotifyd: cannot lock the configuration folder %s: %s\n", options.config_dir.c_str(),
-            strerror(errno));
-    return 1;
+    fprintf(stderr, "corvnotifyd: cannot lock the configuration folder %s: %s\n", config_dir.c_str(), strerror(errno));
+    return false;
   }
+  return true;
+}
 
+// Logs to standard error in the foreground, else to syslog from a
+// background process. False when it could not detach.
+bool StartLogging(bool foreground) {
   if (foreground) {
     corvlumex::LogToStderr("corvnotifyd");
-  } else {
-    openlog("corvnotifyd", LOG_PID, LOG_DAEMON);
-    if (daemon(0, 0) != 0) {
-      perror("corvnotifyd: daemon");
-      return 1;
-    }
+    return true;
   }
+  openlog("corvnotifyd", LOG_PID, LOG_DAEMON);
+  if (daemon(0, 0) != 0) {
+    perror("corvnotifyd: daemon");
+    return false;
+  }
+  return true;
+}
 
-  // The signals are taken by one thread, synchronously; every other thread
-  // inherits the block.
-  sigset_t stop_signals;
-  sigemptyset(&stop_signals);
-  sigaddset(&stop_signals, SIGTERM);
-  sigaddset(&stop_signals, SIGINT);
-  pthread_sigmask(SIG_BLOCK, &stop_signals, nullptr);
-  signal(SIGPIPE, SIG_IGN);
-
+// Watches until a stop signal, or until the reader fails; the exit status.
+int RunNotifier(const NotifierOptions& options, bool foreground) {
   try {
     corvlumex::notifyd::Notifier notifier(options);
     notifier.Start();
-    std::thread signal_thread([&] {
-      int received = 0;
-      sigwait(&stop_signals, &received);
-      CORV_LOG("stopping on signal %d: writing what is pending", received);
-      notifier.Stop();
-    });
-    CORV_LOG("watching as configured in %s", options.config_dir.c_str());
-    notifier.Run();
-    // Run() also ends when the reader fails: release the signal thread.
-    pthread_kill(signal_thread.native_handle(), SIGTERM);
-    signal_thread.join();
+    {
+      const corvlumex::StopSignalThread stopper([&](int received) {
+        CORV_LOG("stopping on signal %d: writing what is pending", received);
+        notifier.Stop();
+      });
+      CORV_LOG("watching as configured in %s", options.config_dir.c_str());
+      // Run() also ends when the reader fails: leaving the scope releases the signal thread.
+      notifier.Run();
+    }
     CORV_LOG("stopped");
   } catch (const corvlumex::Error& e) {
     CORV_LOG("cannot run: %s", e.what());
@@ -151,4 +147,18 @@ int main(int argc, char** argv) {
     return 1;
   }
   return 0;
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  bool foreground = false;
+  NotifierOptions options;
+  if (const std::optional<int> status = ParseArguments(argc, argv, &foreground, &options)) return *status;
+  ApplyTestHooks(&options);
+  if (!HoldConfigLocks(options.config_dir)) return 1;
+  if (!StartLogging(foreground)) return 1;
+  // The notifier's threads inherit the block.
+  corvlumex::BlockStopSignals();
+  return RunNotifier(options, foreground);
 }

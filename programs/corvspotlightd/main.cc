@@ -5,20 +5,18 @@
 //   corvspotlightd [--address A] [--port N] [--service-user NAME] [--log-stderr] ...
 //
 // SIGTERM or SIGINT stops it after the requests in progress.
-#include <pthread.h>
 #include <pwd.h>
-#include <signal.h>
 #include <syslog.h>
 
 #include <CLI/CLI.hpp>
 #include <cstdio>
-#include <thread>
 
 #include "common/log.h"
 #include "common/index_fields.h"
 #include "fileindex/elastic/schema.h"
 #include "programs/corvspotlightd/http_listener.h"
 #include "programs/corvspotlightd/search_handler.h"
+#include "programs/daemon_support/stop_signals.h"
 
 namespace {
 
@@ -68,12 +66,7 @@ int main(int argc, char** argv) {
     options.allowed_uids.insert(user->pw_uid);
   }
 
-  sigset_t stop_signals;
-  sigemptyset(&stop_signals);
-  sigaddset(&stop_signals, SIGTERM);
-  sigaddset(&stop_signals, SIGINT);
-  pthread_sigmask(SIG_BLOCK, &stop_signals, nullptr);
-  signal(SIGPIPE, SIG_IGN);
+  corvlumex::BlockStopSignals();
 
   const corvlumex::spotlightd::SearchHandler handler(
       corvlumex::spotlightd::FieldTable::FromMappings(corvlumex::fileindex::elastic::GetFileIndexMappings()),
@@ -85,15 +78,14 @@ int main(int argc, char** argv) {
     return 1;
   }
   CORV_LOG("listening on %s port %d", options.address.c_str(), port);
-  std::thread signal_thread([&] {
-    int received = 0;
-    sigwait(&stop_signals, &received);
-    if (received != 0) CORV_LOG("stopping on signal %d", received);
-    listener.Stop();
-  });
-  const bool served = listener.Serve();
-  pthread_kill(signal_thread.native_handle(), SIGTERM);  // when serving ended on its own
-  signal_thread.join();
+  bool served = false;
+  {
+    const corvlumex::StopSignalThread stopper([&](int received) {
+      if (received != 0) CORV_LOG("stopping on signal %d", received);
+      listener.Stop();
+    });
+    served = listener.Serve();
+  }
   CORV_LOG("stopped");
   return served ? 0 : 1;
 }

@@ -121,15 +121,10 @@ void Search(const httplib::Request& request, httplib::Response& response, WebCon
 void Suggest(const httplib::Request& request, httplib::Response& response, WebContext& context) {
   const Session session = RequireSession(request, context);
   CheckParams(request.params, {"q", "share", "size"});
-  Json::Value ask(Json::objectValue);
-  ask["command"] = "suggest";
   const std::vector<std::string> shares = SharesParam(request.params);
-  if (!shares.empty()) ask["data"]["ids"] = frontend::IndexIds(shares);
-  ask["data"]["field"] = kFieldSearchFileName;
-  ask["data"]["text"] = Param(request.params, "q").value_or("");
-  ask["data"]["size"] = static_cast<Json::Int64>(IntegerParam(request.params, "size", 1, 20).value_or(8));
-  ask["data"]["as_user"] = session.user;
-  const Json::Value data = AskSearchDaemon(ask);
+  const std::string text = Param(request.params, "q").value_or("");
+  const auto size = static_cast<unsigned>(IntegerParam(request.params, "size", 1, 20).value_or(8));
+  const Json::Value data = AskSearchDaemon(frontend::SuggestRequest(shares, text, size, session.user));
   Json::Value out(Json::arrayValue);
   for (const Json::Value& item : data["suggestions"]) out.append(item["term"]);
   ReplyJson(response, out);

@@ -73,19 +73,13 @@ void ChangeVolume(const Output& output, const std::string& volume, bool pause) {
 
 void AddVolume(CLI::App& app, Output& output) {
   static std::string path;
-  CLI::App* volume = app.add_subcommand("volume", "pause or resume indexing of every share on a volume");
-  volume->require_subcommand(1);
-  CLI::App* pause = volume->add_subcommand("pause", "pause the shares of a volume");
-  pause->add_option("path", path, "the volume's directory (/volume1)")->required();
-  pause->callback([&output] { ChangeVolume(output, path, true); });
-  CLI::App* resume = volume->add_subcommand("resume", "resume the shares of a volume");
-  resume->add_option("path", path, "the volume's directory (/volume1)")->required();
-  resume->callback([&output] { ChangeVolume(output, path, false); });
+  CLI::App* volume = AddCommandGroup(app, "volume", "pause or resume indexing of every share on a volume");
+  AddPauseAndResume(volume, "pause the shares of a volume", "resume the shares of a volume", "path",
+                    "the volume's directory (/volume1)", path, ChangeVolume, output);
 }
 
 void AddHome(CLI::App& app, Output& output) {
-  CLI::App* home = app.add_subcommand("home", "follow the home folder service switched on or off");
-  home->require_subcommand(1);
+  CLI::App* home = AddCommandGroup(app, "home", "follow the home folder service switched on or off");
   auto change = [&output](bool enable) {
     PrepareChange(enable ? "home enable" : "home disable");
     const bool indexed = fileindex::FolderMgr().IsShareIndexed(fileindex::kHomesShare);
@@ -102,8 +96,7 @@ void AddHome(CLI::App& app, Output& output) {
 
 void AddUser(CLI::App& app, Output& output) {
   static std::string from, to;
-  CLI::App* user = app.add_subcommand("user", "follow a renamed user");
-  user->require_subcommand(1);
+  CLI::App* user = AddCommandGroup(app, "user", "follow a renamed user");
   CLI::App* rename = user->add_subcommand("rename", "the user's home folder moved with the new name");
   rename->add_option("from", from, "the old user name")->required();
   rename->add_option("to", to, "the new user name")->required();
@@ -124,6 +117,23 @@ void AddUser(CLI::App& app, Output& output) {
 }
 
 }  // namespace
+
+CLI::App* AddCommandGroup(CLI::App& app, const std::string& name, const std::string& description) {
+  CLI::App* group = app.add_subcommand(name, description);
+  group->require_subcommand(1);
+  return group;
+}
+
+void AddPauseAndResume(CLI::App* group, const std::string& pause_help, const std::string& resume_help,
+                       const std::string& arg, const std::string& arg_help, std::string& value, PauseChange change,
+                       Output& output) {
+  CLI::App* pause = group->add_subcommand("pause", pause_help);
+  pause->add_option(arg, value, arg_help)->required();
+  pause->callback([&output, &value, change] { change(output, value, true); });
+  CLI::App* resume = group->add_subcommand("resume", resume_help);
+  resume->add_option(arg, value, arg_help)->required();
+  resume->callback([&output, &value, change] { change(output, value, false); });
+}
 
 void PrepareChange(const std::string& command) {
   RequireRoot(command);

@@ -21,6 +21,16 @@ void AddStatusCommand(CLI::App& app, Output& output);
 // search, suggest, extract
 void AddSearchCommands(CLI::App& app, Output& output);
 
+// A command that only groups subcommands ("folder", "share"): one of them
+// must be given.
+CLI::App* AddCommandGroup(CLI::App& app, const std::string& name, const std::string& description);
+// "pause" and "resume" under `group`, each taking the argument `arg` into
+// `value` and calling `change(output, value, pause)`.
+using PauseChange = void (*)(const Output& output, const std::string& value, bool pause);
+void AddPauseAndResume(CLI::App* group, const std::string& pause_help, const std::string& resume_help,
+                       const std::string& arg, const std::string& arg_help, std::string& value, PauseChange change,
+                       Output& output);
+
 // Root and a running fileindexd, before a command that changes the
 // configuration and tells fileindexd: a refusal changes nothing.
 void PrepareChange(const std::string& command);

@@ -58,6 +58,18 @@ void AddWaitOptions(CLI::App* command, FolderArgs& args, const std::string& what
       ->check(CLI::NonNegativeNumber);
 }
 
+// A subcommand for one folder's settings: the folder, --name, the
+// categories and --wait.
+CLI::App* AddSettingsCommand(CLI::App* folder, const std::string& name, const std::string& description,
+                             FolderArgs& args, const std::string& name_help, const std::string& wait_until) {
+  CLI::App* command = folder->add_subcommand(name, description);
+  command->add_option("path", args.path, "the folder (/share/dir or its full path)")->required();
+  command->add_option("--name", args.name, name_help);
+  AddCategoryOptions(command, args);
+  AddWaitOptions(command, args, wait_until);
+  return command;
+}
+
 void PrintFolders(const Json::Value& folders, bool with_status) {
   std::vector<std::vector<std::string>> rows;
   for (const Json::Value& folder : folders) {
@@ -144,11 +156,8 @@ void AddGet(CLI::App* folder, Output& output) {
 
 void AddAdd(CLI::App* folder, Output& output) {
   static FolderArgs add;
-  CLI::App* command = folder->add_subcommand("add", "index a folder (every category on unless switched off)");
-  command->add_option("path", add.path, "the folder (/share/dir or its full path)")->required();
-  command->add_option("--name", add.name, "display name (default: the folder's name)");
-  AddCategoryOptions(command, add);
-  AddWaitOptions(command, add, "the folder is indexed");
+  CLI::App* command = AddSettingsCommand(folder, "add", "index a folder (every category on unless switched off)", add,
+                                         "display name (default: the folder's name)", "the folder is indexed");
   command->callback([&output] {
     // Only the first folder may be added while fileindexd is down: the
     // library starts the services then.
@@ -176,11 +185,8 @@ void AddAdd(CLI::App* folder, Output& output) {
 
 void AddSet(CLI::App* folder, Output& output) {
   static FolderArgs set;
-  CLI::App* command = folder->add_subcommand("set", "change an indexed folder's name or categories");
-  command->add_option("path", set.path, "the folder (/share/dir or its full path)")->required();
-  command->add_option("--name", set.name, "new display name");
-  AddCategoryOptions(command, set);
-  AddWaitOptions(command, set, "the change is applied");
+  CLI::App* command = AddSettingsCommand(folder, "set", "change an indexed folder's name or categories", set,
+                                         "new display name", "the change is applied");
   command->callback([&output] {
     PrepareChange("folder set");
     const std::string path = ConfiguredFolder(set.path);
@@ -222,8 +228,7 @@ void AddReindex(CLI::App* folder, Output& output) {
 }  // namespace
 
 void AddFolderCommands(CLI::App& app, Output& output) {
-  CLI::App* folder = app.add_subcommand("folder", "indexed folders: list, get, add, set, delete, reindex");
-  folder->require_subcommand(1);
+  CLI::App* folder = AddCommandGroup(app, "folder", "indexed folders: list, get, add, set, delete, reindex");
   AddList(folder, output);
   AddGet(folder, output);
   AddAdd(folder, output);

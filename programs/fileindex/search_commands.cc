@@ -2,6 +2,7 @@
 #include <stdlib.h>
 #include <unistd.h>
 
+#include <functional>
 #include <iostream>
 #include <sstream>
 
@@ -84,6 +85,15 @@ Json::Value ContentOnly(const Json::Value& clause) {
   return clause;
 }
 
+// The "data" of corvelasticd's answer to the request `make_request` makes
+// once the daemon is known to run (a daemon that is down is said first).
+Json::Value AskSearchDaemon(const std::function<Json::Value()>& make_request) {
+  frontend::RequireRunning(frontend::Daemon::kSearch);
+  Json::Value answer;
+  elastic::SendRequestWithPatience(answer, make_request());
+  return answer["data"];
+}
+
 // The request of corvelasticd's "search" command for these arguments.
 Json::Value SearchRequest(const SearchArgs& args) {
   // Each argument is a part of the query: `search saffron rice` and
@@ -142,106 +152,108 @@ void PrintHits(const SearchArgs& args, const Json::Value& result) {
   std::cout << "\n";
 }
 
-}  // namespace
-
-void AddSearchCommands(CLI::App& app, Output& output) {
+void AddSearch(CLI::App& app, Output& output) {
   static SearchArgs search;
-  CLI::App* search_cmd = app.add_subcommand("search", "search the index by file name and content");
-  search_cmd->add_option("words", search.words,
-                         "what to look for: words, \"a phrase\", prefix*, OR, NOT word, (groups), name:, ext:, "
-                         "type:, in:, size:, modified:, owner: (see docs/search.md); put -- before words "
-                         "that start with -")
+  CLI::App* command = app.add_subcommand("search", "search the index by file name and content");
+  command->add_option("words", search.words,
+                      "what to look for: words, \"a phrase\", prefix*, OR, NOT word, (groups), name:, ext:, "
+                      "type:, in:, size:, modified:, owner: (see docs/search.md); put -- before words "
+                      "that start with -")
       ->required();
-  auto* name = search_cmd->add_flag("--name", search.name, "search file names only");
-  search_cmd->add_flag("--content", search.content, "search file content only")->excludes(name);
+  auto* name = command->add_flag("--name", search.name, "search file names only");
+  command->add_flag("--content", search.content, "search file content only")->excludes(name);
   // One value per --share, so the words may follow it: `search --share docs saffron rice`.
-  search_cmd->add_option("--share", search.shares, "only in this share (repeatable)")->allow_extra_args(false);
-  search_cmd->add_option("--type", search.type, "only files of this category")
+  command->add_option("--share", search.shares, "only in this share (repeatable)")->allow_extra_args(false);
+  command->add_option("--type", search.type, "only files of this category")
       ->check(CLI::IsMember({"document", "audio", "video", "photo"}));
-  search_cmd->add_option("--from", search.from, "skip this many results (paging)");
-  search_cmd->add_option("--size", search.size, "show at most this many results (1-1000)")->check(CLI::Range(1, 1000));
-  search_cmd->callback([&output] {
-    frontend::RequireRunning(frontend::Daemon::kSearch);
-    Json::Value answer;
-    elastic::SendRequestWithPatience(answer, SearchRequest(search));
-    if (output.json) return PrintJson(answer["data"]);
-    PrintHits(search, answer["data"]);
+  command->add_option("--from", search.from, "skip this many results (paging)");
+  command->add_option("--size", search.size, "show at most this many results (1-1000)")->check(CLI::Range(1, 1000));
+  command->callback([&output] {
+    const Json::Value answer = AskSearchDaemon([] { return SearchRequest(search); });
+    if (output.json) return PrintJson(answer);
+    PrintHits(search, answer);
   });
+}
 
+void AddSuggest(CLI::App& app, Output& output) {
   static struct {
     std::string text;
     std::vector<std::string> shares;
     unsigned size = 10;
   } suggest;
-  CLI::App* suggest_cmd = app.add_subcommand("suggest", "file-name words that begin with TEXT");
-  suggest_cmd->add_option("text", suggest.text, "the beginning of a word")->required();
-  suggest_cmd->add_option("--share", suggest.shares, "only in this share (repeatable)")->allow_extra_args(false);
-  suggest_cmd->add_option("--size", suggest.size, "at most this many (1-100)")->check(CLI::Range(1, 100));
-  suggest_cmd->callback([&output] {
-    Json::Value request(Json::objectValue);
-    request["command"] = "suggest";
-    if (!suggest.shares.empty()) request["data"]["ids"] = frontend::IndexIds(suggest.shares);
-    request["data"]["field"] = kFieldSearchFileName;
-    request["data"]["text"] = suggest.text;
-    request["data"]["size"] = suggest.size;
-    frontend::RequireRunning(frontend::Daemon::kSearch);
-    Json::Value answer;
-    elastic::SendRequestWithPatience(answer, request);
-    if (output.json) return PrintJson(answer["data"]);
-    for (const Json::Value& item : answer["data"]["suggestions"]) {
+  CLI::App* command = app.add_subcommand("suggest", "file-name words that begin with TEXT");
+  command->add_option("text", suggest.text, "the beginning of a word")->required();
+  command->add_option("--share", suggest.shares, "only in this share (repeatable)")->allow_extra_args(false);
+  command->add_option("--size", suggest.size, "at most this many (1-100)")->check(CLI::Range(1, 100));
+  command->callback([&output] {
+    const Json::Value answer = AskSearchDaemon([] { return frontend::SuggestRequest(suggest.shares, suggest.text, suggest.size); });
+    if (output.json) return PrintJson(answer);
+    for (const Json::Value& item : answer["suggestions"]) {
       std::cout << item["term"].asString() << "  (" << item["freq"].asInt64() << ")\n";
     }
   });
+}
 
+// The request of corvelasticd's "search" command for the files whose
+// content could not be read.
+Json::Value FailedRequest(const std::vector<std::string>& shares, unsigned from, unsigned size) {
+  Json::Value data(Json::objectValue);
+  if (!shares.empty()) data["ids"] = frontend::IndexIds(shares);
+  data["query"]["qsl"]["term"][kFieldExtractionFailed] = true;
+  data["from"] = from;
+  data["size"] = size;
+  data["track_total"] = true;
+  data["load_field"].append(kFieldPath);
+  data["load_field"].append(kFieldExtractionError);
+  Json::Value request(Json::objectValue);
+  request["command"] = "search";
+  request["data"] = data;
+  return request;
+}
+
+void AddFailed(CLI::App& app, Output& output) {
   static struct {
     std::vector<std::string> shares;
     unsigned from = 0;
     unsigned size = 100;
   } failed;
-  CLI::App* failed_cmd = app.add_subcommand(
+  CLI::App* command = app.add_subcommand(
       "failed", "files whose content could not be read, with the reason (they are still found by name and path)");
-  failed_cmd->add_option("--share", failed.shares, "only in this share (repeatable)")->allow_extra_args(false);
-  failed_cmd->add_option("--from", failed.from, "skip this many files (paging)");
-  failed_cmd->add_option("--size", failed.size, "show at most this many files (1-1000)")->check(CLI::Range(1, 1000));
-  failed_cmd->callback([&output] {
-    Json::Value data(Json::objectValue);
-    if (!failed.shares.empty()) data["ids"] = frontend::IndexIds(failed.shares);
-    data["query"]["qsl"]["term"][kFieldExtractionFailed] = true;
-    data["from"] = failed.from;
-    data["size"] = failed.size;
-    data["track_total"] = true;
-    data["load_field"].append(kFieldPath);
-    data["load_field"].append(kFieldExtractionError);
-    Json::Value request(Json::objectValue);
-    request["command"] = "search";
-    request["data"] = data;
-    frontend::RequireRunning(frontend::Daemon::kSearch);
-    Json::Value answer;
-    elastic::SendRequestWithPatience(answer, request);
-    if (output.json) return PrintJson(answer["data"]);
+  command->add_option("--share", failed.shares, "only in this share (repeatable)")->allow_extra_args(false);
+  command->add_option("--from", failed.from, "skip this many files (paging)");
+  command->add_option("--size", failed.size, "show at most this many files (1-1000)")->check(CLI::Range(1, 1000));
+  command->callback([&output] {
+    const Json::Value answer = AskSearchDaemon([] { return FailedRequest(failed.shares, failed.from, failed.size); });
+    if (output.json) return PrintJson(answer);
     std::vector<std::vector<std::string>> rows;
-    for (const Json::Value& hit : answer["data"]["hits"]) {
+    for (const Json::Value& hit : answer["hits"]) {
       rows.push_back({hit["fields"][kFieldPath].asString(), hit["fields"][kFieldExtractionError].asString()});
     }
     if (!rows.empty()) PrintTable({"PATH", "REASON"}, rows);
-    std::cout << answer["data"]["total"].asInt64() << " file(s) whose content could not be read\n";
+    std::cout << answer["total"].asInt64() << " file(s) whose content could not be read\n";
   });
+}
 
+// An absolute path for `file`, which must exist when it is relative.
+std::string AbsolutePath(const std::string& file) {
+  if (!file.empty() && file[0] == '/') return file;
+  char* absolute = realpath(file.c_str(), nullptr);
+  if (absolute == nullptr) throw Error(kErrorBadArgument, "no such file: " + file);
+  const std::string path = absolute;
+  free(absolute);
+  return path;
+}
+
+void AddExtract(CLI::App& app) {
   static struct {
     std::string file;
     bool meta = false;
   } extract;
-  CLI::App* extract_cmd = app.add_subcommand("extract", "print the document extraction gives for FILE, as JSON");
-  extract_cmd->add_option("file", extract.file, "the file")->required();
-  extract_cmd->add_flag("--meta", extract.meta, "extract music, photo and video details too");
-  extract_cmd->callback([] {
-    std::string path = extract.file;
-    if (path.empty() || path[0] != '/') {
-      char* absolute = realpath(path.c_str(), nullptr);
-      if (absolute == nullptr) throw Error(kErrorBadArgument, "no such file: " + path);
-      path = absolute;
-      free(absolute);
-    }
+  CLI::App* command = app.add_subcommand("extract", "print the document extraction gives for FILE, as JSON");
+  command->add_option("file", extract.file, "the file")->required();
+  command->add_flag("--meta", extract.meta, "extract music, photo and video details too");
+  command->callback([] {
+    const std::string path = AbsolutePath(extract.file);
     Json::Value options(Json::objectValue), document(Json::objectValue);
     options[elastic::kOptionNeedMeta] = extract.meta;
     try {
@@ -253,6 +265,15 @@ void AddSearchCommands(CLI::App& app, Output& output) {
     }
     PrintJson(document);  // the document is JSON with or without --json
   });
+}
+
+}  // namespace
+
+void AddSearchCommands(CLI::App& app, Output& output) {
+  AddSearch(app, output);
+  AddSuggest(app, output);
+  AddFailed(app, output);
+  AddExtract(app);
 }
 
 }  // namespace cli

@@ -63,16 +63,6 @@ void ChangeShare(const Output& output, const std::string& name, bool pause) {
   Done(output, "share " + name + (pause ? " paused" : " resumed") + note);
 }
 
-void AddPauseResume(CLI::App* share, Output& output) {
-  static std::string name;
-  CLI::App* pause = share->add_subcommand("pause", "pause indexing of one share");
-  pause->add_option("name", name, "the share")->required();
-  pause->callback([&output] { ChangeShare(output, name, true); });
-  CLI::App* resume = share->add_subcommand("resume", "resume indexing of one share");
-  resume->add_option("name", name, "the share")->required();
-  resume->callback([&output] { ChangeShare(output, name, false); });
-}
-
 void AddRename(CLI::App* share, Output& output) {
   static std::string from, to;
   CLI::App* command = share->add_subcommand("rename", "follow a share renamed in the share registry");
@@ -144,10 +134,11 @@ std::string ShareFlags(unsigned int flags) {
 }
 
 void AddShareCommands(CLI::App& app, Output& output) {
-  CLI::App* share = app.add_subcommand("share", "share operations: list, pause, resume, rename, migrate, check-recycle");
-  share->require_subcommand(1);
+  static std::string name;
+  CLI::App* share = AddCommandGroup(app, "share", "share operations: list, pause, resume, rename, migrate, check-recycle");
   AddList(share, output);
-  AddPauseResume(share, output);
+  AddPauseAndResume(share, "pause indexing of one share", "resume indexing of one share", "name", "the share", name,
+                    ChangeShare, output);
   AddRename(share, output);
   AddMigrate(share, output);
   AddCheckRecycle(share, output);

@@ -62,7 +62,7 @@ OpApplier::OpApplier(const std::string& share, const IndexRules& rules, Progress
                      SettleTracker& settle)
     : share_(share), rules_(rules), progress_(progress), settle_(settle) {}
 
-void OpApplier::Guard(const std::string& what, const std::string& path, const std::function<void()>& step) {
+void OpApplier::RunOrSkipFile(const std::string& what, const std::string& path, const std::function<void()>& step) {
   try {
     step();
   } catch (const Error& error) {
@@ -89,7 +89,7 @@ void OpApplier::Apply(const fileindex::OP& op) {
 
 bool OpApplier::UpsertFile(const std::string& path, bool need_meta, bool settle) {
   if (settle && !settle_.Admit(path, SettleTracker::Clock::now())) return false;  // its turn comes later
-  Guard("upsert", path, [&] {
+  RunOrSkipFile("upsert", path, [&] {
     elastic::IndexUpsert(share_, path, need_meta);
     progress_.Extracted(share_);
   });
@@ -102,7 +102,7 @@ void OpApplier::ReachOtherNames(const std::string& path, bool attributes_only) {
     errno = 0;
     return;
   }
-  Guard("update of the other names of", path, [&] {
+  RunOrSkipFile("update of the other names of", path, [&] {
     for (const std::string& other : elastic::IndexPathsOfFile(share_, st.st_dev, st.st_ino)) {
       struct stat other_st;
       const bool same_file = other != path && lstat(other.c_str(), &other_st) == 0 && other_st.st_dev == st.st_dev &&
@@ -111,7 +111,7 @@ void OpApplier::ReachOtherNames(const std::string& path, bool attributes_only) {
       if (!same_file) continue;  // moved or replaced since: its own events say what became of it
       const Verdict verdict = rules_.Judge(other, false);
       if (!verdict.index) continue;
-      Guard(attributes_only ? "attribute update" : "upsert", other, [&] {
+      RunOrSkipFile(attributes_only ? "attribute update" : "upsert", other, [&] {
         if (attributes_only) {
           elastic::IndexAttr(share_, other);
         } else {
@@ -125,13 +125,13 @@ void OpApplier::ReachOtherNames(const std::string& path, bool attributes_only) {
 
 void OpApplier::DeleteTree(const std::string& path) {
   settle_.Forget(path);
-  Guard("delete", path, [&] {
+  RunOrSkipFile("delete", path, [&] {
     elastic::IndexDel(share_, path);
     elastic::IndexDelDir(share_, path);
   });
 }
 
-bool OpApplier::Present(const std::string& path, Kind* kind, Verdict* verdict) {
+bool OpApplier::DeleteUnlessIndexable(const std::string& path, Kind* kind, Verdict* verdict) {
   *kind = KindOf(path);
   if (*kind == Kind::kMissing) {
     // Gone again since the event; whatever the index holds of it goes too.
@@ -149,7 +149,7 @@ bool OpApplier::Present(const std::string& path, Kind* kind, Verdict* verdict) {
 void OpApplier::Upsert(const std::string& path) {
   Kind kind;
   Verdict verdict;
-  if (!Present(path, &kind, &verdict)) return;
+  if (!DeleteUnlessIndexable(path, &kind, &verdict)) return;
   if (UpsertFile(path, verdict.need_meta, kind == Kind::kFile) && kind == Kind::kFile) ReachOtherNames(path, false);
 }
 
@@ -165,9 +165,9 @@ void OpApplier::UpsertSettled(const std::string& path) {
 void OpApplier::Attr(const std::string& path) {
   Kind kind;
   Verdict verdict;
-  if (!Present(path, &kind, &verdict)) return;
+  if (!DeleteUnlessIndexable(path, &kind, &verdict)) return;
   if (kind == Kind::kFile && !settle_.Admit(path, SettleTracker::Clock::now())) return;
-  Guard("attribute update", path, [&] {
+  RunOrSkipFile("attribute update", path, [&] {
     try {
       elastic::IndexAttr(share_, path);
       progress_.Extracted(share_);
@@ -187,7 +187,7 @@ void OpApplier::Delete(const std::string& path) {
 }
 
 void OpApplier::DeleteDocument(const std::string& path) {
-  Guard("delete", path, [&] { elastic::IndexDel(share_, path); });
+  RunOrSkipFile("delete", path, [&] { elastic::IndexDel(share_, path); });
 }
 
 void OpApplier::Refresh(const std::string& path) {
@@ -226,7 +226,7 @@ void OpApplier::Rename(const std::string& from, const std::string& to) {
   }
   bool moved = false;
   if (from_indexed) {
-    Guard("rename", from, [&] {
+    RunOrSkipFile("rename", from, [&] {
       try {
         elastic::IndexRename(share_, from, to);
         moved = true;

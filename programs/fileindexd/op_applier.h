@@ -78,12 +78,13 @@ class OpApplier {
  private:
   // Deletes what the index holds of a path that is gone or not to be
   // indexed; true, with its kind and verdict, when it is to be indexed.
-  bool Present(const std::string& path, Kind* kind, Verdict* verdict);
+  bool DeleteUnlessIndexable(const std::string& path, Kind* kind, Verdict* verdict);
   struct Stamp {
     long long mtime = -1, ctime = -1, size = -1;
   };
-  // Runs one file's step; a per-file error is logged and counted.
-  void Guard(const std::string& what, const std::string& path, const std::function<void()>& step);
+  // Runs one file's step; a per-file error is logged and counted and the
+  // file skipped, a batch error goes on up.
+  void RunOrSkipFile(const std::string& what, const std::string& path, const std::function<void()>& step);
   // False when the settle interval deferred it.
   bool UpsertFile(const std::string& path, bool need_meta, bool settle);
   // A file with hard links changed through `path`: its other names that the

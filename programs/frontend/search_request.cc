@@ -70,5 +70,29 @@ Json::Value SearchRequest(const SearchParams& params) {
   return request;
 }
 
+Json::Value SuggestRequest(const std::vector<std::string>& shares, const std::string& text, unsigned size,
+                           const std::string& as_user) {
+  Json::Value request(Json::objectValue);
+  request["command"] = "suggest";
+  if (!shares.empty()) request["data"]["ids"] = IndexIds(shares);
+  request["data"]["field"] = kFieldSearchFileName;
+  request["data"]["text"] = text;
+  request["data"]["size"] = size;
+  if (!as_user.empty()) request["data"]["as_user"] = as_user;
+  return request;
+}
+
+Json::Value PathsPageRequest(const std::string& share, const Json::Value& qsl, unsigned from, unsigned size) {
+  Json::Value request(Json::objectValue);
+  request["command"] = "search";
+  request["data"]["ids"].append(elastic::GetFileIndexID(share));
+  request["data"]["query"]["qsl"] = qsl;
+  request["data"]["sort"] = "_key";
+  request["data"]["from"] = from;
+  request["data"]["size"] = size;
+  request["data"]["load_field"].append(kFieldPath);
+  return request;
+}
+
 }  // namespace frontend
 }  // namespace corvlumex

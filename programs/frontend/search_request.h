@@ -32,6 +32,17 @@ const std::vector<std::string>& HitFields();
 
 Json::Value SearchRequest(const SearchParams& params);
 
+// corvelasticd's "suggest" request: up to `size` file-name words that begin
+// with `text`, in the shares named (none: every indexed share), seen as
+// `as_user` when given.
+Json::Value SuggestRequest(const std::vector<std::string>& shares, const std::string& text, unsigned size,
+                           const std::string& as_user = "");
+
+// A "search" request for one page of the documents of `share` that match
+// `qsl`, in key (full path) order, each hit with its path only: what a
+// listing of an index's contents asks.
+Json::Value PathsPageRequest(const std::string& share, const Json::Value& qsl, unsigned from, unsigned size);
+
 // "/share/dir": "fileindex_share" ids of the shares, for "ids".
 Json::Value IndexIds(const std::vector<std::string>& shares);
 
