@@ -23,3 +23,9 @@ function(fileindex_add_test)
     PROPERTIES LABELS "${T_LABELS}" TIMEOUT ${T_TIMEOUT}
       ENVIRONMENT "FILEINDEX_BUILD_DIR=${PROJECT_BINARY_DIR}")
 endfunction()
+
+# The layer rule of docs/layers.md: no include points up a layer. A unit test,
+# so the sanitizer build runs it too; scripts/test also runs it before building.
+find_package(Python3 REQUIRED COMPONENTS Interpreter)
+add_test(NAME check_layers COMMAND Python3::Interpreter ${PROJECT_SOURCE_DIR}/scripts/check-layers ${PROJECT_SOURCE_DIR})
+set_tests_properties(check_layers PROPERTIES LABELS unit TIMEOUT 60)
