@@ -42,4 +42,8 @@ class SDKCredentials {
 };
 
 }  // namespace sdk
+
+// Gives `path` to the package's service user (looked up under SDKMutex()).
+bool ChownCorvLumex(const std::string& path);
+
 }  // namespace corvlumex

@@ -7,6 +7,8 @@
 
 #include "common/error.h"
 #include "common/file_util.h"
+#include "platform/file_ops.h"
+#include "sdk/credentials.h"
 #include "tests/support/log_capture.h"
 
 namespace corvlumex {
