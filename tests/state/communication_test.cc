@@ -12,6 +12,7 @@
 #include <vector>
 
 #include "common/error.h"
+#include "common/frame.h"
 #include "common/json_util.h"
 #include "common/sys.h"
 #include "fileindex/communication.h"

@@ -1,4 +1,4 @@
-#include "fileindex/frame_reader.h"
+#include "common/frame_reader.h"
 
 #include <poll.h>
 #include <sys/ioctl.h>
@@ -9,10 +9,9 @@
 #include <cstdint>
 
 #include "common/error.h"
-#include "fileindex/communication.h"
+#include "common/frame.h"
 
 namespace corvlumex {
-namespace fileindex {
 namespace {
 
 // What one read may add to a body: a peer that announces 64 MiB and sends
@@ -97,5 +96,4 @@ FrameStatus ReadFrameBounded(int fd, size_t max_bytes, int idle_ms, int stall_ms
   return FrameStatus::kOk;
 }
 
-}  // namespace fileindex
 }  // namespace corvlumex

@@ -8,7 +8,6 @@
 #include <string>
 
 namespace corvlumex {
-namespace fileindex {
 
 enum class FrameStatus {
   kOk,
@@ -25,5 +24,4 @@ enum class FrameStatus {
 // byte at a time cannot hold the reader for ever. A trailing NUL of the body is dropped.
 FrameStatus ReadFrameBounded(int fd, size_t max_bytes, int idle_ms, int stall_ms, std::string* text, int total_ms = -1);
 
-}  // namespace fileindex
 }  // namespace corvlumex
