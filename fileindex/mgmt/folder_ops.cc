@@ -9,9 +9,9 @@
 #include "fileindex/elastic/schema.h"
 #include "fileindex/event.h"
 #include "fileindex/folder_mgr.h"
-#include "fileindex/index_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
 #include "fileindex/mgmt/mgmt_util.h"
-#include "fileindex/related_services.h"
+#include "fileindex/mgmt/related_services.h"
 #include "fileindex/status_mgr.h"
 #include "sdk/share.h"
 

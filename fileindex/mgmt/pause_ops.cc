@@ -7,7 +7,7 @@
 
 #include "common/log.h"
 #include "fileindex/folder_mgr.h"
-#include "fileindex/index_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
 #include "fileindex/mgmt/mgmt_util.h"
 #include "fileindex/mgmt/pause_util.h"
 #include "fileindex/status_mgr.h"

@@ -6,7 +6,7 @@
 #include <algorithm>
 
 #include "common/error.h"
-#include "fileindex/index_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "fileindex/util.h"
 #include "programs/fileindex-web/api_error.h"

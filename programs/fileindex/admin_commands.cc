@@ -8,7 +8,7 @@
 
 #include "common/error.h"
 #include "fileindex/folder_mgr.h"
-#include "fileindex/index_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "programs/fileindex/argument_checks.h"
 #include "programs/fileindex/commands.h"

@@ -8,7 +8,7 @@
 
 #include "common/error.h"
 #include "common/sys.h"
-#include "fileindex/index_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
 #include "fileindex/util.h"
 #include "programs/fileindex/cli_output.h"
 #include "programs/fileindex/folder_support.h"

@@ -11,7 +11,7 @@
 #include "common/log.h"
 #include "fileindex/constants.h"
 #include "fileindex/folder_mgr.h"
-#include "fileindex/index_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "sdk/share.h"
 

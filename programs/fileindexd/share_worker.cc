@@ -14,7 +14,7 @@
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/elastic/schema.h"
 #include "fileindex/folder_mgr.h"
-#include "fileindex/index_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
 #include "fileindex/optree.h"
 #include "fileindex/queue_mgr.h"
 #include "fileindex/status_mgr.h"

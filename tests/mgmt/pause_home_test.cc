@@ -5,7 +5,7 @@
 #include "common/json_util.h"
 #include "common/sys.h"
 #include "fileindex/constants.h"
-#include "fileindex/index_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "tests/mgmt/mgmt_test_base.h"
 

@@ -5,7 +5,7 @@
 
 #include "common/json_util.h"
 #include "fileindex/folder_mgr.h"
-#include "fileindex/related_services.h"
+#include "fileindex/mgmt/related_services.h"
 #include "fileindex/status_mgr.h"
 #include "tests/mgmt/mgmt_test_base.h"
 

@@ -10,7 +10,7 @@
 #include <filesystem>
 
 #include "common/json_util.h"
-#include "fileindex/index_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "tests/web/web_harness.h"
 

@@ -1,4 +1,4 @@
-#include "fileindex/related_services.h"
+#include "fileindex/mgmt/related_services.h"
 
 #include <json/json.h>
 

@@ -1,5 +1,5 @@
 // Listing, reading, adding and changing indexed folders.
-#include "fileindex/index_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
 
 #include <memory>
 #include <set>
@@ -12,7 +12,7 @@
 #include "fileindex/event.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/mgmt/mgmt_util.h"
-#include "fileindex/related_services.h"
+#include "fileindex/mgmt/related_services.h"
 #include "fileindex/util.h"
 #include "sdk/share.h"
 
