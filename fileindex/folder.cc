@@ -6,7 +6,7 @@
 #include "common/json_util.h"
 #include "common/log.h"
 #include "fileindex/constants.h"
-#include "fileindex/queue_mgr.h"
+#include "fileindex/queue/queue_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "fileindex/util.h"
 #include "sdk/share.h"

@@ -7,10 +7,10 @@
 #include "common/sys.h"
 #include "fileindex/communication.h"
 #include "fileindex/constants.h"
-#include "fileindex/custom_event.h"
 #include "fileindex/elastic/elastic_control.h"
-#include "fileindex/event.h"
 #include "fileindex/folder_mgr.h"
+#include "fileindex/queue/custom_event.h"
+#include "fileindex/queue/event.h"
 #include "fileindex/status_mgr.h"
 #include "platform/platform.h"
 

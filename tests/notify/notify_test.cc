@@ -8,7 +8,7 @@
 #include <fstream>
 
 #include "common/json_util.h"
-#include "fileindex/custom_event.h"
+#include "fileindex/queue/custom_event.h"
 #include "tests/support/log_capture.h"
 
 namespace corvlumex {

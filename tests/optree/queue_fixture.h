@@ -7,7 +7,7 @@
 #include <vector>
 
 #include "common/log.h"
-#include "fileindex/optree.h"
+#include "fileindex/queue/optree.h"
 #include "tests/optree/queue_line.h"
 #include "tests/support/log_capture.h"
 

@@ -12,7 +12,7 @@
 
 #include "common/error.h"
 #include "fileindex/folder_mgr.h"
-#include "fileindex/optree.h"
+#include "fileindex/queue/optree.h"
 #include "platform/linux/linux_platform.h"
 #include "programs/fileindexd/fresh_lane.h"
 #include "programs/fileindexd/index_rules.h"

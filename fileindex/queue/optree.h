@@ -21,11 +21,11 @@
 #include <string_view>
 #include <vector>
 
-#include "fileindex/event.h"
-#include "fileindex/op_arena.h"
-#include "fileindex/op_child_index.h"
-#include "fileindex/op_folder_cache.h"
-#include "fileindex/op_small_list.h"
+#include "fileindex/queue/event.h"
+#include "fileindex/queue/op_arena.h"
+#include "fileindex/queue/op_child_index.h"
+#include "fileindex/queue/op_folder_cache.h"
+#include "fileindex/queue/op_small_list.h"
 
 namespace corvlumex {
 namespace fileindex {

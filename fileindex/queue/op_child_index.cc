@@ -1,8 +1,8 @@
-#include "fileindex/op_child_index.h"
+#include "fileindex/queue/op_child_index.h"
 
 #include <functional>
 
-#include "fileindex/optree.h"
+#include "fileindex/queue/optree.h"
 
 namespace corvlumex {
 namespace fileindex {

@@ -1,4 +1,4 @@
-#include "fileindex/queue_mgr.h"
+#include "fileindex/queue/queue_mgr.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -13,9 +13,9 @@
 #include "common/file_util.h"
 #include "common/lock_file.h"
 #include "common/log.h"
-#include "fileindex/event.h"
 #include "fileindex/folder_mgr.h"
-#include "fileindex/optree.h"
+#include "fileindex/queue/event.h"
+#include "fileindex/queue/optree.h"
 
 namespace corvlumex {
 namespace fileindex {

@@ -1,4 +1,4 @@
-#include "fileindex/custom_event.h"
+#include "fileindex/queue/custom_event.h"
 
 #include <memory>
 #include <vector>
@@ -8,7 +8,7 @@
 #include "common/log.h"
 #include "common/sys.h"
 #include "fileindex/constants.h"
-#include "fileindex/queue_mgr.h"
+#include "fileindex/queue/queue_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "fileindex/util.h"
 #include "platform/platform.h"

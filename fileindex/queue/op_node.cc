@@ -5,7 +5,7 @@
 #include <ostream>
 
 #include "common/json_util.h"
-#include "fileindex/optree.h"
+#include "fileindex/queue/optree.h"
 
 namespace corvlumex {
 namespace fileindex {

@@ -1,6 +1,6 @@
 // OPTree: building the tree from a queue file, resolving paths into nodes,
 // handing the surviving operations out, and releasing the tree.
-#include "fileindex/optree.h"
+#include "fileindex/queue/optree.h"
 
 #include <fcntl.h>
 #include <unistd.h>
@@ -10,8 +10,8 @@
 
 #include "common/error.h"
 #include "common/log.h"
-#include "fileindex/op_folder_cache.h"
-#include "fileindex/op_line_reader.h"
+#include "fileindex/queue/op_folder_cache.h"
+#include "fileindex/queue/op_line_reader.h"
 
 namespace corvlumex {
 namespace fileindex {

@@ -1,9 +1,9 @@
-#include "fileindex/event.h"
+#include "fileindex/queue/event.h"
 
 #include "common/error.h"
 #include "common/json_util.h"
 #include "common/log.h"
-#include "fileindex/op_fast_json.h"
+#include "fileindex/queue/op_fast_json.h"
 
 namespace corvlumex {
 namespace fileindex {

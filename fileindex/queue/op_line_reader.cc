@@ -1,4 +1,4 @@
-#include "fileindex/op_line_reader.h"
+#include "fileindex/queue/op_line_reader.h"
 
 #include <sys/stat.h>
 #include <unistd.h>

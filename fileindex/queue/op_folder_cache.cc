@@ -1,4 +1,4 @@
-#include "fileindex/op_folder_cache.h"
+#include "fileindex/queue/op_folder_cache.h"
 
 #include <cstring>
 #include <functional>

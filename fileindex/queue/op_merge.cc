@@ -2,7 +2,7 @@
 // the ones already pending on its path, and the rename that carries
 // pending work from the old path to the new one.
 #include "common/error.h"
-#include "fileindex/optree.h"
+#include "fileindex/queue/optree.h"
 
 namespace corvlumex {
 namespace fileindex {

@@ -1,4 +1,4 @@
-#include "fileindex/op_arena.h"
+#include "fileindex/queue/op_arena.h"
 
 #include <sys/mman.h>
 

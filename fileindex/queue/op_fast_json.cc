@@ -1,4 +1,4 @@
-#include "fileindex/op_fast_json.h"
+#include "fileindex/queue/op_fast_json.h"
 
 namespace corvlumex {
 namespace fileindex {
