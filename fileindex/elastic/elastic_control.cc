@@ -11,11 +11,11 @@
 #include "common/json_util.h"
 #include "common/log.h"
 #include "common/sys.h"
-#include "fileindex/constants.h"
 #include "fileindex/elastic/comm.h"
 #include "fileindex/elastic/schema.h"
 #include "fileindex/queue/custom_event.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/state/constants.h"
+#include "fileindex/state/status_mgr.h"
 #include "platform/platform.h"
 #include "sdk/share.h"
 

@@ -6,13 +6,13 @@
 #include "common/log.h"
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/elastic/schema.h"
-#include "fileindex/folder_mgr.h"
 #include "fileindex/mgmt/index_mgr.h"
 #include "fileindex/mgmt/mgmt_util.h"
 #include "fileindex/mgmt/related_services.h"
 #include "fileindex/queue/custom_event.h"
 #include "fileindex/queue/event.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/state/folder_mgr.h"
+#include "fileindex/state/status_mgr.h"
 #include "sdk/share.h"
 
 namespace corvlumex {

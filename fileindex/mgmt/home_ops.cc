@@ -2,12 +2,12 @@
 // switched on and off, and a user's folders follow the user's new name.
 #include "common/file_util.h"
 #include "common/log.h"
-#include "fileindex/folder_mgr.h"
 #include "fileindex/mgmt/index_mgr.h"
 #include "fileindex/mgmt/mgmt_util.h"
 #include "fileindex/mgmt/pause_util.h"
 #include "fileindex/mgmt/related_services.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/state/folder_mgr.h"
+#include "fileindex/state/status_mgr.h"
 #include "sdk/share.h"
 
 namespace corvlumex {

@@ -8,11 +8,11 @@
 #include "common/json_util.h"
 #include "common/log.h"
 #include "fileindex/elastic/elastic_control.h"
-#include "fileindex/folder_mgr.h"
 #include "fileindex/mgmt/mgmt_util.h"
 #include "fileindex/mgmt/related_services.h"
 #include "fileindex/queue/custom_event.h"
 #include "fileindex/queue/event.h"
+#include "fileindex/state/folder_mgr.h"
 #include "fileindex/util.h"
 #include "sdk/share.h"
 

@@ -5,13 +5,13 @@
 #include "common/json_util.h"
 #include "common/log.h"
 #include "common/sys.h"
-#include "fileindex/communication.h"
-#include "fileindex/constants.h"
 #include "fileindex/elastic/elastic_control.h"
-#include "fileindex/folder_mgr.h"
 #include "fileindex/queue/custom_event.h"
 #include "fileindex/queue/event.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/state/communication.h"
+#include "fileindex/state/constants.h"
+#include "fileindex/state/folder_mgr.h"
+#include "fileindex/state/status_mgr.h"
 #include "platform/platform.h"
 
 namespace corvlumex {

@@ -6,9 +6,9 @@
 #include <vector>
 
 #include "common/log.h"
-#include "fileindex/communication.h"
-#include "fileindex/folder_mgr.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/state/communication.h"
+#include "fileindex/state/folder_mgr.h"
+#include "fileindex/state/status_mgr.h"
 #include "platform/platform.h"
 #include "sdk/share.h"
 

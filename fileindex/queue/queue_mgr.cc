@@ -13,9 +13,9 @@
 #include "common/file_util.h"
 #include "common/lock_file.h"
 #include "common/log.h"
-#include "fileindex/folder_mgr.h"
 #include "fileindex/queue/event.h"
 #include "fileindex/queue/optree.h"
+#include "fileindex/state/folder_mgr.h"
 
 namespace corvlumex {
 namespace fileindex {

@@ -7,7 +7,7 @@
 
 #include "common/error.h"
 #include "fileindex/mgmt/index_mgr.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/state/status_mgr.h"
 #include "fileindex/util.h"
 #include "programs/fileindex-web/api_error.h"
 #include "programs/fileindex-web/path_checks.h"

@@ -13,7 +13,7 @@
 #include <cstring>
 
 #include "common/error.h"
-#include "fileindex/folder_mgr.h"
+#include "fileindex/state/folder_mgr.h"
 #include "fileindex/util.h"
 #include "platform/linux/extract/worker_protocol.h"
 #include "programs/fileindex-web/api_error.h"

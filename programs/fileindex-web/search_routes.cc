@@ -6,7 +6,7 @@
 
 #include "common/error.h"
 #include "fileindex/elastic/schema.h"
-#include "fileindex/folder_mgr.h"
+#include "fileindex/state/folder_mgr.h"
 #include "fileindex/util.h"
 #include "programs/fileindex-web/accounts.h"
 #include "programs/fileindex-web/api_error.h"

@@ -7,7 +7,7 @@
 
 #include "common/error.h"
 #include "common/sys.h"
-#include "fileindex/folder_mgr.h"
+#include "fileindex/state/folder_mgr.h"
 #include "fileindex/util.h"
 #include "programs/fileindex/folder_support.h"
 #include "sdk/share.h"

@@ -10,7 +10,7 @@
 #include "common/log.h"
 #include "common/stop_signals.h"
 #include "common/sys.h"
-#include "fileindex/constants.h"
+#include "fileindex/state/constants.h"
 #include "programs/fileindexd/command_server.h"
 #include "programs/fileindexd/daemon.h"
 

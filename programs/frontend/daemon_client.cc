@@ -12,8 +12,8 @@
 #include "common/frame.h"
 #include "common/json_util.h"
 #include "common/sys.h"
-#include "fileindex/constants.h"
 #include "fileindex/elastic/comm.h"
+#include "fileindex/state/constants.h"
 #include "platform/linux/notifier_presence.h"
 
 namespace corvlumex {

@@ -10,7 +10,7 @@
 #include "common/error.h"
 #include "common/json_util.h"
 #include "fileindex/elastic/schema.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/state/status_mgr.h"
 #include "platform/linux/linux_platform.h"
 #include "tests/elastic/fake_search_daemon.h"
 #include "tests/support/log_capture.h"

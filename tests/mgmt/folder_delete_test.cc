@@ -5,7 +5,7 @@
 
 #include "common/json_util.h"
 #include "fileindex/mgmt/index_mgr.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/state/status_mgr.h"
 #include "platform/platform.h"
 #include "tests/mgmt/mgmt_test_base.h"
 

@@ -15,7 +15,7 @@
 #include "common/frame.h"
 #include "common/json_util.h"
 #include "common/sys.h"
-#include "fileindex/communication.h"
+#include "fileindex/state/communication.h"
 #include "tests/state/fake_daemon.h"
 #include "tests/state/syscall_script.h"
 #include "tests/support/expect_error.h"

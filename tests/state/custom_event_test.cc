@@ -13,7 +13,7 @@
 #include "common/sys.h"
 #include "fileindex/queue/custom_event.h"
 #include "fileindex/queue/event.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/state/status_mgr.h"
 #include "platform/linux/linux_platform.h"
 #include "tests/state/state_sandbox.h"
 

@@ -18,16 +18,16 @@
 #include "common/file_util.h"
 #include "common/frame_reader.h"
 #include "common/json_util.h"
-#include "fileindex/folder_mgr.h"
+#include "fileindex/state/folder_mgr.h"
 #include "programs/fileindexd/batch_mark.h"
 #include "programs/fileindexd/command_server.h"
 #include "programs/fileindexd/folder_walker.h"
 #include "programs/fileindexd/index_rules.h"
 #include "programs/fileindexd/progress.h"
 #include "programs/fileindexd/settle_tracker.h"
+#include "programs/fileindexd/suggestion_schedule.h"
 #include "tests/support/child_process.h"
 #include "tests/support/frame_client.h"
-#include "programs/fileindexd/suggestion_schedule.h"
 #include "tests/support/log_capture.h"
 
 namespace corvlumex {

@@ -11,8 +11,8 @@
 #include <memory>
 
 #include "common/error.h"
-#include "fileindex/folder_mgr.h"
 #include "fileindex/queue/optree.h"
+#include "fileindex/state/folder_mgr.h"
 #include "platform/linux/linux_platform.h"
 #include "programs/fileindexd/fresh_lane.h"
 #include "programs/fileindexd/index_rules.h"

@@ -11,7 +11,7 @@
 
 #include "common/json_util.h"
 #include "fileindex/mgmt/index_mgr.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/state/status_mgr.h"
 #include "tests/web/web_harness.h"
 
 namespace corvlumex {

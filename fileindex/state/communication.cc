@@ -1,4 +1,4 @@
-#include "fileindex/communication.h"
+#include "fileindex/state/communication.h"
 
 #include <sys/socket.h>
 #include <sys/un.h>
@@ -15,7 +15,7 @@
 #include "common/json_util.h"
 #include "common/log.h"
 #include "common/sys.h"
-#include "fileindex/constants.h"
+#include "fileindex/state/constants.h"
 
 namespace corvlumex {
 namespace fileindex {

@@ -1,4 +1,4 @@
-#include "fileindex/status_mgr.h"
+#include "fileindex/state/status_mgr.h"
 
 #include <sys/stat.h>
 
@@ -13,8 +13,8 @@
 #include "common/lock_file.h"
 #include "common/log.h"
 #include "common/sys.h"
-#include "fileindex/communication.h"
-#include "fileindex/constants.h"
+#include "fileindex/state/communication.h"
+#include "fileindex/state/constants.h"
 #include "sdk/credentials.h"
 
 namespace corvlumex {

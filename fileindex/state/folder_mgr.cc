@@ -1,4 +1,4 @@
-#include "fileindex/folder_mgr.h"
+#include "fileindex/state/folder_mgr.h"
 
 #include <sys/stat.h>
 
@@ -11,8 +11,8 @@
 #include "common/json_util.h"
 #include "common/log.h"
 #include "common/sys.h"
-#include "fileindex/constants.h"
 #include "fileindex/file_type.h"
+#include "fileindex/state/constants.h"
 #include "fileindex/util.h"
 #include "sdk/credentials.h"
 

@@ -9,7 +9,7 @@
 #include <string>
 #include <vector>
 
-#include "fileindex/folder.h"
+#include "fileindex/state/folder.h"
 
 namespace corvlumex {
 namespace fileindex {

@@ -1,13 +1,13 @@
-#include "fileindex/folder.h"
+#include "fileindex/state/folder.h"
 
 #include <ctime>
 
 #include "common/error.h"
 #include "common/json_util.h"
 #include "common/log.h"
-#include "fileindex/constants.h"
 #include "fileindex/queue/queue_mgr.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/state/constants.h"
+#include "fileindex/state/status_mgr.h"
 #include "fileindex/util.h"
 #include "sdk/share.h"
 
