@@ -10,10 +10,10 @@
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/mgmt/mgmt_util.h"
 #include "fileindex/mgmt/related_services.h"
+#include "fileindex/paths/path_rules.h"
 #include "fileindex/queue/custom_event.h"
 #include "fileindex/queue/event.h"
 #include "fileindex/state/folder_mgr.h"
-#include "fileindex/util.h"
 #include "sdk/share.h"
 
 namespace corvlumex {

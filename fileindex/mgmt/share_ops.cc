@@ -14,9 +14,9 @@
 #include "fileindex/mgmt/index_mgr.h"
 #include "fileindex/mgmt/mgmt_util.h"
 #include "fileindex/mgmt/related_services.h"
+#include "fileindex/paths/path_rules.h"
 #include "fileindex/state/folder_mgr.h"
 #include "fileindex/state/status_mgr.h"
-#include "fileindex/util.h"
 #include "sdk/share.h"
 
 namespace corvlumex {

@@ -8,7 +8,7 @@
 #include <vector>
 
 #include "fileindex/elastic/schema.h"
-#include "fileindex/file_type.h"
+#include "fileindex/paths/file_type.h"
 
 namespace corvlumex {
 namespace fileindex {

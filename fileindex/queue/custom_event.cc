@@ -7,10 +7,10 @@
 #include "common/json_util.h"
 #include "common/log.h"
 #include "common/sys.h"
+#include "fileindex/paths/path_rules.h"
 #include "fileindex/queue/queue_mgr.h"
 #include "fileindex/state/constants.h"
 #include "fileindex/state/status_mgr.h"
-#include "fileindex/util.h"
 #include "platform/platform.h"
 #include "sdk/share.h"
 

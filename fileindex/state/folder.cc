@@ -5,10 +5,10 @@
 #include "common/error.h"
 #include "common/json_util.h"
 #include "common/log.h"
+#include "fileindex/paths/path_rules.h"
 #include "fileindex/queue/queue_mgr.h"
 #include "fileindex/state/constants.h"
 #include "fileindex/state/status_mgr.h"
-#include "fileindex/util.h"
 #include "sdk/share.h"
 
 namespace corvlumex {

@@ -11,9 +11,9 @@
 #include "common/json_util.h"
 #include "common/log.h"
 #include "common/sys.h"
-#include "fileindex/file_type.h"
+#include "fileindex/paths/file_type.h"
+#include "fileindex/paths/path_rules.h"
 #include "fileindex/state/constants.h"
-#include "fileindex/util.h"
 #include "sdk/credentials.h"
 
 namespace corvlumex {

@@ -3,7 +3,7 @@
 #include "common/error.h"
 #include "fileindex/elastic/comm.h"
 #include "fileindex/elastic/schema.h"
-#include "fileindex/util.h"
+#include "fileindex/paths/path_rules.h"
 #include "sdk/share.h"
 
 namespace corvlumex {

@@ -7,8 +7,8 @@
 
 #include "common/error.h"
 #include "fileindex/mgmt/index_mgr.h"
+#include "fileindex/paths/path_rules.h"
 #include "fileindex/state/status_mgr.h"
-#include "fileindex/util.h"
 #include "programs/fileindex-web/api_error.h"
 #include "programs/fileindex-web/path_checks.h"
 #include "programs/fileindex-web/request_body.h"

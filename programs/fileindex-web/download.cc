@@ -13,8 +13,8 @@
 #include <cstring>
 
 #include "common/error.h"
+#include "fileindex/paths/path_rules.h"
 #include "fileindex/state/folder_mgr.h"
-#include "fileindex/util.h"
 #include "platform/linux/extract/worker_protocol.h"
 #include "programs/fileindex-web/api_error.h"
 #include "programs/fileindex-web/path_checks.h"

@@ -6,8 +6,8 @@
 
 #include "common/error.h"
 #include "fileindex/elastic/schema.h"
+#include "fileindex/paths/path_rules.h"
 #include "fileindex/state/folder_mgr.h"
-#include "fileindex/util.h"
 #include "programs/fileindex-web/accounts.h"
 #include "programs/fileindex-web/api_error.h"
 #include "programs/fileindex-web/download.h"

@@ -7,8 +7,8 @@
 
 #include "common/error.h"
 #include "common/sys.h"
+#include "fileindex/paths/path_rules.h"
 #include "fileindex/state/folder_mgr.h"
-#include "fileindex/util.h"
 #include "programs/fileindex/folder_support.h"
 #include "sdk/share.h"
 

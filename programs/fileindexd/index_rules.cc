@@ -1,8 +1,8 @@
 #include "programs/fileindexd/index_rules.h"
 
 #include "common/file_util.h"
-#include "fileindex/file_type.h"
-#include "fileindex/util.h"
+#include "fileindex/paths/file_type.h"
+#include "fileindex/paths/path_rules.h"
 #include "platform/platform.h"
 
 namespace corvlumex {

@@ -6,7 +6,7 @@
 
 #include "common/error.h"
 #include "common/file_util.h"
-#include "fileindex/util.h"
+#include "fileindex/paths/path_rules.h"
 #include "tests/platform/share_sandbox.h"
 #include "tests/support/expect_error.h"
 

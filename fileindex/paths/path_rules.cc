@@ -1,4 +1,4 @@
-#include "fileindex/util.h"
+#include "fileindex/paths/path_rules.h"
 
 #include <cstring>
 #include <set>

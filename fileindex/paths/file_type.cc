@@ -1,4 +1,4 @@
-#include "fileindex/file_type.h"
+#include "fileindex/paths/file_type.h"
 
 #include <algorithm>
 #include <unordered_map>
