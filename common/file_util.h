@@ -7,6 +7,10 @@
 
 #include <string>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 
 // Regular file reached without following a final symbolic link.
@@ -33,3 +37,5 @@ bool Unlink(const std::string& path);
 bool WriteFileAtomically(const std::string& path, const std::string& content, mode_t mode);
 
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

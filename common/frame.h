@@ -10,6 +10,10 @@
 #include <cerrno>
 #include <string>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 
 // The library is called from programs that may not ignore SIGPIPE (a web
@@ -66,3 +70,5 @@ Json::Value FailureAnswer(int code, const std::string& message);
 std::string ReadFrame(int fd);
 
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

@@ -7,6 +7,10 @@
 #include <cstddef>
 #include <string>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 
 enum class FrameStatus {
@@ -25,3 +29,5 @@ enum class FrameStatus {
 FrameStatus ReadFrameBounded(int fd, size_t max_bytes, int idle_ms, int stall_ms, std::string* text, int total_ms = -1);
 
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

@@ -1,6 +1,10 @@
 // How every daemon of the system is told to stop.
 #pragma once
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 
 // Routes SIGTERM and SIGINT of a daemon to `handler` (without SA_RESTART,
@@ -8,3 +12,5 @@ namespace corvlumex {
 void OnStopSignals(void (*handler)(int));
 
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

@@ -5,6 +5,10 @@
 
 #include <string>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 
 // True when any bit of `perm` is granted to the caller on `path`.
@@ -15,3 +19,5 @@ bool MVFile(const std::string& src, const std::string& dst);
 bool CPFile(const std::string& src, const std::string& dst);
 
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

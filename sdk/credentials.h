@@ -16,6 +16,10 @@
 
 #include <string>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 namespace sdk {
 
@@ -47,3 +51,5 @@ class SDKCredentials {
 bool ChownCorvLumex(const std::string& path);
 
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

@@ -8,6 +8,10 @@
 
 #include <string>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 
 // Codes with which corvelasticd says it cannot take a request now; callers
@@ -77,3 +81,5 @@ namespace corvlumex {
 void SendRequestImpl(Json::Value& res, const Json::Value& req);
 
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

@@ -5,6 +5,10 @@
 
 #include <json/json.h>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 namespace fileindex {
 namespace elastic {
@@ -41,3 +45,5 @@ Json::Value GetFileIndexEventHandler();
 }  // namespace elastic
 }  // namespace fileindex
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

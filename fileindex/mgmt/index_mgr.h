@@ -13,6 +13,10 @@
 
 #include <string>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 namespace fileindex {
 
@@ -96,3 +100,5 @@ void UserRename(const std::string& user_from, const std::string& user_to);
 
 }  // namespace fileindex
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

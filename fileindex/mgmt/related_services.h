@@ -6,6 +6,10 @@
 
 #include <string>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 namespace fileindex {
 
@@ -54,3 +58,5 @@ void SendSettingChanged(const std::string& share_name, bool is_upsert);
 
 }  // namespace fileindex
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

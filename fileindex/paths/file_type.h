@@ -5,6 +5,10 @@
 #include <string>
 #include <vector>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 namespace fileindex {
 
@@ -35,3 +39,5 @@ std::vector<std::string> GetExtensionsByCategory(const std::string& category);
 
 }  // namespace fileindex
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

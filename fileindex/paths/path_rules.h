@@ -6,6 +6,10 @@
 
 #include <string>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 namespace fileindex {
 
@@ -46,3 +50,5 @@ bool IsSystemPreservedFileName(const std::string& name);
 
 }  // namespace fileindex
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

@@ -7,6 +7,10 @@
 #include <string>
 #include <vector>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 namespace fileindex {
 
@@ -29,3 +33,5 @@ int NotifyLackOfMemory();
 
 }  // namespace fileindex
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

@@ -11,6 +11,10 @@
 #include <cstdint>
 #include <string>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 namespace fileindex {
 
@@ -45,3 +49,5 @@ class Event {
 
 }  // namespace fileindex
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

@@ -25,6 +25,10 @@
 #include <utility>
 #include <vector>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 namespace fileindex {
 
@@ -102,3 +106,5 @@ std::shared_ptr<T> MakeInArena(OPArena* arena, Args&&... args) {
 
 }  // namespace fileindex
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

@@ -11,6 +11,10 @@
 #include <string_view>
 #include <vector>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 namespace fileindex {
 
@@ -39,3 +43,5 @@ class ChildIndex {
 
 }  // namespace fileindex
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

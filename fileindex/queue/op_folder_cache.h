@@ -10,6 +10,10 @@
 #include <memory>
 #include <string_view>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 namespace fileindex {
 
@@ -46,3 +50,5 @@ class FolderCache {
 
 }  // namespace fileindex
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

@@ -9,6 +9,10 @@
 #include <new>
 #include <utility>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 namespace fileindex {
 
@@ -123,3 +127,5 @@ class SmallList {
 
 }  // namespace fileindex
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

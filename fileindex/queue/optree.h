@@ -21,11 +21,14 @@
 #include <string_view>
 #include <vector>
 
+#include "common/export.h"
 #include "fileindex/queue/event.h"
 #include "fileindex/queue/op_arena.h"
 #include "fileindex/queue/op_child_index.h"
 #include "fileindex/queue/op_folder_cache.h"
 #include "fileindex/queue/op_small_list.h"
+
+CORVLUMEX_API_BEGIN
 
 namespace corvlumex {
 namespace fileindex {
@@ -199,3 +202,5 @@ std::ostream& operator<<(std::ostream& os, std::shared_ptr<OPNode> node);
 
 }  // namespace fileindex
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

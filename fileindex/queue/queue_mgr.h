@@ -9,6 +9,10 @@
 #include <memory>
 #include <string>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 namespace fileindex {
 
@@ -82,3 +86,5 @@ bool AppendQueueLines(const std::string& queue_path, const std::string& lines, s
 
 }  // namespace fileindex
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

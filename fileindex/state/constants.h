@@ -5,6 +5,10 @@
 
 #include <cstddef>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 namespace fileindex {
 
@@ -35,3 +39,5 @@ constexpr char kSwapFree[] = "SwapFree";
 
 }  // namespace fileindex
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

@@ -9,7 +9,10 @@
 #include <string>
 #include <vector>
 
+#include "common/export.h"
 #include "fileindex/state/folder.h"
+
+CORVLUMEX_API_BEGIN
 
 namespace corvlumex {
 namespace fileindex {
@@ -75,3 +78,5 @@ class FolderMgr {
 
 }  // namespace fileindex
 }  // namespace corvlumex
+
+CORVLUMEX_API_END
