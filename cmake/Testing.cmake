@@ -8,7 +8,7 @@ include(GoogleTest)
 function(fileindex_add_test)
   cmake_parse_arguments(T "" "NAME;TIMEOUT" "SOURCES;LABELS;LIBS" ${ARGN})
   add_executable(${T_NAME} ${T_SOURCES})
-  target_link_libraries(${T_NAME} PRIVATE fileindex GTest::gtest GTest::gmock GTest::gtest_main ${T_LIBS})
+  target_link_libraries(${T_NAME} PRIVATE fileindex_internal GTest::gtest GTest::gmock GTest::gtest_main ${T_LIBS})
   if(NOT T_LABELS)
     set(T_LABELS unit)
   endif()
@@ -23,3 +23,9 @@ function(fileindex_add_test)
     PROPERTIES LABELS "${T_LABELS}" TIMEOUT ${T_TIMEOUT}
       ENVIRONMENT "FILEINDEX_BUILD_DIR=${PROJECT_BINARY_DIR}")
 endfunction()
+
+# The layer rule of docs/layers.md: no include points up a layer. A unit test,
+# so the sanitizer build runs it too; scripts/test also runs it before building.
+find_package(Python3 REQUIRED COMPONENTS Interpreter)
+add_test(NAME check_layers COMMAND Python3::Interpreter ${PROJECT_SOURCE_DIR}/scripts/check-layers ${PROJECT_SOURCE_DIR})
+set_tests_properties(check_layers PROPERTIES LABELS unit TIMEOUT 60)

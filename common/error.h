@@ -5,6 +5,10 @@
 #include <stdexcept>
 #include <string>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 
 // The numbers are part of the interface: daemons and front ends log them.
@@ -40,3 +44,5 @@ class Error : public std::runtime_error {
 };
 
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

@@ -10,11 +10,6 @@
 #include <cerrno>
 #include <cstring>
 
-#include "common/log.h"
-#include "common/mutex.h"
-#include "platform/platform.h"
-#include "sdk/sdk_mutex.h"
-
 namespace corvlumex {
 
 bool IsFileExist(const std::string& path) {
@@ -40,14 +35,6 @@ bool IsDirentDir(const struct dirent* entry, const std::string& path) {
   (void)path;
   return false;
 }
-
-bool CheckACLPerm(const std::string& path, int perm) {
-  const int granted = platform::Current()->AclPermGet(path);
-  if (granted < 0) return false;
-  return (granted & perm) != 0;
-}
-
-bool IsMountPoint(const std::string& path) { return platform::Current()->DirIsMountPoint(path) > 0; }
 
 bool StringStartWith(const std::string& text, const std::string& prefix) {
   return text.compare(0, prefix.size(), prefix) == 0;
@@ -81,30 +68,6 @@ std::string RealPath(const std::string& path) {
 }
 
 bool Unlink(const std::string& path) { return unlink(path.c_str()) == 0 || errno == ENOENT; }
-
-namespace {
-
-bool CopyFile(const std::string& src, const std::string& dst, bool move) {
-  platform::CopyArgs args;
-  args.keep_attributes = true;
-  args.move = move;
-  return platform::Current()->FileCopy(src, dst, args, 1) == 0;
-}
-
-}  // namespace
-
-bool MVFile(const std::string& src, const std::string& dst) { return CopyFile(src, dst, true); }
-
-bool CPFile(const std::string& src, const std::string& dst) { return CopyFile(src, dst, false); }
-
-bool ChownCorvLumex(const std::string& path) {
-  platform::UserRecord user;
-  {
-    LockMutex guard(sdk::SDKMutex());
-    CORV_CHECK_THROW(!platform::Current()->UserGet("CorvLumex", &user), kErrorUserLookup);
-  }
-  return chown(path.c_str(), user.uid, user.gid) == 0;
-}
 
 bool WriteFileAtomically(const std::string& path, const std::string& content, mode_t mode) {
   std::string temp = path + ".XXXXXX";

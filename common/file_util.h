@@ -7,6 +7,10 @@
 
 #include <string>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 
 // Regular file reached without following a final symbolic link.
@@ -16,9 +20,6 @@ bool IsFileExist(const std::string& path);
 bool IsDirExist(const std::string& path, bool follow_link);
 // From the entry type; an unknown type is never taken for a directory.
 bool IsDirentDir(const struct dirent* entry, const std::string& path);
-// True when any bit of `perm` is granted to the caller on `path`.
-bool CheckACLPerm(const std::string& path, int perm);
-bool IsMountPoint(const std::string& path);
 bool StringStartWith(const std::string& text, const std::string& prefix);
 // Text after the last "/" (empty for a trailing "/"; the whole text without "/").
 std::string Basename(const std::string& path);
@@ -30,13 +31,11 @@ std::string GetFileExtension(const std::string& path, bool lowercase);
 std::string RealPath(const std::string& path);
 // True when the file is gone afterwards (a missing file counts).
 bool Unlink(const std::string& path);
-bool MVFile(const std::string& src, const std::string& dst);
-bool CPFile(const std::string& src, const std::string& dst);
-// Gives `path` to the package's service user.
-bool ChownCorvLumex(const std::string& path);
 
 // Replaces `path` with `content` so that a reader sees the old or the new
 // file, never a part: temporary file beside it, fsync, rename, fsync dir.
 bool WriteFileAtomically(const std::string& path, const std::string& content, mode_t mode);
 
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

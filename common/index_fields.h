@@ -11,6 +11,10 @@
 
 #include <string>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 
 // File-system fields, filled by the indexing process from the file's status.
@@ -90,3 +94,5 @@ inline constexpr char kSortByKey[] = "_key";
 void SetNameFields(const std::string& path, Json::Value& document);
 
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

@@ -9,9 +9,14 @@
 #include <sstream>
 
 #include "common/error.h"
+#include "common/export.h"
 #include "common/file_util.h"
 
 namespace corvlumex {
+
+// The specialisations and instantiations of the header's templates are
+// its interface too; a definition here does not inherit its visibility.
+CORVLUMEX_API_BEGIN
 
 template <>
 bool isJsonType<std::string>(const Json::Value& value) { return value.isConvertibleTo(Json::stringValue); }
@@ -81,6 +86,8 @@ template void GetJsonValue<int>(int&, const Json::Value&, const std::string&, bo
 template void GetJsonValue<unsigned int>(unsigned int&, const Json::Value&, const std::string&, bool);
 template void GetJsonValue<long long>(long long&, const Json::Value&, const std::string&, bool);
 template void GetJsonValue<double>(double&, const Json::Value&, const std::string&, bool);
+
+CORVLUMEX_API_END
 
 void JsonApplyChanges(Json::Value& target, const Json::Value& changes) {
   for (auto it = changes.begin(); it != changes.end(); ++it) {

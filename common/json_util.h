@@ -8,6 +8,10 @@
 #include <string>
 #include <vector>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 
 template <typename T>
@@ -44,3 +48,5 @@ bool JsonToFile(const Json::Value& value, const std::string& path, mode_t mode =
 std::string JsonToString(const Json::Value& value);
 
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

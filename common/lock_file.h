@@ -4,6 +4,10 @@
 
 #include <string>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 
 class LockFile {
@@ -20,3 +24,5 @@ class LockFile {
 };
 
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

@@ -10,6 +10,9 @@
 #include <string>
 
 #include "common/error.h"
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
 
 namespace corvlumex {
 
@@ -58,6 +61,8 @@ constexpr const char* BaseName(const char* path) {
 
 }  // namespace log_detail
 }  // namespace corvlumex
+
+CORVLUMEX_API_END
 
 // "file:line ..." plain notice.
 #define CORV_LOG(format, ...) \

@@ -3,6 +3,10 @@
 
 #include <pthread.h>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 
 class Mutex {
@@ -33,3 +37,5 @@ class LockMutex {
 };
 
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

@@ -7,6 +7,10 @@
 
 #include <string>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 
 // `path` is `folder` itself or anything inside it: what a folder governs, or
@@ -23,3 +27,5 @@ bool IsPathStrictlyBelow(const std::string& path, const std::string& folder);
 std::string PrefixOfPathsBelow(const std::string& folder);
 
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

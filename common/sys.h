@@ -7,6 +7,10 @@
 #include <functional>
 #include <string>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 
 // Value of CORVLUMEX_ROOT (read at each call) followed by `path`. Only the
@@ -24,3 +28,5 @@ void SleepFor(std::chrono::microseconds duration);
 void SetSleepHook(std::function<void(std::chrono::microseconds)> hook);
 
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

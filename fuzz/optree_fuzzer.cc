@@ -11,7 +11,7 @@
 
 #include "common/error.h"
 #include "common/log.h"
-#include "fileindex/optree.h"
+#include "fileindex/queue/optree.h"
 
 namespace {
 

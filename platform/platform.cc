@@ -4,7 +4,7 @@
 #include <mutex>
 
 #include "common/log.h"
-#include "platform/linux/linux_platform.h"
+#include "platform/default_platform.h"
 
 namespace corvlumex {
 namespace platform {
@@ -47,7 +47,7 @@ void LogPlatformError(const char* file, int line, const char* function, const ch
 
 std::shared_ptr<Platform> Current() {
   std::lock_guard<std::mutex> guard(InstalledMutex());
-  if (!Installed()) Installed() = std::make_shared<LinuxPlatform>();
+  if (!Installed()) Installed() = MakeDefaultPlatform();
   return Installed();
 }
 

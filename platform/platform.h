@@ -18,7 +18,10 @@
 #include <string>
 #include <vector>
 
+#include "common/export.h"
 #include "common/log.h"
+
+CORVLUMEX_API_BEGIN
 
 namespace corvlumex {
 namespace platform {
@@ -297,6 +300,8 @@ void Install(std::shared_ptr<Platform> platform);
 
 }  // namespace platform
 }  // namespace corvlumex
+
+CORVLUMEX_API_END
 
 // Records a platform error with the caller's source file and line.
 #define CORV_PLATFORM_ERROR(code, message)                                                          \

@@ -49,4 +49,14 @@ SDKCredentials::~SDKCredentials() {
 }
 
 }  // namespace sdk
+
+bool ChownCorvLumex(const std::string& path) {
+  platform::UserRecord user;
+  {
+    LockMutex guard(sdk::SDKMutex());
+    CORV_CHECK_THROW(!platform::Current()->UserGet("CorvLumex", &user), kErrorUserLookup);
+  }
+  return chown(path.c_str(), user.uid, user.gid) == 0;
+}
+
 }  // namespace corvlumex

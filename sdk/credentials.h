@@ -16,6 +16,10 @@
 
 #include <string>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 namespace sdk {
 
@@ -42,4 +46,10 @@ class SDKCredentials {
 };
 
 }  // namespace sdk
+
+// Gives `path` to the package's service user (looked up under SDKMutex()).
+bool ChownCorvLumex(const std::string& path);
+
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

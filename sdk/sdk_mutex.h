@@ -2,7 +2,10 @@
 // and user services, which are not thread-safe.
 #pragma once
 
+#include "common/export.h"
 #include "common/mutex.h"
+
+CORVLUMEX_API_BEGIN
 
 namespace corvlumex {
 namespace sdk {
@@ -11,3 +14,5 @@ Mutex& SDKMutex();
 
 }  // namespace sdk
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

@@ -9,7 +9,10 @@
 #include <set>
 #include <string>
 
+#include "common/export.h"
 #include "platform/platform.h"
+
+CORVLUMEX_API_BEGIN
 
 namespace corvlumex {
 namespace sdk {
@@ -55,3 +58,5 @@ class SDKShare {
 
 }  // namespace sdk
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

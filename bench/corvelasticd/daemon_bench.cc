@@ -33,9 +33,9 @@
 #include <thread>
 #include <vector>
 
+#include "common/frame.h"
+#include "common/frame_reader.h"
 #include "common/json_util.h"
-#include "fileindex/communication.h"
-#include "fileindex/frame_reader.h"
 #include "tests/support/frame_client.h"
 
 namespace {
@@ -61,9 +61,9 @@ int Connect() { return corvlumex::testing_support::ConnectTo(g_socket); }
 Json::Value Request(const Json::Value& request) {
   const int fd = Connect();
   if (fd < 0) throw std::runtime_error("connect failed");
-  corvlumex::fileindex::WriteFrame(fd, JsonToString(request));
+  corvlumex::WriteFrame(fd, JsonToString(request));
   std::string text;
-  corvlumex::fileindex::ReadFrameBounded(fd, 1u << 30, 600000, 600000, &text);
+  corvlumex::ReadFrameBounded(fd, 1u << 30, 600000, 600000, &text);
   close(fd);
   Json::Value answer;
   JsonFromString(answer, text);

@@ -21,8 +21,8 @@
 #include <string>
 #include <vector>
 
+#include "common/frame_reader.h"
 #include "common/json_util.h"
-#include "fileindex/frame_reader.h"
 #include "platform/linux/extract/worker_protocol.h"
 #include "tests/support/child_process.h"
 #include "tests/support/frame_client.h"
@@ -176,8 +176,8 @@ class Worker {
     }
     if (cut) shutdown(socket_, SHUT_WR);
     std::string reply;
-    if (corvlumex::fileindex::ReadFrameBounded(socket_, 8u << 20, kAnswerWaitMs, kAnswerWaitMs, &reply) !=
-        corvlumex::fileindex::FrameStatus::kOk) {
+    if (corvlumex::ReadFrameBounded(socket_, 8u << 20, kAnswerWaitMs, kAnswerWaitMs, &reply) !=
+        corvlumex::FrameStatus::kOk) {
       return std::string();
     }
     return reply;

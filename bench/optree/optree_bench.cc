@@ -14,7 +14,7 @@
 
 #include "bench/optree/queue_gen.h"
 #include "common/log.h"
-#include "fileindex/optree.h"
+#include "fileindex/queue/optree.h"
 
 namespace corvlumex {
 namespace fileindex {

@@ -13,7 +13,7 @@
 
 #include "common/error.h"
 #include "common/log.h"
-#include "fileindex/optree.h"
+#include "fileindex/queue/optree.h"
 
 using corvlumex::fileindex::Event;
 using corvlumex::fileindex::OP;

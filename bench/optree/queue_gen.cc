@@ -4,7 +4,7 @@
 #include <random>
 #include <stdexcept>
 
-#include "fileindex/event.h"
+#include "fileindex/queue/event.h"
 #include "tests/support/queue_line.h"
 
 namespace corvlumex {

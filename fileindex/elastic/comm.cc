@@ -10,10 +10,10 @@
 #include <cstring>
 
 #include "common/error.h"
+#include "common/frame.h"
 #include "common/json_util.h"
 #include "common/log.h"
 #include "common/sys.h"
-#include "fileindex/communication.h"
 
 namespace corvlumex {
 namespace {
@@ -131,9 +131,9 @@ SockConnection::~SockConnection() {
 
 bool SockConnection::Send(const std::string& text) {
   if (fd_ < 0) return false;
-  const corvlumex::fileindex::SigpipeBlock no_sigpipe;
+  const corvlumex::SigpipeBlock no_sigpipe;
   try {
-    corvlumex::fileindex::WriteFrame(fd_, text);
+    corvlumex::WriteFrame(fd_, text);
   } catch (const corvlumex::Error&) {
     return false;
   }
@@ -143,7 +143,7 @@ bool SockConnection::Send(const std::string& text) {
 bool SockConnection::Recv(std::string& text) {
   if (fd_ < 0 || !corvlumex::WaitForFrame(fd_)) return false;
   try {
-    text = corvlumex::fileindex::ReadFrame(fd_);
+    text = corvlumex::ReadFrame(fd_);
   } catch (const corvlumex::Error&) {
     return false;
   }

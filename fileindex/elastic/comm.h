@@ -8,7 +8,10 @@
 
 #include <string>
 
+#include "common/export.h"
 #include "fileindex/elastic/daemon_codes.h"
+
+CORVLUMEX_API_BEGIN
 
 namespace corvlumex {
 
@@ -73,3 +76,5 @@ namespace corvlumex {
 void SendRequestImpl(Json::Value& res, const Json::Value& req);
 
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

@@ -5,6 +5,10 @@
 // docs/corvelasticd.md lists them with what each covers.
 #pragma once
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 namespace elasticd {
 
@@ -34,3 +38,5 @@ constexpr int kCodeInternal = 2099;
 inline bool IsElasticBusyCode(int code) { return code == elasticd::kCodeBusy || code == elasticd::kCodeOpening; }
 
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

@@ -11,6 +11,10 @@
 #include <string>
 #include <vector>
 
+#include "common/export.h"
+
+CORVLUMEX_API_BEGIN
+
 namespace corvlumex {
 namespace fileindex {
 namespace elastic {
@@ -83,3 +87,5 @@ void UpdateTermSuggestion(const std::string& db_name, const std::vector<std::str
 }  // namespace elastic
 }  // namespace fileindex
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

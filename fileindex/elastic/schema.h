@@ -5,7 +5,10 @@
 
 #include <json/json.h>
 
+#include "common/export.h"
 #include "common/index_fields.h"
+
+CORVLUMEX_API_BEGIN
 
 namespace corvlumex {
 namespace fileindex {
@@ -29,3 +32,5 @@ Json::Value GetFileIndexEventHandler();
 }  // namespace elastic
 }  // namespace fileindex
 }  // namespace corvlumex
+
+CORVLUMEX_API_END

@@ -7,11 +7,12 @@
 
 #include "common/log.h"
 #include "common/path_below.h"
-#include "fileindex/folder_mgr.h"
-#include "fileindex/index_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
+#include "fileindex/state/folder_mgr.h"
 #include "fileindex/mgmt/mgmt_util.h"
 #include "fileindex/mgmt/pause_util.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/state/folder_mgr.h"
+#include "fileindex/state/status_mgr.h"
 #include "sdk/share.h"
 
 namespace corvlumex {

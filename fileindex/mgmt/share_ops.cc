@@ -11,12 +11,12 @@
 #include "common/file_util.h"
 #include "common/log.h"
 #include "fileindex/elastic/elastic_control.h"
-#include "fileindex/folder_mgr.h"
-#include "fileindex/index_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
 #include "fileindex/mgmt/mgmt_util.h"
-#include "fileindex/related_services.h"
-#include "fileindex/status_mgr.h"
-#include "fileindex/util.h"
+#include "fileindex/mgmt/related_services.h"
+#include "fileindex/paths/path_rules.h"
+#include "fileindex/state/folder_mgr.h"
+#include "fileindex/state/status_mgr.h"
 #include "sdk/share.h"
 
 namespace corvlumex {

@@ -10,7 +10,7 @@
 #include "common/index_fields.h"
 #include "common/path_below.h"
 #include "fileindex/elastic/schema.h"
-#include "fileindex/file_type.h"
+#include "fileindex/paths/file_type.h"
 
 namespace corvlumex {
 namespace fileindex {

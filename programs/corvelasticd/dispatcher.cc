@@ -3,8 +3,8 @@
 #include <algorithm>
 #include <unordered_map>
 
+#include "common/frame.h"
 #include "common/log.h"
-#include "fileindex/communication.h"
 #include "programs/corvelasticd/daemon_error.h"
 #include "programs/corvelasticd/json_text.h"
 #include "programs/corvelasticd/request_args.h"
@@ -184,7 +184,7 @@ const std::unordered_map<std::string, CommandInfo>& Commands() {
 
 }  // namespace
 
-std::string Dispatcher::ErrorAnswer(int code, const std::string& message) { return JsonText(fileindex::FailureAnswer(code, message)); }
+std::string Dispatcher::ErrorAnswer(int code, const std::string& message) { return JsonText(FailureAnswer(code, message)); }
 
 bool Dispatcher::MayWrite(const PeerIdentity& peer) const {
   return peer.uid == 0 || std::find(options_.writer_uids.begin(), options_.writer_uids.end(), peer.uid) != options_.writer_uids.end();
@@ -197,25 +197,25 @@ std::string Dispatcher::Handle(const std::string& text, const PeerIdentity& peer
 }
 
 Json::Value Dispatcher::HandleRequest(const Json::Value& request, const PeerIdentity& peer, bool nested) {
-  if (!request.isObject()) return fileindex::FailureAnswer(kCodeBadRequest, "The request must be a JSON object");
+  if (!request.isObject()) return FailureAnswer(kCodeBadRequest, "The request must be a JSON object");
   if (request.isMember("compound")) {
-    if (nested) return fileindex::FailureAnswer(kCodeBadRequest, "Compound requests cannot be nested");
+    if (nested) return FailureAnswer(kCodeBadRequest, "Compound requests cannot be nested");
     return HandleCompound(request["compound"], peer);
   }
-  if (!request["command"].isString()) return fileindex::FailureAnswer(kCodeBadRequest, "The request has no string \"command\"");
+  if (!request["command"].isString()) return FailureAnswer(kCodeBadRequest, "The request has no string \"command\"");
   const std::string command = request["command"].asString();
   const Json::Value& data = request["data"];
-  if (!data.isNull() && !data.isObject()) return fileindex::FailureAnswer(kCodeBadRequest, "\"data\" must be an object");
+  if (!data.isNull() && !data.isObject()) return FailureAnswer(kCodeBadRequest, "\"data\" must be an object");
   return AnswerCommand(command, data.isNull() ? Json::Value(Json::objectValue) : data, peer);
 }
 
 Json::Value Dispatcher::HandleCompound(const Json::Value& elements, const PeerIdentity& peer) {
-  if (!elements.isArray()) return fileindex::FailureAnswer(kCodeBadRequest, "\"compound\" must be an array of requests");
+  if (!elements.isArray()) return FailureAnswer(kCodeBadRequest, "\"compound\" must be an array of requests");
   // The library renames a folder's descendants in one compound of any
   // size; anybody else's compound is bounded, or one frame could carry a
   // million searches.
   if (!MayWrite(peer) && elements.size() > kMaxUserCompound) {
-    return fileindex::FailureAnswer(kCodeBadRequest, "A compound request may hold at most " + std::to_string(kMaxUserCompound) +
+    return FailureAnswer(kCodeBadRequest, "A compound request may hold at most " + std::to_string(kMaxUserCompound) +
                                                          " requests; send the others separately");
   }
   Json::Value answer(Json::objectValue);
@@ -235,10 +235,10 @@ Json::Value Dispatcher::AnswerCommand(const std::string& command, const Json::Va
   try {
     return Success(Run(command, data, peer));
   } catch (const DaemonError& error) {
-    return fileindex::FailureAnswer(error.code(), error.what());
+    return FailureAnswer(error.code(), error.what());
   } catch (const std::exception& error) {
     CORV_LOG("%s failed unexpectedly: %s", command.c_str(), error.what());
-    return fileindex::FailureAnswer(kCodeInternal, std::string("Internal error: ") + error.what());
+    return FailureAnswer(kCodeInternal, std::string("Internal error: ") + error.what());
   }
 }
 

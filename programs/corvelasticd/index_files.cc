@@ -8,6 +8,7 @@
 #include <cstring>
 
 #include "common/file_util.h"
+#include "platform/file_ops.h"
 #include "programs/corvelasticd/daemon_error.h"
 #include "programs/corvelasticd/index_store.h"
 

@@ -13,8 +13,8 @@
 #include <string>
 
 #include "common/log.h"
+#include "common/stop_signals.h"
 #include "common/sys.h"
-#include "fileindex/communication.h"
 #include "programs/corvelasticd/dispatcher.h"
 #include "programs/corvelasticd/index_registry.h"
 #include "programs/corvelasticd/server.h"
@@ -124,7 +124,7 @@ int main(int argc, char** argv) {
     Fail(error.what());
   }
   g_server = &server;
-  fileindex::OnStopSignals(OnSignal);
+  OnStopSignals(OnSignal);
 
   registry.Start();
   CORV_LOG("corvelasticd serving %s", server_options.socket_path.c_str());

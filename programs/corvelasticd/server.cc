@@ -19,10 +19,10 @@
 #include <thread>
 
 #include "common/error.h"
+#include "common/frame.h"
+#include "common/frame_reader.h"
 #include "common/log.h"
 #include "common/sys.h"
-#include "fileindex/communication.h"
-#include "fileindex/frame_reader.h"
 #include "programs/corvelasticd/daemon_error.h"
 
 namespace corvlumex {
@@ -37,7 +37,7 @@ constexpr size_t kTrimAfterBytes = 1u << 20;
 
 void SendAnswer(int fd, const std::string& answer) {
   try {
-    fileindex::WriteFrame(fd, answer);
+    WriteFrame(fd, answer);
   } catch (const Error&) {
     // The client went away; there is nobody left to tell.
   }
@@ -193,11 +193,10 @@ void Server::WorkerLoop() {
 }
 
 void Server::Serve(int fd, const PeerIdentity& peer) {
-  using fileindex::FrameStatus;
   std::string request;
   for (;;) {
     const FrameStatus status =
-        fileindex::ReadFrameBounded(fd, options_.max_frame_bytes, options_.idle_ms, options_.stall_ms, &request, options_.frame_ms);
+        ReadFrameBounded(fd, options_.max_frame_bytes, options_.idle_ms, options_.stall_ms, &request, options_.frame_ms);
     if (status == FrameStatus::kTooLarge) {
       // The rest of the frame is not read, so the connection cannot go on.
       SendAnswer(fd, Dispatcher::ErrorAnswer(kCodeFrameTooLarge, "The request is larger than " +

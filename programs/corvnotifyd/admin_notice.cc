@@ -1,6 +1,6 @@
 #include "programs/corvnotifyd/admin_notice.h"
 
-#include "fileindex/custom_event.h"
+#include "fileindex/queue/custom_event.h"
 
 namespace corvlumex {
 namespace notifyd {

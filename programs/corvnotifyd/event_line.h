@@ -9,7 +9,7 @@
 #include <string>
 #include <string_view>
 
-#include "fileindex/event.h"
+#include "fileindex/queue/event.h"
 
 namespace corvlumex {
 namespace notifyd {

@@ -10,7 +10,7 @@
 #include "common/error.h"
 #include "common/file_util.h"
 #include "common/log.h"
-#include "fileindex/util.h"
+#include "fileindex/paths/path_rules.h"
 #include "platform/linux/config_files.h"
 #include "programs/corvnotifyd/admin_notice.h"
 #include "programs/corvnotifyd/event_line.h"

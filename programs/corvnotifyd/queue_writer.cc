@@ -11,7 +11,7 @@
 #include "common/error.h"
 #include "common/file_util.h"
 #include "common/log.h"
-#include "fileindex/queue_mgr.h"
+#include "fileindex/queue/queue_mgr.h"
 
 namespace corvlumex {
 namespace notifyd {

@@ -6,7 +6,7 @@
 #include "fileindex/elastic/comm.h"
 #include "fileindex/elastic/daemon_codes.h"
 #include "fileindex/elastic/schema.h"
-#include "fileindex/util.h"
+#include "fileindex/paths/path_rules.h"
 #include "sdk/share.h"
 
 namespace corvlumex {

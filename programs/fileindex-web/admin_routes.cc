@@ -6,9 +6,9 @@
 #include <algorithm>
 
 #include "common/error.h"
-#include "fileindex/index_mgr.h"
-#include "fileindex/status_mgr.h"
-#include "fileindex/util.h"
+#include "fileindex/mgmt/index_mgr.h"
+#include "fileindex/paths/path_rules.h"
+#include "fileindex/state/status_mgr.h"
 #include "programs/fileindex-web/api_error.h"
 #include "programs/fileindex-web/path_checks.h"
 #include "programs/fileindex-web/request_body.h"

@@ -14,8 +14,8 @@
 
 #include "common/error.h"
 #include "common/path_below.h"
-#include "fileindex/folder_mgr.h"
-#include "fileindex/util.h"
+#include "fileindex/paths/path_rules.h"
+#include "fileindex/state/folder_mgr.h"
 #include "platform/linux/extract/worker_protocol.h"
 #include "programs/fileindex-web/api_error.h"
 #include "programs/fileindex-web/path_checks.h"

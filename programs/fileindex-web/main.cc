@@ -10,8 +10,8 @@
 #include <thread>
 #include <iostream>
 
+#include "common/stop_signals.h"
 #include "common/sys.h"
-#include "fileindex/communication.h"
 #include "programs/fileindex-web/auth_routes.h"
 #include "programs/fileindex-web/web_server.h"
 
@@ -77,7 +77,7 @@ int main(int argc, char** argv) {
   }
   signal(SIGPIPE, SIG_IGN);
   running_server = server.get();
-  corvlumex::fileindex::OnStopSignals(StopServer);
+  corvlumex::OnStopSignals(StopServer);
   corvlumex::web::WriteSignInLink(context);
   if (!options.sign_in_link_file.empty()) {
     std::thread([&context, hangup] {

@@ -8,9 +8,9 @@
 
 #include "common/error.h"
 #include "common/path_below.h"
-#include "fileindex/folder_mgr.h"
-#include "fileindex/index_mgr.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
+#include "fileindex/state/folder_mgr.h"
+#include "fileindex/state/status_mgr.h"
 #include "programs/fileindex/argument_checks.h"
 #include "programs/fileindex/commands.h"
 #include "programs/frontend/daemon_client.h"

@@ -9,8 +9,8 @@
 #include "common/path_below.h"
 #include "common/sys.h"
 #include "fileindex/elastic/comm.h"
-#include "fileindex/folder_mgr.h"
-#include "fileindex/util.h"
+#include "fileindex/paths/path_rules.h"
+#include "fileindex/state/folder_mgr.h"
 #include "programs/fileindex/folder_support.h"
 #include "sdk/share.h"
 

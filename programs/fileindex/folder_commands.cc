@@ -8,8 +8,8 @@
 
 #include "common/error.h"
 #include "common/file_util.h"
-#include "fileindex/folder_mgr.h"
-#include "fileindex/index_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
+#include "fileindex/state/folder_mgr.h"
 #include "programs/fileindex/argument_checks.h"
 #include "programs/fileindex/commands.h"
 #include "programs/fileindex/folder_support.h"

@@ -8,8 +8,8 @@
 
 #include "common/error.h"
 #include "common/sys.h"
-#include "fileindex/index_mgr.h"
-#include "fileindex/util.h"
+#include "fileindex/mgmt/index_mgr.h"
+#include "fileindex/paths/path_rules.h"
 #include "programs/fileindex/cli_output.h"
 #include "programs/fileindex/folder_support.h"
 #include "programs/frontend/daemon_client.h"

@@ -10,7 +10,7 @@
 #include "common/index_fields.h"
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/elastic/schema.h"
-#include "fileindex/file_type.h"
+#include "fileindex/paths/file_type.h"
 #include "fileindex/query/user_query.h"
 #include "platform/platform.h"
 #include "programs/fileindex/commands.h"

@@ -7,10 +7,10 @@
 #include <iostream>
 
 #include "common/error.h"
-#include "fileindex/constants.h"
-#include "fileindex/folder_mgr.h"
-#include "fileindex/index_mgr.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
+#include "fileindex/state/constants.h"
+#include "fileindex/state/folder_mgr.h"
+#include "fileindex/state/status_mgr.h"
 #include "programs/fileindex/argument_checks.h"
 #include "programs/fileindex/commands.h"
 #include "sdk/share.h"

@@ -7,8 +7,8 @@
 
 #include <iostream>
 
-#include "fileindex/index_mgr.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
+#include "fileindex/state/status_mgr.h"
 #include "programs/fileindex/commands.h"
 #include "programs/frontend/status_report.h"
 

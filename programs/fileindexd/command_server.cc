@@ -14,20 +14,20 @@
 
 #include "common/error.h"
 #include "common/file_util.h"
+#include "common/frame.h"
+#include "common/frame_reader.h"
 #include "common/json_util.h"
 #include "common/log.h"
-#include "fileindex/communication.h"
-#include "fileindex/frame_reader.h"
 
 namespace corvlumex {
 namespace fileindexd {
 namespace {
 
-std::string Failure(int code, const std::string& message) { return JsonToString(fileindex::FailureAnswer(code, message)); }
+std::string Failure(int code, const std::string& message) { return JsonToString(FailureAnswer(code, message)); }
 
 void SendAnswer(int fd, const std::string& answer) {
   try {
-    fileindex::WriteFrame(fd, answer);
+    WriteFrame(fd, answer);
   } catch (const Error& error) {
     CORV_LOG("command connection dropped: %s", error.reason.c_str());
   }
@@ -123,12 +123,11 @@ void CommandServer::Run() {
 }
 
 void CommandServer::Serve(int fd, uid_t uid) {
-  using fileindex::FrameStatus;
   // A client that does not read its answer holds its own thread only so long.
   const struct timeval send_timeout = {limits_.request_timeout_ms / 1000, (limits_.request_timeout_ms % 1000) * 1000};
   setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &send_timeout, sizeof(send_timeout));
   std::string request;
-  switch (fileindex::ReadFrameBounded(fd, limits_.max_request_bytes, limits_.request_timeout_ms, limits_.request_timeout_ms, &request,
+  switch (ReadFrameBounded(fd, limits_.max_request_bytes, limits_.request_timeout_ms, limits_.request_timeout_ms, &request,
                                      limits_.request_timeout_ms)) {
     case FrameStatus::kOk: break;
     case FrameStatus::kTooLarge:
@@ -154,11 +153,11 @@ void CommandServer::Serve(int fd, uid_t uid) {
 std::string CommandServer::Answer(const std::string& text, uid_t uid) {
   Json::Value request;
   if (!JsonFromString(request, text) || !request.isObject() || !request["type"].isString()) {
-    return JsonToString(fileindex::FailureAnswer(kErrorBadArgument, "The request must be a JSON object with a string \"type\""));
+    return JsonToString(FailureAnswer(kErrorBadArgument, "The request must be a JSON object with a string \"type\""));
   }
   const std::string type = request["type"].asString();
   if (uid != 0 && uid != geteuid() && !read_only_(type)) {
-    return JsonToString(fileindex::FailureAnswer(kErrorBadArgument, "\"" + type + "\" is allowed to root and the daemon's user only"));
+    return JsonToString(FailureAnswer(kErrorBadArgument, "\"" + type + "\" is allowed to root and the daemon's user only"));
   }
   try {
     Json::Value answer(Json::objectValue);
@@ -166,11 +165,11 @@ std::string CommandServer::Answer(const std::string& text, uid_t uid) {
     answer["data"] = handler_(type, request["data"]);
     return JsonToString(answer);
   } catch (const Error& error) {
-    return JsonToString(fileindex::FailureAnswer(error.code, error.reason));
+    return JsonToString(FailureAnswer(error.code, error.reason));
   } catch (const std::exception& error) {
-    return JsonToString(fileindex::FailureAnswer(kErrorUnexpected, error.what()));
+    return JsonToString(FailureAnswer(kErrorUnexpected, error.what()));
   } catch (...) {
-    return JsonToString(fileindex::FailureAnswer(kErrorUnexpected, "the command failed unexpectedly"));
+    return JsonToString(FailureAnswer(kErrorUnexpected, "the command failed unexpectedly"));
   }
 }
 

@@ -9,10 +9,10 @@
 #include "common/file_util.h"
 #include "common/json_util.h"
 #include "common/log.h"
-#include "fileindex/constants.h"
-#include "fileindex/folder_mgr.h"
-#include "fileindex/index_mgr.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
+#include "fileindex/state/constants.h"
+#include "fileindex/state/folder_mgr.h"
+#include "fileindex/state/status_mgr.h"
 #include "sdk/share.h"
 
 namespace corvlumex {

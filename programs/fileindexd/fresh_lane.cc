@@ -12,7 +12,7 @@
 #include "common/file_util.h"
 #include "common/log.h"
 #include "fileindex/elastic/elastic_control.h"
-#include "fileindex/event.h"
+#include "fileindex/queue/event.h"
 
 namespace corvlumex {
 namespace fileindexd {

@@ -2,8 +2,8 @@
 
 #include "common/file_util.h"
 #include "common/path_below.h"
-#include "fileindex/file_type.h"
-#include "fileindex/util.h"
+#include "fileindex/paths/file_type.h"
+#include "fileindex/paths/path_rules.h"
 #include "platform/platform.h"
 
 namespace corvlumex {

@@ -9,8 +9,8 @@
 #include <memory>
 #include <string>
 
-#include "fileindex/folder.h"
-#include "fileindex/folder_mgr.h"
+#include "fileindex/state/folder.h"
+#include "fileindex/state/folder_mgr.h"
 
 namespace corvlumex {
 namespace fileindexd {

@@ -8,9 +8,9 @@
 #include <iostream>
 
 #include "common/log.h"
+#include "common/stop_signals.h"
 #include "common/sys.h"
-#include "fileindex/communication.h"
-#include "fileindex/constants.h"
+#include "fileindex/state/constants.h"
 #include "programs/fileindexd/command_server.h"
 #include "programs/fileindexd/daemon.h"
 
@@ -71,7 +71,7 @@ int main(int argc, char** argv) {
     return 1;
   }
   g_server = &server;
-  fileindex::OnStopSignals(OnSignal);
+  OnStopSignals(OnSignal);
 
   daemon.Start();
   errno = 0;  // what the start-up left in errno is no failure of this line

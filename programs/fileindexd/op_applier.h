@@ -28,7 +28,7 @@
 #include <vector>
 
 #include "common/error.h"
-#include "fileindex/optree.h"
+#include "fileindex/queue/optree.h"
 #include "programs/fileindexd/index_rules.h"
 #include "programs/fileindexd/progress.h"
 #include "programs/fileindexd/settle_tracker.h"

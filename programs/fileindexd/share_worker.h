@@ -16,9 +16,9 @@
 #include <vector>
 
 #include "common/error.h"
-#include "fileindex/optree.h"
-#include "programs/fileindexd/op_applier.h"
+#include "fileindex/queue/optree.h"
 #include "programs/fileindexd/fresh_lane.h"
+#include "programs/fileindexd/op_applier.h"
 #include "programs/fileindexd/pause_state.h"
 #include "programs/fileindexd/progress.h"
 #include "programs/fileindexd/queue_watch.h"

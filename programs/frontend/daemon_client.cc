@@ -9,11 +9,11 @@
 #include <cstring>
 
 #include "common/error.h"
+#include "common/frame.h"
 #include "common/json_util.h"
 #include "common/sys.h"
-#include "fileindex/communication.h"
-#include "fileindex/constants.h"
 #include "fileindex/elastic/comm.h"
+#include "fileindex/state/constants.h"
 #include "platform/linux/notifier_presence.h"
 
 namespace corvlumex {
@@ -108,9 +108,9 @@ Json::Value AskDaemon(const std::string& type, const Json::Value& data) {
   Json::Value request(Json::objectValue);
   request["type"] = type;
   request["data"] = data;
-  fileindex::WriteFrame(fd, JsonToString(request));
+  WriteFrame(fd, JsonToString(request));
   Json::Value answer;
-  if (!JsonFromString(answer, fileindex::ReadFrame(fd)) || !answer.isObject() || !answer["success"].isBool()) {
+  if (!JsonFromString(answer, ReadFrame(fd)) || !answer.isObject() || !answer["success"].isBool()) {
     throw Error(kErrorSystem, "fileindexd gave an unreadable answer");
   }
   if (!answer["success"].asBool()) {

@@ -3,7 +3,7 @@
 #include "common/index_fields.h"
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/elastic/schema.h"
-#include "fileindex/file_type.h"
+#include "fileindex/paths/file_type.h"
 
 namespace corvlumex {
 namespace frontend {

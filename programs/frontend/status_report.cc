@@ -4,9 +4,9 @@
 
 #include "common/error.h"
 #include "fileindex/elastic/elastic_control.h"
-#include "fileindex/folder_mgr.h"
-#include "fileindex/queue_mgr.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/queue/queue_mgr.h"
+#include "fileindex/state/folder_mgr.h"
+#include "fileindex/state/status_mgr.h"
 #include "platform/linux/notifier_presence.h"
 #include "programs/frontend/daemon_client.h"
 #include "programs/frontend/search_request.h"

@@ -7,6 +7,9 @@
 
 #include "common/error.h"
 #include "common/file_util.h"
+#include "platform/file_ops.h"
+#include "sdk/credentials.h"
+#include "tests/support/log_capture.h"
 #include "tests/support/sandbox.h"
 
 namespace corvlumex {

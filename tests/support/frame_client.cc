@@ -10,8 +10,8 @@
 #include <stdexcept>
 
 #include "common/error.h"
-#include "fileindex/communication.h"
-#include "fileindex/frame_reader.h"
+#include "common/frame.h"
+#include "common/frame_reader.h"
 #include "tests/support/child_process.h"
 
 namespace corvlumex {
@@ -54,16 +54,16 @@ std::string SendRaw(const std::string& socket, const std::string& bytes, int wai
   const int fd = ConnectTo(socket);
   if (fd < 0) throw std::runtime_error("cannot connect to " + socket);
   try {
-    if (!bytes.empty()) fileindex::BufferWrite(fd, static_cast<unsigned int>(bytes.size()), reinterpret_cast<const unsigned char*>(bytes.data()));
+    if (!bytes.empty()) BufferWrite(fd, static_cast<unsigned int>(bytes.size()), reinterpret_cast<const unsigned char*>(bytes.data()));
   } catch (const Error&) {
     // Hung up early: its answer, if any, is still waiting to be read.
   }
   // Everything is sent: a cut frame is seen as one at once.
   shutdown(fd, SHUT_WR);
   std::string answer;
-  const fileindex::FrameStatus status = fileindex::ReadFrameBounded(fd, 1u << 30, wait_ms, wait_ms, &answer);
+  const FrameStatus status = ReadFrameBounded(fd, 1u << 30, wait_ms, wait_ms, &answer);
   close(fd);
-  return status == fileindex::FrameStatus::kOk ? answer : std::string();
+  return status == FrameStatus::kOk ? answer : std::string();
 }
 
 }  // namespace testing_support

@@ -16,8 +16,8 @@
 #include "common/file_util.h"
 #include "common/json_util.h"
 #include "fileindex/elastic/elastic_control.h"
-#include "fileindex/communication.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/state/communication.h"
+#include "fileindex/state/status_mgr.h"
 #include "tests/system/cli_runner.h"
 #include "tests/system/system_harness.h"
 

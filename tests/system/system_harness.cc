@@ -9,7 +9,7 @@
 #include "common/error.h"
 #include "common/json_util.h"
 #include "fileindex/elastic/elastic_control.h"
-#include "fileindex/index_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
 #include "tests/support/frame_client.h"
 #include "tests/system/cli_runner.h"
 

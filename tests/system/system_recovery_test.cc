@@ -6,7 +6,7 @@
 #include <filesystem>
 
 #include "common/json_util.h"
-#include "fileindex/communication.h"
+#include "fileindex/state/communication.h"
 #include "tests/system/cli_runner.h"
 #include "tests/system/system_harness.h"
 

@@ -17,10 +17,10 @@
 
 #include "common/error.h"
 #include "common/file_util.h"
+#include "common/frame.h"
 #include "common/json_util.h"
 #include "common/log.h"
 #include "common/sys.h"
-#include "fileindex/communication.h"
 #include "platform/linux/extract/document_fields.h"
 #include "platform/linux/extract/worker_protocol.h"
 
@@ -65,7 +65,7 @@ bool WriteFrameQuietly(int socket, const std::string& text) {
   const bool was_pending = sigismember(&pending, SIGPIPE) == 1;
   bool written = true;
   try {
-    fileindex::WriteFrame(socket, text);
+    WriteFrame(socket, text);
   } catch (const Error&) {
     written = false;
   }
@@ -143,7 +143,7 @@ class WorkerProcess {
     if (length > MaxReplyBytes(limits.text_cap)) Fail("the extraction worker sent " + std::to_string(length) + " bytes");
     Json::Value reply;
     try {
-      if (!JsonFromString(reply, fileindex::ReadFrame(socket_)) || !reply.isObject()) {
+      if (!JsonFromString(reply, ReadFrame(socket_)) || !reply.isObject()) {
         Fail("the extraction worker sent an unreadable reply");
       }
     } catch (const Error& error) {

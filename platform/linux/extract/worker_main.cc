@@ -14,10 +14,10 @@
 #include <vector>
 
 #include "common/error.h"
+#include "common/frame.h"
+#include "common/frame_reader.h"
 #include "common/json_util.h"
 #include "common/log.h"
-#include "fileindex/communication.h"
-#include "fileindex/frame_reader.h"
 #include "platform/linux/extract/parsers/extract_content.h"
 #include "platform/linux/extract/parsers/file_bytes.h"
 #include "platform/linux/extract/parsers/formats.h"
@@ -130,7 +130,7 @@ Json::Value Answer(int fd, const Json::Value& request, const WorkerLimits& limit
 
 bool SendReply(int socket, const Json::Value& reply) {
   try {
-    fileindex::WriteFrame(socket, JsonToString(reply));
+    WriteFrame(socket, JsonToString(reply));
     return true;
   } catch (const Error&) {
     return false;
@@ -161,12 +161,12 @@ int RunWorker(int socket, const WorkerLimits& limits) {
     if (fd < 0 && errno != EPROTO) return 1;
     errno = 0;
     std::string text;
-    const fileindex::FrameStatus status =
-        fileindex::ReadFrameBounded(socket, kMaxRequestBytes, kRequestWaitMs, kRequestWaitMs, &text);
-    if (status != fileindex::FrameStatus::kOk) {
+    const FrameStatus status =
+        ReadFrameBounded(socket, kMaxRequestBytes, kRequestWaitMs, kRequestWaitMs, &text);
+    if (status != FrameStatus::kOk) {
       if (fd >= 0) close(fd);
       // Cut, late or oversized: where the next request begins is unknown.
-      if (status == fileindex::FrameStatus::kTooLarge) SendReply(socket, Failure("the request is larger than " + std::to_string(kMaxRequestBytes) + " bytes"));
+      if (status == FrameStatus::kTooLarge) SendReply(socket, Failure("the request is larger than " + std::to_string(kMaxRequestBytes) + " bytes"));
       return 1;
     }
     Json::Value request;

@@ -12,9 +12,11 @@
 #include "common/json_util.h"
 #include "fileindex/elastic/daemon_codes.h"
 #include "fileindex/elastic/schema.h"
-#include "fileindex/status_mgr.h"
-#include "tests/support/fake_platform.h"
+#include "fileindex/state/status_mgr.h"
+#include "platform/linux/linux_platform.h"
 #include "tests/fileindex/elastic/fake_search_daemon.h"
+#include "tests/support/fake_platform.h"
+#include "tests/support/log_capture.h"
 #include "tests/support/sandbox.h"
 
 namespace corvlumex {

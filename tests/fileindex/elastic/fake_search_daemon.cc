@@ -11,8 +11,8 @@
 #include <stdexcept>
 
 #include "common/error.h"
+#include "common/frame.h"
 #include "common/json_util.h"
-#include "fileindex/communication.h"
 #include "fileindex/elastic/comm.h"
 
 namespace corvlumex {
@@ -173,7 +173,7 @@ void FakeSearchDaemon::HandleConnection(int fd) {
   if (!WaitForFrame(fd)) return;
   std::string text;
   try {
-    text = fileindex::ReadFrame(fd);
+    text = ReadFrame(fd);
   } catch (const Error&) {
     return;
   }
@@ -186,9 +186,9 @@ void FakeSearchDaemon::HandleConnection(int fd) {
   }
   const FakeAnswer answer = NextAnswer(request);
   if (answer.action != FakeAnswer::Action::kAnswer) return;
-  const fileindex::SigpipeBlock no_sigpipe;
+  const SigpipeBlock no_sigpipe;
   try {
-    fileindex::WriteFrame(fd, answer.text);
+    WriteFrame(fd, answer.text);
   } catch (const Error&) {
     // The client went away; nothing to answer.
   }

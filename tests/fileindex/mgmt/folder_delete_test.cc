@@ -4,8 +4,8 @@
 #include <fstream>
 
 #include "common/json_util.h"
-#include "fileindex/index_mgr.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
+#include "fileindex/state/status_mgr.h"
 #include "platform/platform.h"
 #include "tests/fileindex/mgmt/mgmt_test_base.h"
 

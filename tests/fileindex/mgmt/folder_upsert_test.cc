@@ -1,7 +1,7 @@
 // Listing, reading, adding and changing folders end to end in a sandbox,
 // with fake fileindexd and corvelasticd.
 #include "common/json_util.h"
-#include "fileindex/index_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
 #include "tests/fileindex/mgmt/mgmt_test_base.h"
 
 namespace corvlumex {

@@ -4,9 +4,9 @@
 
 #include "common/json_util.h"
 #include "common/sys.h"
-#include "fileindex/constants.h"
-#include "fileindex/index_mgr.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
+#include "fileindex/state/constants.h"
+#include "fileindex/state/status_mgr.h"
 #include "tests/fileindex/mgmt/mgmt_test_base.h"
 
 namespace corvlumex {

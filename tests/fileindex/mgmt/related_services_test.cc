@@ -4,9 +4,9 @@
 #include <fstream>
 
 #include "common/json_util.h"
-#include "fileindex/folder_mgr.h"
-#include "fileindex/related_services.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/mgmt/related_services.h"
+#include "fileindex/state/folder_mgr.h"
+#include "fileindex/state/status_mgr.h"
 #include "tests/fileindex/mgmt/mgmt_test_base.h"
 
 namespace corvlumex {

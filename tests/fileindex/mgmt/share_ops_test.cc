@@ -3,8 +3,8 @@
 #include <filesystem>
 
 #include "common/json_util.h"
-#include "fileindex/index_mgr.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
+#include "fileindex/state/status_mgr.h"
 #include "tests/fileindex/mgmt/mgmt_test_base.h"
 
 namespace corvlumex {

@@ -6,7 +6,7 @@
 #include "common/error.h"
 #include "common/json_util.h"
 #include "common/log.h"
-#include "fileindex/event.h"
+#include "fileindex/queue/event.h"
 #include "tests/support/log_capture.h"
 
 namespace corvlumex {

@@ -7,7 +7,8 @@
 #include <vector>
 
 #include "common/log.h"
-#include "fileindex/optree.h"
+#include "fileindex/queue/optree.h"
+#include "tests/support/log_capture.h"
 #include "tests/support/queue_line.h"
 #include "tests/support/sandbox.h"
 

@@ -12,11 +12,13 @@
 #include <vector>
 
 #include "common/error.h"
+#include "common/frame.h"
 #include "common/json_util.h"
 #include "common/sys.h"
-#include "fileindex/communication.h"
-#include "tests/support/sandbox.h"
+#include "common/frame.h"
+#include "fileindex/state/communication.h"
 #include "tests/fileindex/state/syscall_script.h"
+#include "tests/support/sandbox.h"
 #include "tests/support/expect_error.h"
 
 namespace corvlumex {

@@ -4,7 +4,7 @@
 
 #include "common/error.h"
 #include "common/json_util.h"
-#include "fileindex/folder_mgr.h"
+#include "fileindex/state/folder_mgr.h"
 #include "tests/support/sandbox.h"
 
 namespace corvlumex {

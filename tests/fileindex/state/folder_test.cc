@@ -5,8 +5,8 @@
 
 #include "common/error.h"
 #include "common/json_util.h"
-#include "fileindex/folder.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/state/folder.h"
+#include "fileindex/state/status_mgr.h"
 #include "tests/support/sandbox.h"
 
 namespace corvlumex {

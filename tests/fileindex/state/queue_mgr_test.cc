@@ -8,9 +8,9 @@
 #include "common/error.h"
 #include "common/file_util.h"
 #include "common/json_util.h"
-#include "fileindex/event.h"
-#include "fileindex/optree.h"
-#include "fileindex/queue_mgr.h"
+#include "fileindex/queue/event.h"
+#include "fileindex/queue/optree.h"
+#include "fileindex/queue/queue_mgr.h"
 #include "tests/support/sandbox.h"
 
 namespace corvlumex {

@@ -14,12 +14,12 @@
 #include "common/json_util.h"
 #include "common/lock_file.h"
 #include "common/sys.h"
-#include "fileindex/constants.h"
-#include "fileindex/custom_event.h"
-#include "fileindex/event.h"
-#include "fileindex/folder_mgr.h"
-#include "fileindex/optree.h"
-#include "fileindex/queue_mgr.h"
+#include "fileindex/queue/custom_event.h"
+#include "fileindex/queue/event.h"
+#include "fileindex/queue/optree.h"
+#include "fileindex/queue/queue_mgr.h"
+#include "fileindex/state/constants.h"
+#include "fileindex/state/folder_mgr.h"
 #include "tests/support/sandbox.h"
 
 namespace corvlumex {

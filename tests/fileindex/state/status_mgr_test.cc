@@ -13,8 +13,8 @@
 #include "common/file_util.h"
 #include "common/json_util.h"
 #include "common/sys.h"
-#include "fileindex/constants.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/state/constants.h"
+#include "fileindex/state/status_mgr.h"
 #include "tests/support/sandbox.h"
 
 namespace corvlumex {

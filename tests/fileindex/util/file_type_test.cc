@@ -4,7 +4,7 @@
 #include <cctype>
 #include <set>
 
-#include "fileindex/file_type.h"
+#include "fileindex/paths/file_type.h"
 
 namespace corvlumex {
 namespace fileindex {

@@ -6,9 +6,10 @@
 
 #include "common/error.h"
 #include "common/file_util.h"
-#include "fileindex/util.h"
-#include "tests/support/sandbox.h"
+#include "fileindex/paths/path_rules.h"
+#include "tests/support/expect_error.h"
 #include "tests/support/fake_platform.h"
+#include "tests/support/sandbox.h"
 
 namespace corvlumex {
 namespace fileindex {

@@ -9,9 +9,9 @@
 #include <stdexcept>
 
 #include "common/error.h"
+#include "common/frame.h"
+#include "common/frame_reader.h"
 #include "common/json_util.h"
-#include "fileindex/communication.h"
-#include "fileindex/frame_reader.h"
 
 namespace corvlumex {
 namespace elasticd_test {
@@ -102,13 +102,13 @@ int Daemon::Terminate() {
 Json::Value Exchange(int fd, const Json::Value& request) {
   signal(SIGPIPE, SIG_IGN);
   try {
-    fileindex::WriteFrame(fd, JsonToString(request));
+    WriteFrame(fd, JsonToString(request));
   } catch (const Error&) {
     // A refused connection is answered and closed before it is read.
   }
   std::string text;
   Json::Value answer;
-  if (fileindex::ReadFrameBounded(fd, 1u << 30, 20000, 20000, &text) != fileindex::FrameStatus::kOk || !JsonFromString(answer, text)) {
+  if (ReadFrameBounded(fd, 1u << 30, 20000, 20000, &text) != FrameStatus::kOk || !JsonFromString(answer, text)) {
     throw std::runtime_error("no JSON answer: \"" + text + "\"");
   }
   return answer;

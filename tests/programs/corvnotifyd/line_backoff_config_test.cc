@@ -7,7 +7,7 @@
 #include <vector>
 
 #include "common/json_util.h"
-#include "fileindex/event.h"
+#include "fileindex/queue/event.h"
 #include "programs/corvnotifyd/crash_backoff.h"
 #include "programs/corvnotifyd/event_line.h"
 #include "programs/corvnotifyd/loss_advice.h"

@@ -11,7 +11,7 @@
 
 #include "common/error.h"
 #include "common/json_util.h"
-#include "fileindex/event.h"
+#include "fileindex/queue/event.h"
 
 namespace corvlumex {
 namespace testing_support {

@@ -17,7 +17,7 @@
 
 #include <gtest/gtest.h>
 
-#include "fileindex/event.h"
+#include "fileindex/queue/event.h"
 #include "platform/linux/notifier_presence.h"
 #include "tests/programs/corvnotifyd/notifyd_harness.h"
 

@@ -8,7 +8,8 @@
 #include <fstream>
 
 #include "common/json_util.h"
-#include "fileindex/custom_event.h"
+#include "fileindex/queue/custom_event.h"
+#include "tests/support/log_capture.h"
 #include "tests/support/sandbox.h"
 
 namespace corvlumex {

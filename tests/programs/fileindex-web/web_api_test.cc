@@ -10,8 +10,8 @@
 #include <filesystem>
 
 #include "common/json_util.h"
-#include "fileindex/index_mgr.h"
-#include "fileindex/status_mgr.h"
+#include "fileindex/mgmt/index_mgr.h"
+#include "fileindex/state/status_mgr.h"
 #include "tests/programs/fileindex-web/web_harness.h"
 
 namespace corvlumex {

@@ -16,18 +16,20 @@
 
 #include "common/error.h"
 #include "common/file_util.h"
+#include "common/frame_reader.h"
 #include "common/json_util.h"
-#include "fileindex/folder_mgr.h"
+#include "fileindex/state/folder_mgr.h"
 #include "programs/fileindexd/batch_mark.h"
 #include "programs/fileindexd/command_server.h"
 #include "programs/fileindexd/folder_walker.h"
 #include "programs/fileindexd/index_rules.h"
 #include "programs/fileindexd/progress.h"
 #include "programs/fileindexd/settle_tracker.h"
-#include "fileindex/frame_reader.h"
+#include "programs/fileindexd/suggestion_schedule.h"
 #include "tests/support/child_process.h"
 #include "tests/support/frame_client.h"
 #include "programs/fileindexd/suggestion_schedule.h"
+#include "tests/support/log_capture.h"
 #include "tests/support/sandbox.h"
 
 namespace corvlumex {
@@ -247,7 +249,7 @@ TEST_F(CommandSocketTest, HostileFramesAreAnsweredAndNoClientHoldsUpAnother) {
   EXPECT_EQ(CodeOf(status), 0);
   ASSERT_EQ(write(slow[0], status.data() + 6, status.size() - 6), static_cast<ssize_t>(status.size() - 6));
   std::string answer;
-  EXPECT_EQ(fileindex::ReadFrameBounded(slow[0], 1u << 20, 20000, 20000, &answer), fileindex::FrameStatus::kOk);
+  EXPECT_EQ(ReadFrameBounded(slow[0], 1u << 20, 20000, 20000, &answer), FrameStatus::kOk);
   EXPECT_NE(answer.find("\"success\":true"), std::string::npos) << answer;
   for (const int fd : slow) close(fd);
 }

@@ -12,8 +12,9 @@
 
 #include "common/error.h"
 #include "fileindex/elastic/daemon_codes.h"
-#include "fileindex/folder_mgr.h"
-#include "fileindex/optree.h"
+#include "fileindex/queue/optree.h"
+#include "fileindex/state/folder_mgr.h"
+#include "platform/linux/linux_platform.h"
 #include "tests/support/fake_platform.h"
 #include "programs/fileindexd/fresh_lane.h"
 #include "programs/fileindexd/index_rules.h"

@@ -13,8 +13,8 @@
 #include <vector>
 
 #include "common/error.h"
+#include "common/frame_reader.h"
 #include "common/json_util.h"
-#include "fileindex/frame_reader.h"
 #include "platform/linux/extract/document_fields.h"
 #include "platform/linux/extract/worker_client.h"
 #include "platform/linux/extract/worker_protocol.h"
@@ -257,7 +257,7 @@ TEST_F(WorkerTest, BadRequestsAreAnsweredAndACutOneEndsTheWorkerCleanly) {
     EXPECT_EQ(static_cast<ssize_t>(frame.size()), write(library, frame.data(), frame.size()));
     std::string text;
     Json::Value reply;
-    if (fileindex::ReadFrameBounded(library, MaxReplyBytes(kTextContentCap), 20000, 20000, &text) != fileindex::FrameStatus::kOk ||
+    if (ReadFrameBounded(library, MaxReplyBytes(kTextContentCap), 20000, 20000, &text) != FrameStatus::kOk ||
         !JsonFromString(reply, text)) {
       ADD_FAILURE() << "no reply to " << frame << "; " << testing_support::ReadFileText(PathOf("worker.log"));
     }
