@@ -18,11 +18,11 @@
 
 #include "common/error.h"
 #include "common/log.h"
+#include "common/stop_signals.h"
 #include "common/sys.h"
 #include "platform/linux/config_files.h"
 #include "platform/linux/notifier_presence.h"
 #include "programs/corvnotifyd/notifier.h"
-#include "programs/daemon_support/stop_signals.h"
 
 namespace {
 

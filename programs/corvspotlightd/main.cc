@@ -11,12 +11,12 @@
 #include <CLI/CLI.hpp>
 #include <cstdio>
 
-#include "common/log.h"
 #include "common/index_fields.h"
+#include "common/log.h"
+#include "common/stop_signals.h"
 #include "fileindex/elastic/schema.h"
 #include "programs/corvspotlightd/http_listener.h"
 #include "programs/corvspotlightd/search_handler.h"
-#include "programs/daemon_support/stop_signals.h"
 
 namespace {
 
