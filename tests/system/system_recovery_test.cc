@@ -84,9 +84,13 @@ TEST(SystemRecoveryTest, CommandLineFoldersSearchAndPausesOfTheIndexerAndOfAShar
   // A file whose content cannot be read is still found by name, and listed with the reason.
   WriteText(box.Path("docs/broken.pdf"), "%PDF-1.4 not really a PDF");
   ASSERT_TRUE(PollUntil([&] { return box.Search("broken").size() == 1; }, std::chrono::seconds(30)));
-  CliResult failed = RunCli({"failed"});
+  // The file may be indexed first as created (empty), then as written.
+  CliResult failed;
+  EXPECT_TRUE(PollUntil(
+      [&] { return (failed = RunCli({"failed"})).out.find(box.Path("docs/broken.pdf")) != std::string::npos; },
+      std::chrono::seconds(30)))
+      << failed.out;
   EXPECT_EQ(failed.status, 0) << failed.err;
-  EXPECT_NE(failed.out.find(box.Path("docs/broken.pdf")), std::string::npos) << failed.out;
   EXPECT_NE(failed.out.find("1 file(s)"), std::string::npos) << failed.out;
   CliResult other_share = RunCli({"search", "saffron", "--share", "nosuch"});
   EXPECT_NE(other_share.status, 0);
@@ -96,8 +100,11 @@ TEST(SystemRecoveryTest, CommandLineFoldersSearchAndPausesOfTheIndexerAndOfAShar
   ASSERT_TRUE(JsonFromString(page, extracted.out)) << extracted.err;
   EXPECT_NE(page["CORVMDTextContent"].asString().find("paella"), std::string::npos);
 
-  CliResult listed = RunCli({"--json", "folder", "list"});
-  EXPECT_NE(listed.out.find("\"finished\""), std::string::npos) << listed.out;
+  CliResult listed;
+  EXPECT_TRUE(PollUntil(
+      [&] { return (listed = RunCli({"--json", "folder", "list"})).out.find("\"finished\"") != std::string::npos; },
+      std::chrono::seconds(30)))
+      << listed.out;
   // Errors carry their code and reason, with a non-zero exit.
   CliResult missing = RunCli({"folder", "get", "/share/nothing"});
   EXPECT_NE(missing.status, 0);
