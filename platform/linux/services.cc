@@ -16,6 +16,7 @@
 #include "common/sys.h"
 #include "platform/linux/config_files.h"
 #include "platform/linux/linux_platform.h"
+#include "platform/linux/samba_reload.h"
 
 namespace corvlumex {
 namespace platform {
@@ -90,15 +91,16 @@ int LinuxPlatform::ServiceStop(const std::string& name, bool wait) { return Requ
 
 // Samba reads a changed configuration on a reload; a restart would drop
 // every connected SMB client. systemd's reload of smbd only signals the
-// parent process, so on a plain host smbcontrol tells every smbd process.
+// parent process, so on a plain host smbcontrol tells every smbd process;
+// either way Samba's RPC workers are told too (samba_reload.h).
 int LinuxPlatform::ServiceRestart(const std::string& name) {
   if (UnitName(name) != kSambaUnit) return RequestService(this, "restart", name, true);
-  if (ServiceCommand() != kSystemctl) return RequestService(this, "reload", name, true);
-  // Its words ("Can't find pid ...") would land on whatever terminal started
-  // the daemon; the failure is logged with its status instead.
-  return ServiceResult(Exec("smbcontrol", {"smbd", "reload-config"},
-                            kExecDefault | kExecSearchPath | kExecNullStdout | kExecNullStderr),
-                       "smbcontrol smbd reload-config");
+  const std::string command = ServiceCommand();
+  if (command == kSystemctl) return ReloadSamba(this, std::string());
+  if (RequestService(this, "reload", name, true) < 0) return -1;
+  // Recorded only (a sandbox): no real Samba to tell.
+  if (!command.empty()) ReloadSambaRpcWorkers(std::string());
+  return 0;
 }
 
 int LinuxPlatform::ServicectlStart(const std::string& job, int type) {

@@ -2,17 +2,26 @@
 // configuration of the Linux platform.
 #include <gtest/gtest.h>
 #include <fcntl.h>
+#include <signal.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
+#include <chrono>
 #include <cstdlib>
+#include <filesystem>
 #include <fstream>
+#include <map>
+#include <memory>
 #include <sstream>
+#include <vector>
 
 #include "common/file_util.h"
 #include "common/json_util.h"
 #include "platform/linux/linux_platform.h"
+#include "platform/linux/samba_reload.h"
+#include "tests/support/child_process.h"
+#include "tests/support/log_capture.h"
 #include "tests/support/sandbox.h"
 
 namespace corvlumex {
@@ -102,6 +111,61 @@ TEST_F(ServicesTest, SambaIsReloadedNeverRestarted) {
   ScopedEnv command("CORVLUMEX_SERVICE_COMMAND", RecordingCommand(0));
   EXPECT_EQ(platform_.ServiceRestart("samba"), 0);
   EXPECT_EQ(ReadAll(root_.path() + "/asked"), "smbcontrol smbd reload-config\nreload smbd.service\n");
+}
+
+// Samba's RPC workers (rpcd_mdssvc answers Finder) keep the configuration
+// they started with through smbd's reload; only a SIGHUP makes them read it
+// again. The stand-ins are copies of the shell that say "up", then wait on
+// their input: with a SIGHUP handler (as a running worker has) they say
+// "reloaded" when told; without one (a worker still starting) a SIGHUP would
+// end them.
+TEST_F(ServicesTest, SambaRpcWorkersOfTheConfigurationAreSignalledToReload) {
+  namespace fs = std::filesystem;
+  const std::string samba = root_.path() + "/libexec/samba";
+  const std::string elsewhere = root_.path() + "/home/someone";
+  fs::create_directories(samba);
+  fs::create_directories(elsewhere);
+  fs::copy_file("/bin/sh", samba + "/samba-dcerpcd");
+  fs::copy_file("/bin/sh", samba + "/rpcd_mdssvc");
+  fs::copy_file("/bin/sh", elsewhere + "/rpcd_mdssvc");  // a user's own program of the same name
+  const std::string config = root_.path() + "/smb.conf";
+  const std::string handler = "trap 'echo reloaded' HUP; ";
+  int input[2];
+  ASSERT_EQ(pipe2(input, O_CLOEXEC), 0);  // only the workers' standard input stays open in them
+  const struct {
+    std::string program;
+    std::string config;
+    std::string script;
+    std::string said;
+  } cases[] = {
+      {samba + "/rpcd_mdssvc", config, handler, "up\nreloaded\n"},
+      {samba + "/rpcd_mdssvc", root_.path() + "/another.conf", handler, "up\n"},
+      {samba + "/rpcd_mdssvc", config, "", "up\n"},
+      {elsewhere + "/rpcd_mdssvc", config, handler, "up\n"},
+  };
+  std::vector<std::unique_ptr<testing_support::ChildProcess>> workers;
+  std::vector<std::string> logs;
+  for (const auto& worker : cases) {
+    logs.push_back(root_.path() + "/worker" + std::to_string(logs.size()) + ".log");
+    workers.push_back(std::make_unique<testing_support::ChildProcess>(
+        worker.program,
+        std::vector<std::string>{"-c", worker.script + "echo up; read line; read line; true", "rpcd_mdssvc",
+                                 "--configfile=" + worker.config},
+        logs.back(), std::map<std::string, std::string>{}, input[0]));
+  }
+  close(input[0]);
+  for (const std::string& log : logs) {
+    ASSERT_TRUE(testing_support::PollUntil([&] { return testing_support::ReadFileText(log) == "up\n"; },
+                                           std::chrono::seconds(30)))
+        << log;
+  }
+  EXPECT_EQ(SambaRpcWorkers(config).size(), 2u);
+  EXPECT_EQ(ReloadSambaRpcWorkers(config), 1u);
+  close(input[1]);
+  for (size_t i = 0; i < workers.size(); ++i) {
+    EXPECT_EQ(workers[i]->Wait(), 0) << cases[i].program;
+    EXPECT_EQ(testing_support::ReadFileText(logs[i]), cases[i].said) << i;
+  }
 }
 
 TEST_F(ServicesTest, ExecRunsWithoutAShell) {

@@ -269,8 +269,21 @@ std::string FindWorkerProgram() {
   char self[4096];
   const ssize_t length = readlink("/proc/self/exe", self, sizeof(self) - 1);
   if (length > 0) {
-    const std::string beside = Dirname(std::string(self, static_cast<size_t>(length))) + "/" + kWorkerProgram;
+    const std::string folder = Dirname(std::string(self, static_cast<size_t>(length)));
+    const std::string beside = folder + "/" + kWorkerProgram;
     if (IsExecutable(beside)) return beside;
+    // A program started by hand (or by a test binary run without ctest) from
+    // a build tree: each program has its own folder there, so "beside" finds
+    // nothing, and without a worker every file but UTF-8 plain text would
+    // silently lose its content and media type. The build's top folder is
+    // the one holding CMakeCache.txt, which no installed layout has.
+    std::string top = folder;
+    for (int level = 0; level < 6 && top.size() > 1; ++level, top = Dirname(top)) {
+      if (!IsFileExist(top + "/CMakeCache.txt")) continue;
+      const std::string built = top + "/programs/" + kWorkerProgram + "/" + kWorkerProgram;
+      if (IsExecutable(built)) return built;
+      break;
+    }
   }
   const std::string installed = SysPath(kWorkerInstallPath);
   errno = 0;

@@ -29,8 +29,10 @@ ExtractLimits CurrentExtractLimits();
 
 // The worker program: $CORVLUMEX_EXTRACT_WORKER, else the one built in
 // $FILEINDEX_BUILD_DIR (test runs), else corvcontentextractd beside the
-// running program, else the package's install path (under the system root).
-// Empty when none is executable.
+// running program, else the one of the build tree the running program lies
+// in (up to five folders up, the one holding CMakeCache.txt), else the
+// package's install path (under the system root). Empty when none is
+// executable.
 std::string FindWorkerProgram();
 
 // Extracts the content fields of the regular file open on `fd` (its full

@@ -27,6 +27,7 @@
 #include <string>
 
 #include "common/sys.h"
+#include "platform/linux/samba_reload.h"
 #include "platform/platform.h"
 #include "tests/support/child_process.h"
 #include "tests/system/system_harness.h"
@@ -309,18 +310,19 @@ TEST_F(SpotlightSambaTest, MdsearchFindsWhatAScanOfTheTreeFinds) {
         return sessions.find(user_) != std::string::npos;
       },
       std::chrono::seconds(20)));
-  const std::string reload = "smbcontrol --configfile=" + config_ + " smbd reload-config";
+  // The product's own reload, told this Samba's configuration file.
+  const auto reload = [&] { return platform::ReloadSamba(platform::Current().get(), config_); };
   const std::string name_query = "kMDItemFSName==\"report*\"";
   const std::set<std::string> named = MdSearch(name_query);
   ASSERT_EQ(platform::Current()->SMBSetSpotlight(false), 0) << platform::LastError().message;
-  ASSERT_EQ(RunShell(reload), 0);
+  ASSERT_EQ(reload(), 0) << platform::LastError().message;
   std::string refused;
   RunShell("mdsearch --configfile=" + config_ + " -U " + user_ + "%" + kPassword + " //127.0.0.1 share '" +
                name_query + "'",
            &refused);
   for (const std::string& path : named) EXPECT_EQ(refused.find(path), std::string::npos) << refused;
   ASSERT_EQ(platform::Current()->SMBSetSpotlight(true), 0) << platform::LastError().message;
-  ASSERT_EQ(RunShell(reload), 0);
+  ASSERT_EQ(reload(), 0) << platform::LastError().message;
   EXPECT_EQ(MdSearch(name_query), named);
   fputs("ls\nexit\n", held);
   EXPECT_EQ(pclose(held), 0) << ReadFileText(held_output);

@@ -157,6 +157,27 @@ TEST_F(WorkerTest, EveryFormatWholeGivesItsFieldsAndTruncatedOrGarbageFailsAlone
   }
 }
 
+// Text gets the same media type and words whichever process reads it: the
+// indexer itself (a plain-text extension) or the worker (any other name, by
+// its content); Samba's "public.plain-text" searches find files by that
+// type. Run as a program started by hand from the build tree (no ctest
+// variables), whose worker is not beside it.
+TEST_F(WorkerTest, TextFilesGetTheirTypeAndWordsWhereverTheyAreRead) {
+  const std::string build = std::getenv("FILEINDEX_BUILD_DIR");
+  unsetenv("FILEINDEX_BUILD_DIR");
+  unsetenv("CORVLUMEX_EXTRACT_WORKER");
+  StopIdleExtractWorkers();
+  mkdir(PathOf("empty folder").c_str(), 0755);
+  for (const char* name : {"notes.txt", "notes.md", "empty folder/readme", "README", "notes.dat"}) {
+    SCOPED_TRACE(name);
+    WriteBytes(PathOf(name), "plain words without an extension\n");
+    const Json::Value document = Parse(name);
+    EXPECT_EQ("text/plain", document[kFieldMediaTypes].asString()) << JsonToString(document);
+    EXPECT_EQ("plain words without an extension", document[kFieldTextContent].asString());
+  }
+  setenv("FILEINDEX_BUILD_DIR", build.c_str(), 1);
+}
+
 TEST_F(WorkerTest, HostileContainersAndMarkupAreRefusedNotExpanded) {
   // A part that unpacks to 70 MiB from a few hundred KiB.
   testing_support::MakeZip(PathOf("bomb.docx"), {{"word/document.xml", std::string(70u << 20, ' ')}});
