@@ -11,6 +11,7 @@
 
 #include "common/error.h"
 #include "common/frame.h"
+#include "common/frame_reader.h"
 #include "common/json_util.h"
 #include "common/log.h"
 #include "common/sys.h"
@@ -140,14 +141,11 @@ bool SockConnection::Send(const std::string& text) {
   return true;
 }
 
-bool SockConnection::Recv(std::string& text) {
-  if (fd_ < 0 || !corvlumex::WaitForFrame(fd_)) return false;
-  try {
-    text = corvlumex::ReadFrame(fd_);
-  } catch (const corvlumex::Error&) {
-    return false;
-  }
-  return true;
+bool SockConnection::Recv(std::string& text, int stall_ms) {
+  // Answers are bounded only by what a request may ask for (whole documents, long listings).
+  constexpr size_t kMaxAnswerBytes = size_t{1} << 30;
+  if (fd_ < 0) return false;
+  return corvlumex::ReadFrameBounded(fd_, kMaxAnswerBytes, -1, stall_ms, &text) == corvlumex::FrameStatus::kOk;
 }
 
 DomainSockConnection::DomainSockConnection(const std::string& path) : path_(path) {}

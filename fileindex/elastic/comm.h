@@ -44,9 +44,14 @@ class SockConnection {
   SockConnection& operator=(const SockConnection&) = delete;
 
   // One frame each way. A peer that has gone away makes Send fail; it does
-  // not kill a caller that leaves SIGPIPE at its default.
+  // not kill a caller that leaves SIGPIPE at its default. Recv waits as long
+  // as the answer takes to begin (a search may be slow), but once it has
+  // begun, a pause of `stall_ms` fails it: a peer killed in the middle of its
+  // answer can leave the socket open through another holder, and the caller
+  // must not wait for ever on an answer nobody will finish.
+  static constexpr int kAnswerStallMs = 30000;
   bool Send(const std::string& text);
-  bool Recv(std::string& text);
+  bool Recv(std::string& text, int stall_ms = kAnswerStallMs);
 
  protected:
   SockConnection() = default;
