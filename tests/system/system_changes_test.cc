@@ -143,7 +143,9 @@ TEST_F(SystemChangesTest, EveryKindOfChangeReachesTheSearch) {
     step.change();
     ASSERT_EQ(box_.Converge(Docs()), "");
     for (const auto& [words, paths] : step.finds) EXPECT_TRUE(Finds(words, paths));
-    if (step.holds) EXPECT_TRUE(PollUntil(step.holds, std::chrono::seconds(30))) << box_.Logs();
+    if (step.holds) {
+      EXPECT_TRUE(PollUntil(step.holds, std::chrono::seconds(30))) << box_.Logs();
+    }
   }
 }
 

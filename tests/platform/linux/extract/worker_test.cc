@@ -151,7 +151,9 @@ TEST_F(WorkerTest, EveryFormatWholeGivesItsFieldsAndTruncatedOrGarbageFailsAlone
       const std::string name = "cut" + std::to_string(cut) + "." + format.ext;
       Truncate(PathOf(whole), PathOf(name), cut);
       const Json::Value document = ParsedOrFailed(name);
-      if (!document.isNull()) EXPECT_EQ(PathOf(name), document[kFieldPath].asString());
+      if (!document.isNull()) {
+        EXPECT_EQ(PathOf(name), document[kFieldPath].asString());
+      }
     }
     const std::string garbage = std::string("garbage.") + format.ext;
     WriteBytes(PathOf(garbage), noise);
