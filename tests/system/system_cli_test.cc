@@ -12,7 +12,7 @@
 #include <sstream>
 
 #include "common/json_util.h"
-#include "tests/system/cli_runner.h"
+#include "fileindex/state/communication.h"
 #include "tests/system/system_harness.h"
 
 namespace corvlumex {
@@ -31,6 +31,27 @@ std::string FolderFile(const SystemSandbox& box) {
 
 std::string StatusFile(const SystemSandbox& box) {
   return ReadFileText(box.root() + "/var/packages/CorvLumex/etc/fileindex.status");
+}
+
+// Runs `args`: it succeeds (or fails, as `ok` says) and prints each of
+// `texts` on its standard output.
+::testing::AssertionResult Prints(const std::vector<std::string>& args, bool ok,
+                                  const std::vector<std::string>& texts) {
+  const CliResult r = RunCli(args);
+  if ((r.status == 0) != ok) return ::testing::AssertionFailure() << "exit " << r.status << r.err;
+  for (const std::string& text : texts) {
+    if (r.out.find(text) == std::string::npos) return ::testing::AssertionFailure() << r.out;
+  }
+  return ::testing::AssertionSuccess();
+}
+
+// Runs `args`: it fails, and says `text` on its standard error.
+::testing::AssertionResult Complains(const std::vector<std::string>& args,
+                                     const std::string& text) {
+  const CliResult r = RunCli(args);
+  if (r.status == 0) return ::testing::AssertionFailure() << "exit 0: " << r.out;
+  if (r.err.find(text) == std::string::npos) return ::testing::AssertionFailure() << r.err;
+  return ::testing::AssertionSuccess();
 }
 
 // Each refusal exits non-zero, names the problem, and leaves the folder and
@@ -86,14 +107,11 @@ TEST(SystemCliTest, BadArgumentsAreRefusedWithWhatToDoAndChangeNothing) {
   });
 
   // What was done is said; a second pause says it found the share paused.
-  const CliResult paused = RunCli({"share", "pause", "share"});
-  EXPECT_EQ(paused.status, 0) << paused.err;
-  EXPECT_NE(paused.out.find("share share paused"), std::string::npos) << paused.out;
-  EXPECT_NE(RunCli({"share", "pause", "share"}).out.find("was already paused"), std::string::npos);
-  const CliResult volume = RunCli({"volume", "pause", fs::path(box.share_dir()).parent_path().string()});
-  EXPECT_EQ(volume.status, 0) << volume.err;
-  EXPECT_NE(volume.out.find("paused the shares on"), std::string::npos) << volume.out;
-  EXPECT_EQ(RunCli({"volume", "resume", fs::path(box.share_dir()).parent_path().string()}).status, 0);
+  EXPECT_TRUE(Prints({"share", "pause", "share"}, true, {"share share paused"}));
+  EXPECT_TRUE(Prints({"share", "pause", "share"}, true, {"was already paused"}));
+  const std::string volume = fs::path(box.share_dir()).parent_path().string();
+  EXPECT_TRUE(Prints({"volume", "pause", volume}, true, {"paused the shares on"}));
+  EXPECT_EQ(RunCli({"volume", "resume", volume}).status, 0);
   EXPECT_EQ(RunCli({"share", "resume", "share"}).status, 0);
 
   // A user who is not root is told so, and nothing is queued.
@@ -119,33 +137,22 @@ TEST(SystemCliTest, CommandsThatNeedADaemonThatIsDownChangeNothingAndSayHowToSta
       {{"pause"}, {start}},
       {{"share", "pause", "share"}, {start}},
   });
-  const CliResult status = RunCli({"status"});
-  EXPECT_NE(status.status, 0);
-  EXPECT_NE(status.out.find("fileindexd: NOT RUNNING (start it with systemctl start pkg-CorvLumex-fileindexd)"),
-            std::string::npos)
-      << status.out;
-  EXPECT_NE(status.out.find("corvelasticd: running"), std::string::npos) << status.out;
+  EXPECT_TRUE(Prints({"status"}, false, {"fileindexd: NOT RUNNING (start it with systemctl start "
+                                         "pkg-CorvLumex-fileindexd)", "corvelasticd: running"}));
 }
 
 TEST(SystemCliTest, SearchWithTheSearchDaemonDownSaysWhichDaemonAndHowToStartIt) {
   SystemSandbox box;  // no daemon started
   for (const std::vector<std::string>& args : {std::vector<std::string>{"search", "saffron"},
                                                 std::vector<std::string>{"suggest", "saf"}}) {
-    const CliResult result = RunCli(args);
-    EXPECT_NE(result.status, 0);
-    EXPECT_NE(result.err.find("corvelasticd is not running: start it with systemctl start corvelasticd"),
-              std::string::npos)
-        << result.err;
+    EXPECT_TRUE(
+        Complains(args, "corvelasticd is not running: start it with systemctl start corvelasticd"));
   }
   setenv("FILEINDEX_START_COMMAND", "scripts/run start", 1);
-  const CliResult status = RunCli({"status"});
+  const std::string start = ": NOT RUNNING (start it with scripts/run start)";
+  EXPECT_TRUE(Prints({"status"}, false,
+                     {"corvelasticd" + start, "corvnotifyd" + start, "fileindexd" + start}));
   unsetenv("FILEINDEX_START_COMMAND");
-  EXPECT_NE(status.status, 0);
-  for (const char* daemon : {"corvelasticd", "corvnotifyd", "fileindexd"}) {
-    EXPECT_NE(status.out.find(std::string(daemon) + ": NOT RUNNING (start it with scripts/run start)"),
-              std::string::npos)
-        << status.out;
-  }
 }
 
 TEST(SystemCliTest, StatusCountsTheIndexAndSaysWhatTheIndexerDoes) {
@@ -170,10 +177,9 @@ TEST(SystemCliTest, StatusCountsTheIndexAndSaysWhatTheIndexerDoes) {
   for (const char* daemon : {"corvelasticd", "corvnotifyd", "fileindexd"}) {
     EXPECT_TRUE(status["daemons"][daemon]["running"].asBool()) << daemon;
   }
-  const CliResult text = RunCli({"status"});
-  EXPECT_NE(text.out.find("indexing: on (not paused)"), std::string::npos) << text.out;
+  EXPECT_TRUE(Prints({"status"}, true, {"indexing: on (not paused)"}));
   ASSERT_EQ(RunCli({"pause"}).status, 0);
-  EXPECT_NE(RunCli({"status"}).out.find("indexing: paused until resumed (fileindex resume)"), std::string::npos);
+  EXPECT_TRUE(Prints({"status"}, true, {"indexing: paused until resumed (fileindex resume)"}));
   ASSERT_EQ(RunCli({"resume"}).status, 0);
 
   // A name's or a content's escape sequence reaches no terminal through a search.
@@ -248,31 +254,112 @@ TEST(SystemCliTest, TheRunCommandAddsSharesBesideThoseAlreadyIndexed) {
   EXPECT_EQ(AddShareAsTheRunCommandDoes(box.root() + "/volume3/docs", 1), "");   // a second "docs" is refused
   EXPECT_EQ(AddShareAsTheRunCommandDoes(box.root() + "/volume3/notes"), "notes");
   // The folder of the first share still has its share: folder commands work.
-  const CliResult listed = RunCli({"folder", "list"});
-  EXPECT_EQ(listed.status, 0) << listed.err;
-  EXPECT_NE(listed.out.find("/share/docs"), std::string::npos) << listed.out;
-  const CliResult added = RunCli({"folder", "add", "/notes"});
-  EXPECT_EQ(added.status, 0) << added.err;
-  const CliResult shares = RunCli({"share", "list"});
-  for (const char* name : {"share ", "docs ", "notes "}) EXPECT_NE(shares.out.find(name), std::string::npos) << shares.out;
+  EXPECT_TRUE(Prints({"folder", "list"}, true, {"/share/docs"}));
+  EXPECT_TRUE(Prints({"folder", "add", "/notes"}, true, {}));
+  EXPECT_TRUE(Prints({"share", "list"}, true, {"share ", "docs ", "notes "}));
 
   // A registry that lost an indexed share (what rewriting it used to do):
   // the error names the share instead of an empty reason.
   ShareRegistry(box.root()).Add("docs", box.root() + "/volume2/docs");  // the only share now
-  const CliResult broken = RunCli({"folder", "list"});
-  EXPECT_NE(broken.status, 0);
-  EXPECT_NE(broken.err.find("shares the share registry no longer lists: notes, share"), std::string::npos) << broken.err;
+  EXPECT_TRUE(
+      Complains({"folder", "list"}, "shares the share registry no longer lists: notes, share"));
+}
+
+TEST(SystemCliTest, FoldersSearchAndPausesOfTheIndexerAndOfAShare) {
+  SystemSandbox box;
+  fs::create_directories(box.Path("docs"));
+  WriteText(box.Path("docs/menu.txt"), "saffron paella");
+  box.StartAll();
+  CliResult added = RunCli({"folder", "add", "/share/docs", "--wait", "--timeout", "60"});
+  ASSERT_EQ(added.status, 0) << added.err;
+  EXPECT_TRUE(Prints({"search", "saffron"}, true, {box.Path("docs/menu.txt")}));
+  // Paging and the share filter, as scripts read them.
+  WriteText(box.Path("docs/menu2.txt"), "saffron risotto");
+  ASSERT_TRUE(PollUntil([&] { return box.Search("saffron").size() == 2; }, std::chrono::seconds(30)));
+  Json::Value page;
+  CliResult second = RunCli({"--json", "search", "saffron", "--share", "share", "--size", "1", "--from", "1"});
+  ASSERT_TRUE(JsonFromString(page, second.out)) << second.out << second.err;
+  EXPECT_EQ(page["total"].asInt(), 2);
+  EXPECT_EQ(page["hits"].size(), 1u);
+  CliResult by_name = RunCli({"--json", "search", "menu2", "--name"});
+  ASSERT_TRUE(JsonFromString(page, by_name.out)) << by_name.out;
+  ASSERT_EQ(page["hits"].size(), 1u);
+  EXPECT_EQ(page["hits"][0]["fields"]["CORVMDPath"].asString(), box.Path("docs/menu2.txt"));
+  // Words as separate arguments, options before or after them; a phrase keeps its order.
+  for (const std::vector<std::string>& args :
+       {std::vector<std::string>{"--json", "search", "--share", "share", "saffron", "paella"},
+        std::vector<std::string>{"--json", "search", "saffron", "paella", "--share", "share"},
+        std::vector<std::string>{"--json", "search", "\"saffron paella\""}}) {
+    CliResult words = RunCli(args);
+    ASSERT_TRUE(JsonFromString(page, words.out)) << words.out << words.err;
+    ASSERT_EQ(page["hits"].size(), 1u) << words.out;
+    EXPECT_EQ(page["hits"][0]["fields"]["CORVMDPath"].asString(), box.Path("docs/menu.txt"));
+  }
+  ASSERT_TRUE(JsonFromString(page, RunCli({"--json", "search", "\"paella saffron\""}).out));
+  EXPECT_EQ(page["total"].asInt(), 0);
+  EXPECT_TRUE(Complains({"search", "(saffron"}, "never closed"));
+  // The indexer keeps the name suggestions current by itself.
+  ASSERT_TRUE(PollUntil([&] { return RunCli({"suggest", "men"}).out.find("menu") != std::string::npos; },
+                        std::chrono::seconds(30)));
+  // A file whose content cannot be read is still found by name, and listed with the reason.
+  WriteText(box.Path("docs/broken.pdf"), "%PDF-1.4 not really a PDF");
+  ASSERT_TRUE(PollUntil([&] { return box.Search("broken").size() == 1; }, std::chrono::seconds(30)));
+  // The file may be indexed first as created (empty), then as written.
+  CliResult failed;
+  EXPECT_TRUE(PollUntil(
+      [&] { return (failed = RunCli({"failed"})).out.find(box.Path("docs/broken.pdf")) != std::string::npos; },
+      std::chrono::seconds(30)))
+      << failed.out;
+  EXPECT_EQ(failed.status, 0) << failed.err;
+  EXPECT_NE(failed.out.find("1 file(s)"), std::string::npos) << failed.out;
+  EXPECT_TRUE(Complains({"search", "saffron", "--share", "nosuch"}, "fileindex: error 2010"));
+  EXPECT_EQ(RunCli({"folder", "add", "--help"}).status, 0);
+  CliResult extracted = RunCli({"extract", box.Path("docs/menu.txt")});
+  ASSERT_TRUE(JsonFromString(page, extracted.out)) << extracted.err;
+  EXPECT_NE(page["CORVMDTextContent"].asString().find("paella"), std::string::npos);
+
+  CliResult listed;
+  EXPECT_TRUE(PollUntil(
+      [&] { return (listed = RunCli({"--json", "folder", "list"})).out.find("\"finished\"") != std::string::npos; },
+      std::chrono::seconds(30)))
+      << listed.out;
+  // Pause stops the indexing of new changes until resume.
+  ASSERT_EQ(RunCli({"pause"}).status, 0);
+  WriteText(box.Path("docs/later.txt"), "written while paused");
+  EXPECT_FALSE(PollUntil([&] { return !box.Search("paused").empty(); }, std::chrono::milliseconds(1500)));
+  ASSERT_EQ(RunCli({"resume"}).status, 0);
+  ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
+
+  // A paused share has no worker until it is resumed.
+  CliResult paused = RunCli({"share", "pause", "share"});
+  ASSERT_EQ(paused.status, 0) << paused.err;
+  Json::Value status;
+  ASSERT_TRUE(JsonFromString(status, box.IndexerStatus()));
+  EXPECT_EQ(status["shares"]["share"]["state"].asString(), "no worker");  // "worker_delete" was heard
+  WriteText(box.Path("docs/held.txt"), "held back while the share is paused");
+  EXPECT_FALSE(PollUntil([&] { return !box.Search("held").empty(); }, std::chrono::milliseconds(800)));
+  CliResult resumed = RunCli({"share", "resume", "share"});
+  ASSERT_EQ(resumed.status, 0) << resumed.err;
+  ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
+
+  // A pause with a resume time, as the status manager sends it for some
+  // hours, two seconds long here: it ends by itself.
+  Json::Value pause(Json::objectValue);
+  const auto resume_time = std::chrono::system_clock::now() + std::chrono::seconds(2);
+  pause["resume_time"] = static_cast<Json::Int64>(std::chrono::system_clock::to_time_t(resume_time));
+  fileindex::SendCommandToDaemon("pause", pause);
+  WriteText(box.Path("docs/queued.txt"), "waits for the pause to end");
+  EXPECT_FALSE(PollUntil([&] { return !box.Search("waits").empty(); }, std::chrono::milliseconds(800)));
+  EXPECT_NE(box.IndexerStatus().find("\"paused\""), std::string::npos);
+  ASSERT_EQ(box.Converge(box.DiskPaths("docs"), std::chrono::seconds(30)), "");
+  EXPECT_GE(std::chrono::system_clock::now(), resume_time - std::chrono::seconds(1));
 }
 
 TEST(SystemCliTest, VersionAndTheCommandsAlone) {
   const CliResult version = RunCli({"--version"});
   EXPECT_EQ(version.status, 0);
   EXPECT_EQ(version.out.rfind("fileindex ", 0), 0u) << version.out;
-  const CliResult alone = RunCli({});
-  EXPECT_EQ(alone.status, 0);
-  for (const char* command : {"folder", "status", "search", "share"}) {
-    EXPECT_NE(alone.out.find(command), std::string::npos) << alone.out;
-  }
+  EXPECT_TRUE(Prints({}, true, {"folder", "status", "search", "share"}));
 }
 
 }  // namespace

@@ -18,7 +18,6 @@
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/state/communication.h"
 #include "fileindex/state/status_mgr.h"
-#include "tests/system/cli_runner.h"
 #include "tests/system/system_harness.h"
 
 namespace corvlumex {
@@ -30,6 +29,25 @@ Json::Value ShareData() {
   Json::Value data(Json::objectValue);
   data["share_name"] = "share";
   return data;
+}
+
+// Creates /share/<folder> (if need be), starts the daemons (fileindexd with
+// `indexer_args`, corvnotifyd with `notifier_env`), adds the folder and
+// waits until it is indexed.
+void StartWithFolder(SystemSandbox& box, const std::string& folder,
+                     const std::vector<std::string>& indexer_args = {},
+                     const std::map<std::string, std::string>& notifier_env = {}) {
+  fs::create_directories(box.Path(folder));
+  box.StartAll(indexer_args, notifier_env);
+  box.AddFolder(folder);
+  ASSERT_EQ(box.Converge(box.DiskPaths(folder), std::chrono::seconds(60)), "");
+}
+
+// Polls until the share's live queue holds `text` (the notifier wrote it).
+bool QueueHolds(SystemSandbox& box, const std::string& text) {
+  const std::string queue = box.Path("@eaDir/fileindex.queue");
+  return PollUntil([&] { return ReadFileText(queue).find(text) != std::string::npos; },
+                   std::chrono::seconds(30));
 }
 
 // Waits until fileindexd reports a batch under way with some files done.
@@ -46,11 +64,7 @@ bool MidBatch(SystemSandbox& box) {
 
 TEST(SystemCrashTest, KillDuringALargeBatchThenRestartConverges) {
   SystemSandbox box;
-  fs::create_directories(box.Path("bulk"));
-  box.StartAll();
-  box.AddFolder("bulk");
-  ASSERT_EQ(box.Converge(box.DiskPaths("bulk")), "");
-
+  ASSERT_NO_FATAL_FAILURE(StartWithFolder(box, "bulk"));
   for (int dir = 0; dir < 10; ++dir) {
     fs::create_directories(box.Path("bulk/d" + std::to_string(dir)));
     for (int i = 0; i < 150; ++i) {
@@ -96,19 +110,16 @@ TEST(SystemCrashTest, AFolderRenameCutShortByACrashLeavesNoGhosts) {
   constexpr int kFiles = 400;
   fs::create_directories(box.Path("big/A"));
   for (int i = 0; i < kFiles; ++i) WriteText(box.Path("big/A/f" + std::to_string(i) + ".txt"), "moved " + std::to_string(i));
-  box.StartAll();
-  box.AddFolder("big");
-  ASSERT_EQ(box.Converge(box.DiskPaths("big"), std::chrono::seconds(60)), "");
-
+  ASSERT_NO_FATAL_FAILURE(StartWithFolder(box, "big"));
   box.StopIndexer(SIGKILL);
   const std::string queue = box.Path("@eaDir/fileindex.queue");
   ASSERT_EQ(rename(box.Path("big/A").c_str(), box.Path("big/B").c_str()), 0);
-  ASSERT_TRUE(PollUntil([&] { return ReadFileText(queue).find("/big/B") != std::string::npos; }, std::chrono::seconds(10)));
+  ASSERT_TRUE(QueueHolds(box, "/big/B"));
   // What the dead indexer had done: taken the queue over, moved half.
   ASSERT_EQ(rename(queue.c_str(), (queue + ".tmp").c_str()), 0);
   MoveDocuments(box.Path("big/A"), box.Path("big/B"), kFiles / 2);
   ASSERT_EQ(rename(box.Path("big/B").c_str(), box.Path("big/C").c_str()), 0);
-  ASSERT_TRUE(PollUntil([&] { return ReadFileText(queue).find("/big/C") != std::string::npos; }, std::chrono::seconds(10)));
+  ASSERT_TRUE(QueueHolds(box, "/big/C"));
   box.StartIndexer();
   ASSERT_EQ(box.Converge(box.DiskPaths("big"), std::chrono::seconds(60)), "");
 }
@@ -118,9 +129,7 @@ TEST(SystemCrashTest, AFolderRenameCutShortByACrashLeavesNoGhosts) {
 void StartABulkBatch(SystemSandbox& box, const std::string& relative, int files) {
   fileindex::StatusMgr().Pause(0);
   for (int i = 0; i < files; ++i) WriteText(box.Path(relative + "/f" + std::to_string(i) + ".txt"), "bulk " + std::to_string(i));
-  const std::string last = "f" + std::to_string(files - 1) + ".txt";
-  ASSERT_TRUE(PollUntil([&] { return ReadFileText(box.Path("@eaDir/fileindex.queue")).find(last) != std::string::npos; },
-                        std::chrono::seconds(30)));
+  ASSERT_TRUE(QueueHolds(box, "f" + std::to_string(files - 1) + ".txt"));
   fileindex::StatusMgr().Resume();
   ASSERT_TRUE(MidBatch(box)) << box.Logs();
 }
@@ -129,25 +138,10 @@ size_t CountBelow(const std::set<std::string>& paths, const std::string& folder)
   return std::count_if(paths.begin(), paths.end(), [&](const std::string& path) { return path.rfind(folder + "/", 0) == 0; });
 }
 
-uint64_t TotalExtracted(SystemSandbox& box) {
-  Json::Value status;
-  JsonFromString(status, box.IndexerStatus());
-  return status["shares"]["share"]["total_extracted"].asUInt64();
-}
-
-// Starts the daemons with the folder /share/<folder> (and `extra`, below it)
-// created, added and indexed.
-void StartWithFolder(SystemSandbox& box, const std::string& folder, const std::string& extra = "") {
-  fs::create_directories(box.Path(folder));
-  if (!extra.empty()) fs::create_directories(box.Path(folder + "/" + extra));
-  box.StartAll();
-  box.AddFolder(folder);
-  ASSERT_EQ(box.Converge(box.DiskPaths(folder)), "");
-}
-
 TEST(SystemCrashTest, AFileWrittenDuringABulkBatchIsSearchableBeforeTheBatchEnds) {
   SystemSandbox box;
-  StartWithFolder(box, "top", "bulk");
+  fs::create_directories(box.Path("top/bulk"));
+  ASSERT_NO_FATAL_FAILURE(StartWithFolder(box, "top"));
   fs::create_directories(box.Path("top/inbox"));
 
   constexpr int kBulk = 3000;
@@ -166,10 +160,7 @@ TEST(SystemCrashTest, ASearchDaemonRestartCostsOnlyTheUncommittedSlice) {
   SystemSandbox box;
   // Short slices, so that some are committed long before the batch ends
   // however fast the machine is.
-  fs::create_directories(box.Path("bulk"));
-  box.StartAll({"--slice-ms", "100"});
-  box.AddFolder("bulk");
-  ASSERT_EQ(box.Converge(box.DiskPaths("bulk")), "");
+  ASSERT_NO_FATAL_FAILURE(StartWithFolder(box, "bulk", {"--slice-ms", "100"}));
   constexpr int kBulk = 3000;
   StartABulkBatch(box, "bulk", kBulk);
   // The indexer saves how many operations it committed after each slice.
@@ -182,7 +173,7 @@ TEST(SystemCrashTest, ASearchDaemonRestartCostsOnlyTheUncommittedSlice) {
   };
   ASSERT_TRUE(PollUntil([&] { return committed() > 0; }, std::chrono::seconds(120))) << box.Logs();
   box.StopSearchDaemon(SIGKILL);
-  const uint64_t extracted_at_kill = TotalExtracted(box);
+  const uint64_t extracted_at_kill = box.Extracted();
   const uint64_t committed_at_kill = committed();
   box.StartSearchDaemon();
   ASSERT_EQ(box.Converge(box.DiskPaths("bulk"), std::chrono::seconds(120)), "");
@@ -190,13 +181,13 @@ TEST(SystemCrashTest, ASearchDaemonRestartCostsOnlyTheUncommittedSlice) {
   // batch followed (doing the whole batch again would be kBulk more). A few
   // files may be extracted between the kill and the failed send that follows.
   constexpr uint64_t kInFlight = 16;
-  EXPECT_LE(TotalExtracted(box), extracted_at_kill + kBulk - committed_at_kill + kInFlight)
+  EXPECT_LE(box.Extracted(), extracted_at_kill + kBulk - committed_at_kill + kInFlight)
       << "committed before the kill: " << committed_at_kill << "\n" << box.Logs();
 }
 
 TEST(SystemCrashTest, TheIndexerFollowsARestartedSearchDaemonWithinItsBackOff) {
   SystemSandbox box;
-  StartWithFolder(box, "docs");
+  ASSERT_NO_FATAL_FAILURE(StartWithFolder(box, "docs"));
   box.StopSearchDaemon(SIGKILL);
   WriteText(box.Path("docs/late.txt"), "written while searching was down");
   // The indexer's attempts fail and its back-off grows: 1, 2, 4, 8, then 16 s.
@@ -214,9 +205,8 @@ TEST(SystemCrashTest, LostNotificationsLeadToAFullReindexThatConverges) {
   WriteText(box.Path("docs/sub/stays.txt"), "stays");
   WriteText(box.Path("docs/goes.txt"), "goes");
   const std::string pause = box.root() + "/notifier-pause";
-  box.StartAll({}, {{"CORVNOTIFYD_TEST_PAUSE_FILE", pause}});
-  box.AddFolder("docs");
-  ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
+  ASSERT_NO_FATAL_FAILURE(
+      StartWithFolder(box, "docs", {}, {{"CORVNOTIFYD_TEST_PAUSE_FILE", pause}}));
 
   // The notifier stops reading; the kernel's queue overflows while files change.
   WriteText(pause, "");
@@ -237,13 +227,6 @@ TEST(SystemCrashTest, LostNotificationsLeadToAFullReindexThatConverges) {
 
 bool StatusSays(const std::string& text) { return RunCli({"status"}).out.find(text) != std::string::npos; }
 
-// Files the indexer extracted and stored since it started.
-uint64_t Extracted(SystemSandbox& box) {
-  Json::Value status;
-  if (!JsonFromString(status, box.IndexerStatus())) return 0;
-  return status["shares"]["share"]["total_extracted"].asUInt64();
-}
-
 // While the notifier is down nobody sees a change: status says so, and its
 // next start has each share checked against the disk, which brings back
 // everything made, changed and deleted meanwhile.
@@ -253,16 +236,14 @@ TEST(SystemCrashTest, ChangesWhileTheNotifierIsDownAreFoundWhenItStartsAgain) {
   WriteText(box.Path("docs/keep/old.txt"), "an old file");
   fs::create_directories(box.Path("docs/stable"));
   for (int i = 0; i < 30; ++i) WriteText(box.Path("docs/stable/s" + std::to_string(i) + ".txt"), "unchanged");
-  box.StartAll();
-  box.AddFolder("docs");
-  ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
+  ASSERT_NO_FATAL_FAILURE(StartWithFolder(box, "docs"));
   const std::string missed = "against the disk: changes may have been missed";
   EXPECT_TRUE(StatusSays("corvnotifyd: running\n")) << RunCli({"status"}).out;
 
   int round = 0;
   for (const int stop_signal : {SIGKILL, SIGTERM}) {
     const std::string tag = std::to_string(++round);
-    const uint64_t extracted_before = Extracted(box);
+    const uint64_t extracted_before = box.Extracted();
     box.StopNotifier(stop_signal);
     EXPECT_TRUE(StatusSays("corvnotifyd: NOT RUNNING (start it with systemctl start corvnotifyd): changes on disk "
                            "are not seen now"))
@@ -286,8 +267,8 @@ TEST(SystemCrashTest, ChangesWhileTheNotifierIsDownAreFoundWhenItStartsAgain) {
     EXPECT_TRUE(StatusSays("corvnotifyd: running\n"));
     // The check is cheap: the 20 new files and their folders are extracted,
     // the 30 unchanged files are not extracted again.
-    EXPECT_GE(Extracted(box) - extracted_before, 20u);
-    EXPECT_LE(Extracted(box) - extracted_before, 25u);
+    EXPECT_GE(box.Extracted() - extracted_before, 20u);
+    EXPECT_LE(box.Extracted() - extracted_before, 25u);
   }
 }
 
@@ -315,16 +296,13 @@ TEST(SystemCrashTest, AFullVolumeStopsTheShareUntilThereIsRoomAgain) {
   box.InstallNoticeTool(notices);
   fs::create_directories(box.Path("docs"));
   WriteText(box.Path("docs/first.txt"), "written with room to spare");
-  box.StartAll();
-  box.AddFolder("docs");
-  ASSERT_EQ(box.Converge(box.DiskPaths("docs")), "");
+  ASSERT_NO_FATAL_FAILURE(StartWithFolder(box, "docs"));
 
   // New files are queued while indexing is paused; then the volume fills
   // up, and indexing them fails for want of room.
   fileindex::StatusMgr().Pause(0);
   for (int i = 0; i < 50; ++i) WriteText(box.Path("docs/late" + std::to_string(i) + ".txt"), std::string(4096, 'y'));
-  ASSERT_TRUE(PollUntil([&] { return ReadFileText(box.Path("@eaDir/fileindex.queue")).find("late49") != std::string::npos; },
-                        std::chrono::seconds(10)));
+  ASSERT_TRUE(QueueHolds(box, "late49"));
   FillVolume(box.Path("filler"));
   fileindex::StatusMgr().Resume();
   ASSERT_TRUE(PollUntil([&] { return box.IndexerStatus().find("\"no_space\"") != std::string::npos; },

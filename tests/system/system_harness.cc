@@ -1,6 +1,9 @@
 #include "tests/system/system_harness.h"
 
+#include <fcntl.h>
+#include <grp.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <filesystem>
@@ -11,7 +14,6 @@
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/mgmt/index_mgr.h"
 #include "tests/support/frame_client.h"
-#include "tests/system/cli_runner.h"
 
 namespace corvlumex {
 namespace testing_support {
@@ -30,6 +32,12 @@ Json::Value FolderObject(const std::string& relative, bool document, bool audio,
   Json::Value list(Json::arrayValue);
   list.append(folder);
   return list;
+}
+
+std::string ReadAndRemove(const std::string& path) {
+  const std::string text = ReadFileText(path);
+  unlink(path.c_str());
+  return text;
 }
 
 }  // namespace
@@ -188,6 +196,42 @@ std::string SystemSandbox::Converge(const std::set<std::string>& expected, std::
 }
 
 std::string SystemSandbox::IndexerStatus() const { return RunCli({"--json", "status"}).out; }
+
+uint64_t SystemSandbox::Extracted() const {
+  Json::Value status;
+  if (!JsonFromString(status, IndexerStatus())) return 0;
+  return status["shares"]["share"]["total_extracted"].asUInt64();
+}
+
+CliResult RunCli(const std::vector<std::string>& args, unsigned as_user) {
+  const std::string program = ProgramPath("fileindex");
+  char out_name[] = "/tmp/fileindex-cli-out-XXXXXX";
+  char err_name[] = "/tmp/fileindex-cli-err-XXXXXX";
+  const int out_fd = mkstemp(out_name);
+  const int err_fd = mkstemp(err_name);
+  CliResult result;
+  const pid_t pid = fork();
+  if (pid == 0) {
+    dup2(out_fd, STDOUT_FILENO);
+    dup2(err_fd, STDERR_FILENO);
+    if (as_user != 0 && (setgroups(0, nullptr) != 0 || setgid(65534) != 0 || setuid(as_user) != 0)) _exit(126);
+    std::vector<std::string> words{program};
+    words.insert(words.end(), args.begin(), args.end());
+    std::vector<char*> argv;
+    for (std::string& word : words) argv.push_back(&word[0]);
+    argv.push_back(nullptr);
+    execv(program.c_str(), argv.data());
+    _exit(127);
+  }
+  close(out_fd);
+  close(err_fd);
+  int status = 0;
+  waitpid(pid, &status, 0);
+  result.status = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+  result.out = ReadAndRemove(out_name);
+  result.err = ReadAndRemove(err_name);
+  return result;
+}
 
 }  // namespace testing_support
 }  // namespace corvlumex

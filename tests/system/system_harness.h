@@ -2,12 +2,14 @@
 // (on tmpfs when there is one), the real corvelasticd, corvnotifyd and
 // fileindexd started as child processes on the sandbox's private sockets,
 // the management operations called in-process, and the index read back the
-// way a user sees it: through corvelasticd's "search" command.
+// way a user sees it: through corvelasticd's "search" command; and the
+// fileindex command line run as a user runs it.
 #pragma once
 
 #include <json/json.h>
 
 #include <chrono>
+#include <cstdint>
 #include <functional>
 #include <map>
 #include <memory>
@@ -70,8 +72,10 @@ class SystemSandbox {
   std::string Converge(const std::set<std::string>& expected,
                        std::chrono::milliseconds timeout = std::chrono::seconds(30)) const;
 
-  // fileindexd's answer to "status".
+  // fileindexd's answer to "status", and the files it extracted and stored
+  // since it started.
   std::string IndexerStatus() const;
+  uint64_t Extracted() const;
 
  private:
   std::set<std::string> Query(const Json::Value& qsl) const;
@@ -91,6 +95,16 @@ class SystemSandbox {
 
 // Writes `content` to `path` (created or truncated).
 void WriteText(const std::string& path, const std::string& content);
+
+// What the fileindex command line of the build folder printed, and its exit status.
+struct CliResult {
+  int status = -1;
+  std::string out;
+  std::string err;
+};
+// `as_user` other than 0 runs it under that user id (and group "nogroup"),
+// for what an unprivileged user sees; the caller must be root then.
+CliResult RunCli(const std::vector<std::string>& args, unsigned as_user = 0);
 
 }  // namespace testing_support
 }  // namespace corvlumex

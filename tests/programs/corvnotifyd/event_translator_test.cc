@@ -82,17 +82,24 @@ class TranslatorTest : public ::testing::Test {
 };
 
 TEST_F(TranslatorTest, EachKernelEventBecomesItsLine) {
+  // The folder of the queue itself: never entered, so the queue's own
+  // appends make no lines.
+  root_.MakeDir("share/docs/@eaDir");
   Watch({Root(docs_, "Q")});
+  EXPECT_EQ(tree_.FindPath(docs_ + "/@eaDir"), nullptr);
   Feed(docs_, IN_CREATE, "f");
   Feed(docs_, IN_CLOSE_WRITE, "f");
   Feed(docs_, IN_ATTRIB, "f");
   Feed(docs_, IN_DELETE, "f");
   Feed(docs_, IN_ATTRIB | IN_ISDIR, "d");
   Feed(docs_, IN_CLOSE_WRITE | IN_ISDIR, "d");  // never a modify for a folder
-  Feed(docs_, IN_CREATE, "@eaDir");              // ignored name
+  Feed(docs_, IN_DELETE | IN_ISDIR, "d");
+  Feed(docs_, IN_CREATE, "@eaDir");  // ignored name
   const std::string f = docs_ + "/f";
   EXPECT_EQ(Lines(), (std::vector<QueueLine>{Line(kEventCreate, f), Line(kEventModify, f), Line(kEventAttr, f),
-                                             Line(kEventDelete, f), Line(kEventAttr, docs_ + "/d", true)}));
+                                             Line(kEventDelete, f),
+                                             Line(kEventAttr, docs_ + "/d", true),
+                                             Line(kEventDelete, docs_ + "/d", true)}));
 }
 
 TEST_F(TranslatorTest, RenameHalvesArePairedByCookie) {
@@ -102,8 +109,18 @@ TEST_F(TranslatorTest, RenameHalvesArePairedByCookie) {
   // A first half whose second never comes: moved out of the tree.
   Feed(docs_, IN_MOVED_FROM, "c", 8);
   Feed(docs_, IN_MOVED_TO, "d", 9);  // and a second half without first: moved in
+  // A folder moved in with its contents: all of it is new here, and watched.
+  fs::create_directories(outside_ + "/in/sub");
+  close(open((outside_ + "/in/sub/old").c_str(), O_WRONLY | O_CREAT, 0644));
+  fs::rename(outside_ + "/in", docs_ + "/in");
+  Feed(docs_, IN_MOVED_TO | IN_ISDIR, "in", 10);
   EXPECT_EQ(Lines(), (std::vector<QueueLine>{Line(kEventRename, docs_ + "/b", false, docs_ + "/a"),
-                                             Line(kEventDelete, docs_ + "/c"), Line(kEventCreate, docs_ + "/d")}));
+                                             Line(kEventDelete, docs_ + "/c"),
+                                             Line(kEventCreate, docs_ + "/d"),
+                                             Line(kEventCreate, docs_ + "/in", true),
+                                             Line(kEventCreate, docs_ + "/in/sub", true),
+                                             Line(kEventCreate, docs_ + "/in/sub/old")}));
+  EXPECT_NE(tree_.FindPath(docs_ + "/in/sub"), nullptr);
 }
 
 TEST_F(TranslatorTest, AFolderMovedOutLosesItsWatches) {

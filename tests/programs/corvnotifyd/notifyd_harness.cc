@@ -71,12 +71,19 @@ void NotifydSandbox::WriteConfig(const std::string& name, const std::string& que
 
 void NotifydSandbox::RemoveConfig(const std::string& name) { unlink((config_dir() + "/" + name).c_str()); }
 
-std::vector<std::string> NotifydSandbox::Notices() const {
-  std::vector<std::string> notices;
-  std::stringstream text(ReadFileText(root_.path() + "/notices.log"));
-  std::string line;
-  while (std::getline(text, line)) notices.push_back(line);
-  return notices;
+std::vector<std::string> TextLines(const std::string& path) {
+  std::vector<std::string> lines;
+  std::istringstream in(ReadFileText(path));
+  for (std::string line; std::getline(in, line);) lines.push_back(line);
+  return lines;
+}
+
+size_t CountOccurrences(const std::string& text, const std::string& needle) {
+  size_t count = 0;
+  for (size_t at = text.find(needle); at != std::string::npos; at = text.find(needle, at + 1)) {
+    ++count;
+  }
+  return count;
 }
 
 std::unique_ptr<ChildProcess> NotifydSandbox::Run(const std::vector<std::string>& args,
@@ -87,13 +94,7 @@ std::unique_ptr<ChildProcess> NotifydSandbox::Run(const std::vector<std::string>
 std::unique_ptr<ChildProcess> NotifydSandbox::Start(const std::map<std::string, std::string>& env) const {
   // The log is appended to: an earlier run's line does not count.
   const auto runs = [this] {
-    const std::string log = ReadFileText(log_path());
-    size_t count = 0;
-    for (size_t at = log.find("watching as configured"); at != std::string::npos;
-         at = log.find("watching as configured", at + 1)) {
-      ++count;
-    }
-    return count;
+    return CountOccurrences(ReadFileText(log_path()), "watching as configured");
   };
   const size_t before = runs();
   auto process = Run({"--foreground"}, env);

@@ -36,6 +36,9 @@ inline QueueLine Line(uint32_t event, const std::string& path, bool is_dir = fal
 // Every line of a queue file, parsed; a line that does not parse fails the test.
 std::vector<QueueLine> ReadQueue(const std::string& path);
 std::vector<QueueLine> ParseQueueText(const std::string& text);
+// The lines of a text file, and how often `needle` occurs in a text.
+std::vector<std::string> TextLines(const std::string& path);
+size_t CountOccurrences(const std::string& text, const std::string& needle);
 // Polls `condition` (every 2 ms) until it holds or `timeout` passes.
 inline bool WaitUntil(const std::function<bool()>& condition,
                       std::chrono::milliseconds timeout = std::chrono::milliseconds(15000)) {
@@ -58,7 +61,7 @@ class NotifydSandbox {
   void WriteConfig(const std::string& name, const std::string& queue, const std::vector<std::string>& folders);
   void RemoveConfig(const std::string& name);
   // Lines the stand-in notification tool received, one per run.
-  std::vector<std::string> Notices() const;
+  std::vector<std::string> Notices() const { return TextLines(root_.path() + "/notices.log"); }
   // Starts corvnotifyd --foreground (or with `args`), standard error into
   // log_path(), `env` added to the environment.
   std::unique_ptr<ChildProcess> Run(const std::vector<std::string>& args = {"--foreground"},

@@ -39,10 +39,6 @@ std::vector<QueueLine> About(const std::vector<QueueLine>& lines, const std::str
   return out;
 }
 
-bool Has(const std::vector<QueueLine>& lines, const QueueLine& wanted) {
-  return std::find(lines.begin(), lines.end(), wanted) != lines.end();
-}
-
 size_t Count(const std::vector<QueueLine>& lines, uint32_t event) {
   return std::count_if(lines.begin(), lines.end(), [&](const QueueLine& l) { return l.event == event; });
 }
@@ -56,12 +52,6 @@ void WriteFileInPieces(const std::string& path, size_t pieces, size_t piece_size
 }
 
 void Touch(const std::string& path) { close(open(path.c_str(), O_WRONLY | O_CREAT, 0644)); }
-
-size_t CountOccurrences(const std::string& text, const std::string& needle) {
-  size_t count = 0;
-  for (size_t at = text.find(needle); at != std::string::npos; at = text.find(needle, at + 1)) ++count;
-  return count;
-}
 
 class NotifydTest : public ::testing::Test {
  protected:
@@ -97,80 +87,6 @@ TEST_F(NotifydTest, FileChangesBecomeOneLineEachAndALargeCopyOneModify) {
                                            Line(kEventCreate, box_.docs() + "/sync", true)};
   EXPECT_EQ(box_.Queue(), expected);
   EXPECT_EQ(daemon->Stop(SIGTERM), 0);
-}
-
-TEST_F(NotifydTest, NestedFoldersMadeQuicklyAreAllSeenAndFollowRenames) {
-  auto daemon = box_.Start();
-  const std::string a = box_.docs() + "/a";
-  fs::create_directories(a + "/b/c");
-  for (int i = 0; i < 5; ++i) Touch(a + "/b/c/f" + std::to_string(i));
-  ASSERT_TRUE(box_.Sync(box_.docs() + "/sync1"));
-  auto lines = box_.Queue();
-  for (const std::string dir : {"/a", "/a/b", "/a/b/c"}) {
-    EXPECT_TRUE(Has(lines, Line(kEventCreate, box_.docs() + dir, true))) << dir;
-  }
-  for (int i = 0; i < 5; ++i) EXPECT_TRUE(Has(lines, Line(kEventCreate, a + "/b/c/f" + std::to_string(i))));
-
-  // A renamed folder keeps its watches, under the new name.
-  const std::string z = box_.docs() + "/z";
-  rename(a.c_str(), z.c_str());
-  Touch(z + "/b/c/new");
-  fs::remove_all(z);
-  ASSERT_TRUE(box_.Sync(box_.docs() + "/sync2")) << daemon->Log();
-  lines = box_.Queue();
-  EXPECT_TRUE(Has(lines, Line(kEventRename, z, true, a)));
-  EXPECT_TRUE(Has(lines, Line(kEventCreate, z + "/b/c/new")));
-  EXPECT_TRUE(Has(lines, Line(kEventDelete, z + "/b/c", true)));
-  EXPECT_TRUE(Has(lines, Line(kEventDelete, z, true)));
-  EXPECT_TRUE(About(lines, a + "/b/c/new").empty());
-}
-
-TEST_F(NotifydTest, MovesInAndOutOfTheWatchedTree) {
-  const std::string outside = box_.share() + "/outside";
-  fs::create_directories(outside + "/in_dir/sub");
-  Touch(outside + "/in_file");
-  Touch(outside + "/in_dir/sub/old");
-  fs::create_directories(box_.docs() + "/out_dir");
-  Touch(box_.docs() + "/out_file");
-  auto daemon = box_.Start();
-
-  rename((outside + "/in_file").c_str(), (box_.docs() + "/in_file").c_str());
-  rename((outside + "/in_dir").c_str(), (box_.docs() + "/in_dir").c_str());
-  rename((box_.docs() + "/out_file").c_str(), (outside + "/out_file").c_str());
-  rename((box_.docs() + "/out_dir").c_str(), (outside + "/out_dir").c_str());
-  ASSERT_TRUE(box_.Sync(box_.docs() + "/sync1"));
-  // Inside the moved-in folder changes are seen; in the moved-out one not.
-  Touch(box_.docs() + "/in_dir/sub/fresh");
-  Touch(outside + "/out_dir/unseen");
-  ASSERT_TRUE(box_.Sync(box_.docs() + "/sync2")) << daemon->Log();
-
-  const auto lines = box_.Queue();
-  EXPECT_TRUE(Has(lines, Line(kEventCreate, box_.docs() + "/in_file")));
-  EXPECT_TRUE(Has(lines, Line(kEventCreate, box_.docs() + "/in_dir", true)));
-  EXPECT_TRUE(Has(lines, Line(kEventCreate, box_.docs() + "/in_dir/sub/old")));
-  EXPECT_TRUE(Has(lines, Line(kEventCreate, box_.docs() + "/in_dir/sub/fresh")));
-  EXPECT_TRUE(Has(lines, Line(kEventDelete, box_.docs() + "/out_file")));
-  EXPECT_TRUE(Has(lines, Line(kEventDelete, box_.docs() + "/out_dir", true)));
-  EXPECT_TRUE(About(lines, outside).empty());
-  EXPECT_EQ(Count(lines, kEventRename), 0u);
-}
-
-TEST_F(NotifydTest, IgnoredFoldersAreNeverEntered) {
-  // The whole share is watched: its own queue lives in share/@eaDir.
-  box_.WriteConfig("fileindex@share.json", box_.queue(), {box_.share()});
-  auto daemon = box_.Start();
-  fs::create_directories(box_.share() + "/docs/sub/@eaDir/deep");
-  Touch(box_.share() + "/docs/sub/@eaDir/deep/x");
-  Touch(box_.share() + "/docs/@eaDir");
-  Touch(box_.share() + "/@eaDir/other");
-  ASSERT_TRUE(box_.Sync(box_.share() + "/sync1"));
-  ASSERT_TRUE(box_.Sync(box_.share() + "/sync2"));  // our own appends made no lines
-  const auto lines = box_.Queue();
-  for (const QueueLine& line : lines) EXPECT_EQ(line.path.find("@eaDir"), std::string::npos) << line.path;
-  const std::vector<QueueLine> expected = {
-      Line(kEventQueueCrash, box_.share(), true), Line(kEventCreate, box_.share() + "/docs/sub", true),
-      Line(kEventCreate, box_.share() + "/sync1", true), Line(kEventCreate, box_.share() + "/sync2", true)};
-  EXPECT_EQ(lines, expected);
 }
 
 TEST_F(NotifydTest, ConfigurationChangesArePickedUp) {
@@ -340,17 +256,10 @@ TEST_F(NotifydTest, OverflowAdviceQuotesTheQueueLengthInForceNotALaterSetting) {
   EXPECT_EQ(daemon->Stop(SIGTERM), 0);
 }
 
-std::vector<std::string> LogLines(const std::string& path) {
-  std::vector<std::string> lines;
-  std::istringstream in(ReadFileText(path));
-  for (std::string line; std::getline(in, line);) lines.push_back(line);
-  return lines;
-}
-
 TEST_F(NotifydTest, LogLinesInAFileCarryTheirTimeUnlessTheJournalStampsThem) {
   const std::regex stamped(R"(\d{4}-\d\d-\d\dT\d\d:\d\d:\d\d\.\d{3}[+-]\d\d:\d\d corvnotifyd: \S.*)");
   EXPECT_EQ(box_.Start()->Stop(SIGTERM), 0);
-  std::vector<std::string> lines = LogLines(box_.log_path());
+  std::vector<std::string> lines = TextLines(box_.log_path());
   EXPECT_GE(lines.size(), 3u);
   for (const std::string& line : lines) EXPECT_TRUE(std::regex_match(line, stamped)) << line;
 
@@ -361,7 +270,7 @@ TEST_F(NotifydTest, LogLinesInAFileCarryTheirTimeUnlessTheJournalStampsThem) {
   ASSERT_EQ(stat(box_.log_path().c_str(), &st), 0);
   const std::string journal = std::to_string(st.st_dev) + ":" + std::to_string(st.st_ino);
   EXPECT_EQ(box_.Start({{"JOURNAL_STREAM", journal}})->Stop(SIGTERM), 0);
-  lines = LogLines(box_.log_path());
+  lines = TextLines(box_.log_path());
   EXPECT_GE(lines.size(), 3u);
   for (const std::string& line : lines) EXPECT_EQ(line.rfind("corvnotifyd: ", 0), 0u) << line;
 }

@@ -28,7 +28,6 @@
 #include "programs/fileindexd/suggestion_schedule.h"
 #include "tests/support/child_process.h"
 #include "tests/support/frame_client.h"
-#include "programs/fileindexd/suggestion_schedule.h"
 #include "tests/support/log_capture.h"
 #include "tests/support/sandbox.h"
 
@@ -47,10 +46,15 @@ SettleOptions Options() {
   return options;
 }
 
-TEST(SettleTrackerTest, ThirdChangeWithinTheIntervalWaitsAndTheIntervalGrows) {
-  Sandbox root;
-  SettleTracker tracker(root.path() + "/q.settle", Options());
+class SettleTrackerTest : public ::testing::Test {
+ protected:
+  Sandbox root_;
+  const std::string state_ = root_.path() + "/q.settle";
+  SettleTracker tracker{state_, Options()};
   const Clock::time_point t0 = Clock::now();
+};
+
+TEST_F(SettleTrackerTest, ThirdChangeWithinTheIntervalWaitsAndTheIntervalGrows) {
   EXPECT_TRUE(tracker.Admit("/v/s/log", t0));                    // the create
   EXPECT_TRUE(tracker.Admit("/v/s/log", t0 + milliseconds(10)));  // its first write
   EXPECT_FALSE(tracker.Admit("/v/s/log", t0 + milliseconds(20)));
@@ -68,10 +72,7 @@ TEST(SettleTrackerTest, ThirdChangeWithinTheIntervalWaitsAndTheIntervalGrows) {
   EXPECT_EQ(tracker.NextDue(), t0 + milliseconds(1010) + milliseconds(2000));
 }
 
-TEST(SettleTrackerTest, QuietFilesStartOverAndForgottenFilesLeave) {
-  Sandbox root;
-  SettleTracker tracker(root.path() + "/q.settle", Options());
-  const Clock::time_point t0 = Clock::now();
+TEST_F(SettleTrackerTest, QuietFilesStartOverAndForgottenFilesLeave) {
   tracker.Admit("/a", t0);
   tracker.Admit("/a", t0);
   EXPECT_FALSE(tracker.Admit("/a", t0));
@@ -85,29 +86,21 @@ TEST(SettleTrackerTest, QuietFilesStartOverAndForgottenFilesLeave) {
   EXPECT_TRUE(tracker.Admit("/b", t0 + milliseconds(2101)));
 }
 
-TEST(SettleTrackerTest, DeferredFilesSurviveARestart) {
-  Sandbox root;
-  const std::string state = root.path() + "/q.settle";
-  const Clock::time_point t0 = Clock::now();
-  {
-    SettleTracker tracker(state, Options());
-    for (int i = 0; i < 3; ++i) tracker.Admit("/v/s/a b\"c", t0);
-    ASSERT_TRUE(tracker.Save());
-  }
-  SettleTracker restarted(state, Options());
+TEST_F(SettleTrackerTest, DeferredFilesSurviveARestart) {
+  for (int i = 0; i < 3; ++i) tracker.Admit("/v/s/a b\"c", t0);
+  ASSERT_TRUE(tracker.Save());
+  SettleTracker restarted(state_, Options());
   restarted.Load();
   const auto due = restarted.DueNow(Clock::now());
   ASSERT_EQ(due, std::vector<std::string>{"/v/s/a b\"c"});
   restarted.Confirm(due, Clock::now());
   ASSERT_TRUE(restarted.Save());
-  EXPECT_FALSE(IsFileExist(state));  // nothing deferred: no file
+  EXPECT_FALSE(IsFileExist(state_));  // nothing deferred: no file
 }
 
-TEST(SettleTrackerTest, AnUnreadableStateFileIsIgnoredWithALogLine) {
-  Sandbox root;
+TEST_F(SettleTrackerTest, AnUnreadableStateFileIsIgnoredWithALogLine) {
   testing_support::LogCapture log;
-  const std::string state = root.WriteFile("q.settle", "{not json");
-  SettleTracker tracker(state, Options());
+  root_.WriteFile("q.settle", "{not json");
   tracker.Load();
   EXPECT_EQ(tracker.DeferredCount(), 0u);
   EXPECT_EQ(log.Matching("unreadable list of deferred files").size(), 1u);

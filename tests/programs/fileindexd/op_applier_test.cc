@@ -78,29 +78,56 @@ class OpApplierTest : public ::testing::Test {
 
 using Lines = std::vector<std::string>;
 
-TEST_F(OpApplierTest, UpsertStoresDeletesOrClearsByWhatIsOnDisk) {
-  root_.WriteFile("volume1/share/docs/main.c", "int x;");
-  root_.WriteFile("volume1/share/docs/notes.txt", "documents are off here");
-  applier_->Upsert(Docs("main.c"));
-  applier_->Upsert(Docs("notes.txt"));
-  applier_->Upsert(Docs("gone"));
-  EXPECT_EQ(Sent(), (Lines{"document_upsert_by_id " + Docs("main.c"), "document_del_by_id " + Docs("notes.txt"),
-                                  "document_del_by_id " + Docs("gone"), "document_del_by_query " + Docs("gone") + "/"}));
-}
-
-TEST_F(OpApplierTest, AnAttributeChangeOfAFileNeverStoredStoresItWhole) {
-  root_.WriteFile("volume1/share/docs/a.c", "x");
-  daemon_.Enqueue(FakeAnswer::Failure(elasticd::kCodeDocumentNotFound, "No document with the id"));
-  applier_->Attr(Docs("a.c"));
-  EXPECT_EQ(Sent(), (Lines{"document_set_by_id " + Docs("a.c"), "document_upsert_by_id " + Docs("a.c")}));
-}
-
-TEST_F(OpApplierTest, ARenameWithoutAnOldDocumentIsReadFromDisk) {
-  root_.WriteFile("volume1/share/docs/new.c", "x");
-  daemon_.Enqueue(FakeAnswer::Failure(elasticd::kCodeDocumentNotFound, "No document with the id"));
-  applier_->Rename(Docs("old.c"), Docs("new.c"));
-  EXPECT_EQ(Sent(), (Lines{"document_set_by_id " + Docs("old.c"), "document_del_by_id " + Docs("old.c"),
-                                  "document_del_by_query " + Docs("old.c") + "/", "document_upsert_by_id " + Docs("new.c")}));
+// Each operation on one file: what reaches the search daemon, by what is on
+// disk and what the index answers.
+TEST_F(OpApplierTest, EachOperationSendsWhatTheDiskAndTheIndexCallFor) {
+  root_.MakeDir("volume1/share/docs/@tmp");
+  for (const char* name : {"main.c", "notes.txt", "attr.c", "new.c", "@tmp/hidden.c", "back.c"}) {
+    root_.WriteFile("volume1/share/docs/" + std::string(name), "x");
+  }
+  const FakeAnswer not_found =
+      FakeAnswer::Failure(elasticd::kCodeDocumentNotFound, "No document with the id");
+  const std::string set = "document_set_by_id ", upsert = "document_upsert_by_id ",
+                    del = "document_del_by_id ", del_below = "document_del_by_query ";
+  struct Case {
+    const char* name;
+    std::function<void()> apply;
+    std::vector<FakeAnswer> answers;
+    Lines expected;
+  };
+  const Case cases[] = {
+      {"a file of no category is stored", [&] { applier_->Upsert(Docs("main.c")); }, {},
+       {upsert + Docs("main.c")}},
+      // Documents are off in docs/.
+      {"a file of a category switched off is deleted", [&] { applier_->Upsert(Docs("notes.txt")); },
+       {}, {del + Docs("notes.txt")}},
+      {"a file gone from disk is cleared with what was below it",
+       [&] { applier_->Upsert(Docs("gone")); }, {},
+       {del + Docs("gone"), del_below + Docs("gone") + "/"}},
+      {"an attribute change of a file never stored stores it whole",
+       [&] { applier_->Attr(Docs("attr.c")); }, {not_found},
+       {set + Docs("attr.c"), upsert + Docs("attr.c")}},
+      {"a rename without an old document is read from disk",
+       [&] { applier_->Rename(Docs("old.c"), Docs("new.c")); }, {not_found},
+       {set + Docs("old.c"), del + Docs("old.c"), del_below + Docs("old.c") + "/",
+        upsert + Docs("new.c")}},
+      {"a rename into a hidden folder removes the documents",
+       [&] { applier_->Rename(Docs("hidden.c"), Docs("@tmp/hidden.c")); }, {},
+       {del + Docs("hidden.c"), del_below + Docs("hidden.c") + "/", del + Docs("@tmp/hidden.c"),
+        del_below + Docs("@tmp/hidden.c") + "/"}},
+      // Restored from a recycle bin or a hidden folder: indexed again.
+      {"a rename out of a hidden folder stores the file",
+       [&] { applier_->Rename(Docs("@tmp/back.c"), Docs("back.c")); }, {},
+       {del + Docs("@tmp/back.c"), del_below + Docs("@tmp/back.c") + "/", upsert + Docs("back.c")}},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    const size_t before = daemon_.Requests().size();
+    for (const FakeAnswer& answer : c.answers) daemon_.Enqueue(answer);
+    c.apply();
+    const Lines sent = Sent();
+    EXPECT_EQ(Lines(sent.begin() + before, sent.end()), c.expected);
+  }
 }
 
 // After a crash a rename is applied again over what its first run already
@@ -214,15 +241,6 @@ TEST_F(OpApplierTest, TheFreshLaneStoresTheFilesOfSmallGroupsOnly) {
   std::ofstream(queue, std::ios::app) << line(0x2, Docs("new.c"));
   EXPECT_EQ(lane.Look(), 1u);
   EXPECT_EQ(daemon_.Requests().size(), 5u);
-}
-
-TEST_F(OpApplierTest, ARenameIntoAHiddenFolderRemovesTheDocuments) {
-  root_.MakeDir("volume1/share/docs/@tmp");
-  root_.WriteFile("volume1/share/docs/@tmp/a.c", "x");
-  applier_->Rename(Docs("a.c"), Docs("@tmp/a.c"));
-  EXPECT_EQ(Sent(), (Lines{"document_del_by_id " + Docs("a.c"), "document_del_by_query " + Docs("a.c") + "/",
-                                  "document_del_by_id " + Docs("@tmp/a.c"),
-                                  "document_del_by_query " + Docs("@tmp/a.c") + "/"}));
 }
 
 TEST_F(OpApplierTest, AReindexStoresWhatChangedAndDeletesWhatIsGone) {

@@ -11,6 +11,7 @@
 #include "platform/linux/extract/parsers/formats.h"
 #include "platform/linux/extract/parsers/text_sink.h"
 #include "platform/linux/extract/plain_text.h"
+#include "tests/platform/linux/extract/expect_fields.h"
 #include "tests/support/extract_samples.h"
 #include "tests/support/sandbox.h"
 
@@ -19,6 +20,7 @@ namespace platform {
 namespace extract {
 namespace {
 
+using testing_support::ExpectFields;
 using testing_support::MakeOffice;
 using testing_support::MakePdf;
 using testing_support::RunTool;
@@ -145,11 +147,10 @@ TEST_F(FormatsTest, HtmlKeepsTextAndHeadFieldsNotScripts) {
              "<html><head><meta charset=\"iso-8859-1\"><title>Caf\xE9 page</title><meta name=\"author\" "
              "content=\"Ann Lee\"><meta name=\"description\" content=\"About coffee\"><style>p{}</style></head>"
              "<body><h1>Menu</h1><p>Espresso &amp; cr\xE8me</p><script>var hidden = 1;</script></body></html>");
-  const Json::Value fields = Extract("page.html");
-  EXPECT_EQ("Menu\nEspresso & cr\xC3\xA8me", fields[kFieldTextContent].asString());
-  EXPECT_EQ("Caf\xC3\xA9 page", fields[kFieldTitle].asString());
-  EXPECT_EQ("Ann Lee", fields[kFieldAuthors].asString());
-  EXPECT_EQ("About coffee", fields[kFieldDescription].asString());
+  ExpectFields(Extract("page.html"),
+               {{kFieldTextContent, "\"Menu\\nEspresso & cr\xC3\xA8me\""},
+                {kFieldTitle, "\"Caf\xC3\xA9 page\""}, {kFieldAuthors, R"("Ann Lee")"},
+                {kFieldDescription, R"("About coffee")"}});
 }
 
 TEST_F(FormatsTest, HtmlKeepsNoscriptAndTextAfterTheEnd) {
@@ -199,12 +200,11 @@ TEST_F(FormatsTest, XmlKeepsValuesApartAndNeverFetchesEntities) {
 
 TEST_F(FormatsTest, PdfTextPagesAndInformation) {
   MakePdf(PathOf("doc.pdf"), {"First page words", "Second page words"}, "Quarterly Report", "Jane Doe");
-  const Json::Value fields = Extract("doc.pdf", false);
-  EXPECT_EQ("First page words\nSecond page words", fields[kFieldTextContent].asString());
-  EXPECT_EQ("Quarterly Report", fields[kFieldTitle].asString());
-  EXPECT_EQ("Jane Doe", fields[kFieldAuthors].asString());
-  EXPECT_EQ(1577934245, fields[kFieldContentCreationDate].asInt64());
-  EXPECT_EQ("application/pdf", fields[kFieldMediaTypes].asString());
+  ExpectFields(Extract("doc.pdf", false),
+               {{kFieldTextContent, R"("First page words\nSecond page words")"},
+                {kFieldTitle, R"("Quarterly Report")"}, {kFieldAuthors, R"("Jane Doe")"},
+                {kFieldContentCreationDate, "1577934245"},
+                {kFieldMediaTypes, R"("application/pdf")"}});
 }
 
 TEST_F(FormatsTest, OfficeDocumentsTextAndProperties) {
@@ -245,31 +245,24 @@ TEST_F(FormatsTest, AudioTagsAndPropertiesOnlyWithMetaInMp3AndFlac) {
           "-metadata composer='Ann Writer' -metadata genre=Jazz -metadata track=7 -metadata date=2019 "
           "-metadata comment='Live take' " + PathOf("song.mp3"));
   const Json::Value fields = Extract("song.mp3");
-  EXPECT_EQ("Blue Song", fields[kFieldTitle].asString());
-  EXPECT_EQ("The Players", fields[kFieldAuthors].asString());
-  EXPECT_EQ("First Album", fields[kFieldAlbum].asString());
-  EXPECT_EQ("Ann Writer", fields[kFieldComposer].asString());
-  EXPECT_EQ("Jazz", fields[kFieldGenre].asString());
-  EXPECT_EQ("Live take", fields[kFieldComment].asString());
-  EXPECT_EQ(7, fields[kFieldTrackNumber].asInt());
-  EXPECT_EQ(2019, fields[kFieldRecordingYear].asInt());
+  ExpectFields(fields,
+               {{kFieldTitle, R"("Blue Song")"}, {kFieldAuthors, R"("The Players")"},
+                {kFieldAlbum, R"("First Album")"}, {kFieldComposer, R"("Ann Writer")"},
+                {kFieldGenre, R"("Jazz")"}, {kFieldComment, R"("Live take")"},
+                {kFieldTrackNumber, "7"}, {kFieldRecordingYear, "2019"},
+                {kFieldSampleRate, "44100"}, {kFieldChannelCount, "2"},
+                {kFieldMediaTypes, R"("audio/mpeg")"}});
   EXPECT_NEAR(2.0, fields[kFieldDuration].asDouble(), 0.1);
   EXPECT_NEAR(128, fields[kFieldAudioBitRate].asInt(), 8);
-  EXPECT_EQ(44100, fields[kFieldSampleRate].asInt());
-  EXPECT_EQ(2, fields[kFieldChannelCount].asInt());
-  EXPECT_EQ("audio/mpeg", fields[kFieldMediaTypes].asString());
   const Json::Value without = Extract("song.mp3", false);
   EXPECT_FALSE(without.isMember(kFieldTitle));
   EXPECT_FALSE(without.isMember(kFieldDuration));
   // FLAC keeps its tags in another form.
   RunTool("ffmpeg -nostdin -loglevel error -y -f lavfi -i sine=duration=1 -ar 48000 -metadata title=Calm "
           "-metadata artist=Quartet -metadata track=3 " + PathOf("calm.flac"));
-  const Json::Value flac = Extract("calm.flac");
-  EXPECT_EQ("Calm", flac[kFieldTitle].asString());
-  EXPECT_EQ("Quartet", flac[kFieldAuthors].asString());
-  EXPECT_EQ(3, flac[kFieldTrackNumber].asInt());
-  EXPECT_EQ(48000, flac[kFieldSampleRate].asInt());
-  EXPECT_EQ(1, flac[kFieldChannelCount].asInt());
+  ExpectFields(Extract("calm.flac"),
+               {{kFieldTitle, R"("Calm")"}, {kFieldAuthors, R"("Quartet")"},
+                {kFieldTrackNumber, "3"}, {kFieldSampleRate, "48000"}, {kFieldChannelCount, "1"}});
 }
 
 TEST_F(FormatsTest, PhotoExifFieldsAndResolutionInCentimetres) {
@@ -277,26 +270,19 @@ TEST_F(FormatsTest, PhotoExifFieldsAndResolutionInCentimetres) {
   RunTool("exiftool -q -overwrite_original -Make=Canon '-Model=EOS 5D' -ISO=400 -ExposureTime=1/125 -FNumber=2.8 "
           "-XResolution=300 -YResolution=240 -ResolutionUnit=inches '-DateTimeOriginal=2020:01:02 03:04:05' " +
           PathOf("photo.jpg"));
-  const Json::Value fields = Extract("photo.jpg");
-  EXPECT_EQ("Canon", fields[kFieldMake].asString());
-  EXPECT_EQ("EOS 5D", fields[kFieldModel].asString());
-  EXPECT_EQ(400, fields[kFieldISOSpeed].asInt());
-  EXPECT_EQ("1/125", fields[kFieldExposureTime].asString());
-  EXPECT_EQ("f/2.8", fields[kFieldAperture].asString());
-  EXPECT_EQ(300, fields[kFieldResolutionWidthDPI].asInt());
-  EXPECT_EQ(240, fields[kFieldResolutionHeightDPI].asInt());
-  EXPECT_EQ(64, fields[kFieldPixelWidth].asInt());
-  EXPECT_EQ(48, fields[kFieldPixelHeight].asInt());
-  EXPECT_EQ(1577934245, fields[kFieldContentCreationDate].asInt64());
-  EXPECT_EQ("image/jpeg", fields[kFieldMediaTypes].asString());
+  ExpectFields(Extract("photo.jpg"),
+               {{kFieldMake, R"("Canon")"}, {kFieldModel, R"("EOS 5D")"}, {kFieldISOSpeed, "400"},
+                {kFieldExposureTime, R"("1/125")"}, {kFieldAperture, R"("f/2.8")"},
+                {kFieldResolutionWidthDPI, "300"}, {kFieldResolutionHeightDPI, "240"},
+                {kFieldPixelWidth, "64"}, {kFieldPixelHeight, "48"},
+                {kFieldContentCreationDate, "1577934245"}, {kFieldMediaTypes, R"("image/jpeg")"}});
   EXPECT_FALSE(Extract("photo.jpg", false).isMember(kFieldMake));
   // A resolution in centimetres is converted to dots per inch.
   RunTool("ffmpeg -nostdin -loglevel error -y -f lavfi -i testsrc=size=32x32 -frames:v 1 " + PathOf("scan.jpg"));
   RunTool("exiftool -q -overwrite_original -XResolution=100 -YResolution=100 -ResolutionUnit=cm -ExposureTime=2.5 " +
           PathOf("scan.jpg"));
-  const Json::Value scan = Extract("scan.jpg");
-  EXPECT_EQ(254, scan[kFieldResolutionWidthDPI].asInt());
-  EXPECT_EQ("2.5", scan[kFieldExposureTime].asString());
+  ExpectFields(Extract("scan.jpg"),
+               {{kFieldResolutionWidthDPI, "254"}, {kFieldExposureTime, R"("2.5")"}});
 }
 
 TEST_F(FormatsTest, VideoDurationBitRatesAndCodecs) {
@@ -304,17 +290,14 @@ TEST_F(FormatsTest, VideoDurationBitRatesAndCodecs) {
           "-i sine=duration=2 -c:v mpeg4 -b:v 300k -c:a aac -b:a 64k -ar 48000 -metadata title=Holiday "
           "-metadata creation_time=2021-03-04T05:06:07Z " + PathOf("clip.mp4"));
   const Json::Value fields = Extract("clip.mp4");
+  ExpectFields(fields,
+               {{kFieldCodecs, R"("mpeg4 aac")"}, {kFieldPixelWidth, "160"},
+                {kFieldPixelHeight, "120"}, {kFieldSampleRate, "48000"}, {kFieldChannelCount, "1"},
+                {kFieldTitle, R"("Holiday")"}, {kFieldContentCreationDate, "1614834367"}});
   EXPECT_NEAR(2.0, fields[kFieldDuration].asDouble(), 0.1);
-  EXPECT_EQ("mpeg4 aac", fields[kFieldCodecs].asString());
-  EXPECT_EQ(160, fields[kFieldPixelWidth].asInt());
-  EXPECT_EQ(120, fields[kFieldPixelHeight].asInt());
   EXPECT_GT(fields[kFieldVideoBitRate].asInt(), 0);
   EXPECT_NEAR(64, fields[kFieldAudioBitRate].asInt(), 16);
   EXPECT_GT(fields[kFieldTotalBitRate].asInt(), fields[kFieldVideoBitRate].asInt());
-  EXPECT_EQ(48000, fields[kFieldSampleRate].asInt());
-  EXPECT_EQ(1, fields[kFieldChannelCount].asInt());
-  EXPECT_EQ("Holiday", fields[kFieldTitle].asString());
-  EXPECT_EQ(1614834367, fields[kFieldContentCreationDate].asInt64());
   EXPECT_FALSE(Extract("clip.mp4", false).isMember(kFieldCodecs));
 }
 

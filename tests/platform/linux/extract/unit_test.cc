@@ -9,6 +9,7 @@
 #include "platform/linux/extract/parsers/dates.h"
 #include "platform/linux/extract/parsers/encoding.h"
 #include "platform/linux/extract/parsers/text_sink.h"
+#include "tests/platform/linux/extract/expect_fields.h"
 #include "tests/support/sandbox.h"
 
 namespace corvlumex {
@@ -16,6 +17,7 @@ namespace platform {
 namespace extract {
 namespace {
 
+using testing_support::ExpectFields;
 using testing_support::Sandbox;
 
 TEST(PrivilegeString, ShowsTypeBitsAndSpecialBitsLikeLs) {
@@ -37,24 +39,21 @@ TEST(FileFields, FillsEveryFileSystemFieldOfAFile) {
   ASSERT_TRUE(ReadFileStatus(path, &status));
   Json::Value document;
   FillFileFields(path, status, document);
-  EXPECT_EQ(path, document[kFieldPath].asString());
-  EXPECT_EQ(root.path() + "/dir", document[kFieldParent].asString());
-  EXPECT_EQ("Report.Final.PDF", document[kFieldFSName].asString());
-  EXPECT_EQ("Report.Final.PDF", document[kFieldDisplayName].asString());
-  EXPECT_EQ("pdf", document[kFieldExtension].asString());
-  EXPECT_EQ("pdf", document[kFieldKind].asString());
-  EXPECT_FALSE(document[kFieldIsDir].asBool());
-  EXPECT_EQ("-rw-r-----", document[kFieldPrivilege].asString());
-  EXPECT_EQ(std::to_string(getuid()), document[kFieldOwnerUserID].asString());
-  EXPECT_EQ(std::to_string(getgid()), document[kFieldOwnerGroupID].asString());
-  EXPECT_EQ(5, document[kFieldFSSize].asInt64());
-  EXPECT_EQ(5, document[kFieldLogicalSize].asInt64());
   struct stat st;
   ASSERT_EQ(0, stat(path.c_str(), &st));
-  EXPECT_EQ(st.st_mtime, document[kFieldContentChangeDate].asInt64());
-  EXPECT_EQ(st.st_ctime, document[kFieldAttributeChangeDate].asInt64());
-  EXPECT_EQ(st.st_atime, document[kFieldLastUsedDate].asInt64());
-  EXPECT_EQ(st.st_blocks * 512, document[kFieldPhysicalSize].asInt64());
+  const auto text = [](const std::string& value) { return "\"" + value + "\""; };
+  ExpectFields(document,
+               {{kFieldPath, text(path)}, {kFieldParent, text(root.path() + "/dir")},
+                {kFieldFSName, R"("Report.Final.PDF")"},
+                {kFieldDisplayName, R"("Report.Final.PDF")"}, {kFieldExtension, R"("pdf")"},
+                {kFieldKind, R"("pdf")"}, {kFieldIsDir, "false"},
+                {kFieldPrivilege, R"("-rw-r-----")"},
+                {kFieldOwnerUserID, text(std::to_string(getuid()))},
+                {kFieldOwnerGroupID, text(std::to_string(getgid()))}, {kFieldFSSize, "5"},
+                {kFieldLogicalSize, "5"}, {kFieldContentChangeDate, std::to_string(st.st_mtime)},
+                {kFieldAttributeChangeDate, std::to_string(st.st_ctime)},
+                {kFieldLastUsedDate, std::to_string(st.st_atime)},
+                {kFieldPhysicalSize, std::to_string(st.st_blocks * 512)}});
   // Creation time only where the file system keeps one, and then no later
   // than the last change.
   if (status.has_birth_time) {
