@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <cstdint>
 #include <cstring>
 #include <unordered_map>
 
@@ -738,6 +739,7 @@ void IndexStore::CollectHits(Database& reader, SearchCandidates& candidates, con
   std::vector<Hit> batch;
   std::vector<int64_t> rowids;
   size_t checked_past_page = 0;
+  bool page_told = false;  // the candidates know the page is full
   bool more = true;
   Statement& load = reader.Cached("SELECT doc FROM docs WHERE rowid = ?");
   while (more) {
@@ -768,6 +770,14 @@ void IndexStore::CollectHits(Database& reader, SearchCandidates& candidates, con
         int64_t rowid = 0;
         result->total_exact = !candidates.Next(&rowid, &rest);
         return;
+      }
+      if (!page_told) {
+        // From here on whole batches are only counted, until the budget is
+        // spent: which candidates they are matters, not their order.
+        const size_t left = check_budget - checked_past_page;
+        const size_t batches = left / kFilterBatch + (left % kFilterBatch != 0 ? 1 : 0);
+        candidates.CountOnly(batches > SIZE_MAX / kFilterBatch ? SIZE_MAX : batches * kFilterBatch);
+        page_told = true;
       }
     }
   }

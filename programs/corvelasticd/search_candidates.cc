@@ -1,6 +1,7 @@
 #include "programs/corvelasticd/search_candidates.h"
 
 #include <algorithm>
+#include <cstdint>
 #include <unordered_map>
 
 namespace corvlumex {
@@ -99,10 +100,22 @@ bool RankedMatchCandidates::LoadNextWindow() {
   for (size_t run = 0; run < window_.size();) {
     size_t run_end = run + 1;
     while (run_end < window_.size() && window_[run_end].rank == window_[run].rank) ++run_end;
-    if (run_end - run > 1) OrderRun(run, run_end);
+    // The window is loaded when the last one has been served whole.
+    if (run_end - run > 1 && RunNeedsOrder(served_ + run, served_ + run_end)) OrderRun(run, run_end);
     run = run_end;
   }
   return !window_.empty();
+}
+
+void RankedMatchCandidates::CountOnly(size_t count) {
+  count_only_ = true;
+  cut_ = count > SIZE_MAX - served_ ? SIZE_MAX : served_ + count;
+}
+
+bool RankedMatchCandidates::RunNeedsOrder(size_t begin, size_t end) const {
+  // Before the cut every member is counted whatever its place, past it none
+  // is; only a run the cut divides decides which members are counted.
+  return !count_only_ || (begin < cut_ && cut_ < end);
 }
 
 void RankedMatchCandidates::OrderRun(size_t begin, size_t end) {
@@ -136,6 +149,7 @@ void RankedMatchCandidates::OrderRun(size_t begin, size_t end) {
 bool RankedMatchCandidates::Next(int64_t* rowid, Hit* hit) {
   if (window_next_ >= window_.size() && !LoadNextWindow()) return false;
   Candidate& candidate = window_[window_next_++];
+  ++served_;
   *rowid = candidate.rowid;
   hit->key = std::move(candidate.key);
   hit->score = -candidate.rank;  // the tier bonus is part of it
