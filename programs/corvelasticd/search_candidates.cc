@@ -4,6 +4,8 @@
 #include <cstdint>
 #include <unordered_map>
 
+#include "programs/corvelasticd/rank_function.h"
+
 namespace corvlumex {
 namespace elasticd {
 namespace {
@@ -45,8 +47,11 @@ RankedMatchCandidates::RankedMatchCandidates(Database& reader, const std::string
                                              int recency_code, const KeyDirectory* keys, uint64_t keys_at)
     : keys_of_rows_(reader.Cached(KeysOfRowsSql())), reader_(reader), recency_code_(recency_code), keys_(keys),
       keys_at_(keys_at) {
-  Statement& matches = reader.Cached("SELECT rowid, " + rank_expression + " FROM fts_text WHERE fts_text MATCH ?");
+  Statement& matches = reader.Cached("SELECT rowid, " + rank_expression + " FROM fts_text WHERE fts_text MATCH ?1");
   matches.BindText(1, match);
+  // The scores take the lengths of rows from the directory (rank_function.h).
+  RowLengths lengths{keys_, keys_at_};
+  matches.BindPointer(kLengthsParameter, &lengths, kRowLengthsType);
   while (matches.Step()) {
     const int64_t rowid = matches.Int(0);
     ranked_.emplace_back(matches.Real(1) - tiers.Bonus(rowid), rowid);

@@ -57,9 +57,12 @@ class StatementCandidates : public SearchCandidates {
 class RankedMatchCandidates : public SearchCandidates {
  public:
   // `keys` (may be null) gives the keys when it is at generation `keys_at`
-  // (the reader's snapshot), else they are read from "docs".
+  // (the reader's snapshot), else they are read from "docs"; so for the
+  // rows' lengths, when `rank_expression` scores with corv_bm25 and takes
+  // them from parameter kLengthsParameter.
   RankedMatchCandidates(Database& reader, const std::string& match, const std::string& rank_expression,
                         const NameTiers& tiers, int recency_code, const KeyDirectory* keys, uint64_t keys_at);
+  static constexpr int kLengthsParameter = 2;
   bool Next(int64_t* rowid, Hit* hit) override;
   // Runs of equal scores that lie wholly inside the counted candidates (or
   // past them) are then left unordered: ordering one reads each member's
