@@ -158,6 +158,53 @@ TEST_F(PrefixRankTest, TiedScoresArePagedByTheRuleAndCountedOverTheSameHitsAsWit
   EXPECT_GT(inexact, 20);  // budgets that end inside the runs were tried
 }
 
+// Scores take each row's length from memory, kept from the build of the
+// key directory: a document changed since (updated under the same key,
+// renamed, replaced, new) must score what the index itself says, as the
+// same clause beside a filter, scored by FTS5's bm25, does.
+TEST_F(PrefixRankTest, ScoresFollowTheLengthsOfDocumentsChangedAfterTheFirstSearch) {
+  const auto put = [&](const std::string& key, const std::string& body) {
+    Json::Value document;
+    document["path"] = key;
+    document["name"] = "x";
+    document["body"] = body;
+    store_->Upsert(key, document);
+  };
+  put("/o/a", "omega");
+  put("/o/b", "omega beta");
+  put("/o/c", "omega beta gamma delta");
+  store_->Commit();
+  struct Step {
+    const char* what;
+    std::function<void()> change;
+  };
+  const Step steps[] = {
+      {"nothing changed", [] {}},
+      {"updated longer under the same key", [&] { put("/o/a", "omega one two three four five six"); }},
+      {"updated shorter under the same key", [&] { put("/o/c", "omega"); }},
+      {"changed by set", [&] { store_->SetById("/o/b", JsonOf(R"({"body": "omega beta gamma delta epsilon"})")); }},
+      {"renamed", [&] { store_->SetById("/o/a", JsonOf(R"({"path": "/o/z", "body": "omega two"})")); }},
+      {"deleted and a new one", [&] {
+         store_->DeleteById("/o/c");
+         put("/o/d", "omega omega");
+       }},
+  };
+  const std::string lone = R"({"match": {"_all": "omega"}})";
+  const std::string filtered = R"({"bool": {"must": [{"match": {"_all": "omega"}}], "filter": [{"prefix": {"path": "/"}}]}})";
+  SortSpec by_score;
+  by_score.by = SortSpec::By::kScore;
+  for (const Step& step : steps) {
+    SCOPED_TRACE(step.what);
+    step.change();
+    store_->Commit();
+    const SearchResult scored = store_->Search(Query::Parse(JsonOf(lone), store_->schema()), by_score, 10, 100, nullptr);
+    const SearchResult reference = store_->Search(Query::Parse(JsonOf(filtered), store_->schema()), by_score, 10, 100, nullptr);
+    ASSERT_EQ(KeysOf(scored), KeysOf(reference));
+    ASSERT_EQ(scored.hits.size(), 3u);
+    for (size_t i = 0; i < scored.hits.size(); ++i) EXPECT_EQ(scored.hits[i].score, reference.hits[i].score) << scored.hits[i].key;
+  }
+}
+
 }  // namespace
 }  // namespace elasticd
 }  // namespace corvlumex
