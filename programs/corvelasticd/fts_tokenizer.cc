@@ -45,6 +45,8 @@ void FoldFunction(sqlite3_context* context, int, sqlite3_value** argv) {
   sqlite3_result_text64(context, folded.data(), folded.size(), SQLITE_TRANSIENT, SQLITE_UTF8);
 }
 
+}  // namespace
+
 fts5_api* Fts5Api(sqlite3* db) {
   fts5_api* api = nullptr;
   sqlite3_stmt* stmt = nullptr;
@@ -55,8 +57,6 @@ fts5_api* Fts5Api(sqlite3* db) {
   sqlite3_finalize(stmt);
   return api;
 }
-
-}  // namespace
 
 void RegisterTokenizer(sqlite3* db) {
   fts5_api* api = Fts5Api(db);

@@ -12,5 +12,8 @@ namespace elasticd {
 // (Fold with FoldMode::kSearch) on the connection. Throws DaemonError.
 void RegisterTokenizer(sqlite3* db);
 
+// The connection's FTS5 interface, to register tokenizers and functions; null without FTS5.
+fts5_api* Fts5Api(sqlite3* db);
+
 }  // namespace elasticd
 }  // namespace corvlumex

@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <cstdint>
 #include <cstring>
 #include <unordered_map>
 
@@ -65,6 +66,29 @@ bool NextBatch(SearchCandidates& candidates, std::vector<Hit>* batch, std::vecto
     batch->push_back(std::move(hit));
   }
   return true;
+}
+
+// The sum of a docsize record's column sizes (SQLite varints), as FTS5's
+// xColumnSize(-1) gives it.
+uint32_t TokenCount(std::string_view record) {
+  uint64_t total = 0;
+  size_t i = 0;
+  while (i < record.size()) {
+    uint64_t value = 0;
+    int bytes = 0;
+    // Up to 8 bytes carry 7 bits each, a ninth all 8.
+    while (i < record.size()) {
+      const auto byte = static_cast<unsigned char>(record[i++]);
+      if (++bytes == 9) {
+        value = (value << 8) | byte;
+        break;
+      }
+      value = (value << 7) | (byte & 0x7F);
+      if ((byte & 0x80) == 0) break;
+    }
+    total += static_cast<uint32_t>(value);
+  }
+  return static_cast<uint32_t>(total);
 }
 
 std::vector<std::string> KeysOf(const std::vector<Hit>& hits) {
@@ -404,6 +428,7 @@ void IndexStore::Upsert(const std::string& doc_id, const Json::Value& input) {
       update.Step();
       update.Reset();
       transaction_bytes_ += static_cast<int64_t>(stored.size());
+      NoteKeyChange(row.rowid, key);  // the same key, but the row's length in the word index may change
       IndexEntries(row.rowid, document, false);
     } else {
       Statement& insert = writer_->Cached("INSERT INTO docs(key, doc) VALUES(?, ?)");
@@ -654,6 +679,9 @@ void IndexStore::BuildKeyDirectory(Database& reader) {
     try {
       auto scan = reader.Prepare("SELECT rowid, key FROM docs");
       while (scan->Step()) keys_.Add(scan->Int(0), scan->Text(1));
+      // The rows' lengths as BM25 reads them: a varint per column of the word index.
+      auto sizes = reader.Prepare("SELECT id, sz FROM fts_text_docsize");
+      while (sizes->Step()) keys_.AddLength(sizes->Int(0), TokenCount(sizes->Bytes(1)));
       complete = true;
     } catch (...) {
       reader.Exec("ROLLBACK");
@@ -707,8 +735,9 @@ IndexStore::SearchPlan IndexStore::PlanSearch(const Query& query, const SortSpec
 std::unique_ptr<SearchCandidates> IndexStore::OpenCandidates(Database& reader, const Query& query, const SearchPlan& plan,
                                                              const NameTiers& tiers, uint64_t keys_at) {
   if (plan.ranked_alone()) {
-    return std::make_unique<RankedMatchCandidates>(reader, query.RankedExpression(), plan.rank_expression, tiers,
-                                                   plan.recency_code, &keys_, keys_at);
+    return std::make_unique<RankedMatchCandidates>(
+        reader, query.RankedExpression(), WeightedRankWithLengths(schema_, RankedMatchCandidates::kLengthsParameter),
+        tiers, plan.recency_code, &keys_, keys_at);
   }
   std::vector<SqlValue> select_values = plan.values;
   std::string order = plan.order;
@@ -738,6 +767,7 @@ void IndexStore::CollectHits(Database& reader, SearchCandidates& candidates, con
   std::vector<Hit> batch;
   std::vector<int64_t> rowids;
   size_t checked_past_page = 0;
+  bool page_told = false;  // the candidates know the page is full
   bool more = true;
   Statement& load = reader.Cached("SELECT doc FROM docs WHERE rowid = ?");
   while (more) {
@@ -768,6 +798,14 @@ void IndexStore::CollectHits(Database& reader, SearchCandidates& candidates, con
         int64_t rowid = 0;
         result->total_exact = !candidates.Next(&rowid, &rest);
         return;
+      }
+      if (!page_told) {
+        // From here on whole batches are only counted, until the budget is
+        // spent: which candidates they are matters, not their order.
+        const size_t left = check_budget - checked_past_page;
+        const size_t batches = left / kFilterBatch + (left % kFilterBatch != 0 ? 1 : 0);
+        candidates.CountOnly(batches > SIZE_MAX / kFilterBatch ? SIZE_MAX : batches * kFilterBatch);
+        page_told = true;
       }
     }
   }

@@ -1,5 +1,7 @@
 #include "programs/corvelasticd/key_directory.h"
 
+#include <algorithm>
+
 namespace corvlumex {
 namespace elasticd {
 namespace {
@@ -13,6 +15,7 @@ constexpr int64_t kMaxRowid = int64_t{1} << 32;  // beyond: rows too sparse for 
 bool KeyDirectory::Table::Set(int64_t rowid, const std::optional<std::string>& key) {
   if (rowid < 0 || rowid >= kMaxRowid) return false;
   const size_t index = static_cast<size_t>(rowid);
+  if (index < lengths.size()) lengths[index] = kUnknownLength;
   if (index >= slots.size()) {
     if (!key) return true;
     slots.resize(std::max(index + 1, slots.size() + slots.size() / 2), 0);
@@ -24,6 +27,14 @@ bool KeyDirectory::Table::Set(int64_t rowid, const std::optional<std::string>& k
   slots[index] = (static_cast<uint64_t>(arena.size()) << 24) | (key->size() + 1);
   arena += *key;
   if (garbage > (16u << 20) && garbage > arena.size() / 2) Compact();
+  return true;
+}
+
+bool KeyDirectory::Table::SetLength(int64_t rowid, uint32_t length) {
+  if (rowid < 0 || rowid >= kMaxRowid) return false;
+  const size_t index = static_cast<size_t>(rowid);
+  if (index >= lengths.size()) lengths.resize(std::max(index + 1, lengths.size() + lengths.size() / 2), kUnknownLength);
+  lengths[index] = length;
   return true;
 }
 
@@ -69,6 +80,10 @@ void KeyDirectory::Add(int64_t rowid, const std::string& key) {
   if (building_ok_) building_ok_ = building_table_.Set(rowid, key);
 }
 
+void KeyDirectory::AddLength(int64_t rowid, uint32_t length) {
+  if (building_ok_) building_ok_ = building_table_.SetLength(rowid, length);
+}
+
 void KeyDirectory::FinishBuild(uint64_t at, bool complete) {
   {
     std::unique_lock<std::shared_mutex> guard(mutex_);
@@ -95,6 +110,14 @@ bool KeyDirectory::Lookup(uint64_t at, const std::vector<int64_t>& rowids, std::
     }
   }
   return true;
+}
+
+bool KeyDirectory::Length(uint64_t at, int64_t rowid, uint32_t* length) const {
+  std::shared_lock<std::shared_mutex> guard(mutex_);
+  if (at % 2 != 0 || !ready_.load(std::memory_order_acquire) || generation_.load(std::memory_order_acquire) != at) return false;
+  if (rowid < 0 || static_cast<uint64_t>(rowid) >= table_.lengths.size()) return false;
+  *length = table_.lengths[static_cast<size_t>(rowid)];
+  return *length != Table::kUnknownLength;
 }
 
 }  // namespace elasticd

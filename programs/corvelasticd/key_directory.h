@@ -10,6 +10,11 @@
 // same even number, its snapshot is the directory's state, and every lookup
 // checks (under the shared lock the commit's update waits for) that it still
 // is. Otherwise the reader reads the keys from "docs".
+//
+// It also keeps each row's length in the word index (its token count, as
+// FTS5's docsize table holds it) for BM25, whose lookups of it cost most of
+// a search that matches thousands of documents. Lengths come only from the
+// build's scan: a row changed since is "unknown" and read from the index.
 #pragma once
 
 #include <atomic>
@@ -42,6 +47,7 @@ class KeyDirectory {
   // Only one caller builds at a time; false when another is building.
   bool TryStartBuild();
   void Add(int64_t rowid, const std::string& key);  // while building
+  void AddLength(int64_t rowid, uint32_t length);    // while building, after the row's key
   // Installs what was added when no commit happened since `at`; ends the build.
   void FinishBuild(uint64_t at, bool complete);
 
@@ -49,13 +55,20 @@ class KeyDirectory {
   // The keys of `rowids` (nullopt: no such row) as of generation `at`;
   // false (nothing filled) when the directory is not at that generation.
   bool Lookup(uint64_t at, const std::vector<int64_t>& rowids, std::vector<std::optional<std::string>>* keys) const;
+  // The row's length as of generation `at`; false when it is not known
+  // (another generation, a row changed since the build, no such row).
+  bool Length(uint64_t at, int64_t rowid, uint32_t* length) const;
 
  private:
   struct Table {
     std::vector<uint64_t> slots;  // by rowid: 0 = no row, else (offset << 24) | (length + 1)
     std::string arena;            // the keys' bytes
+    std::vector<uint32_t> lengths;  // by rowid, kUnknownLength when not known
     size_t garbage = 0;           // bytes of replaced keys
+    static constexpr uint32_t kUnknownLength = UINT32_MAX;
+    // A changed row's length becomes unknown.
     bool Set(int64_t rowid, const std::optional<std::string>& key);
+    bool SetLength(int64_t rowid, uint32_t length);
     void Compact();
   };
 

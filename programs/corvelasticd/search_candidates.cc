@@ -1,7 +1,10 @@
 #include "programs/corvelasticd/search_candidates.h"
 
 #include <algorithm>
+#include <cstdint>
 #include <unordered_map>
+
+#include "programs/corvelasticd/rank_function.h"
 
 namespace corvlumex {
 namespace elasticd {
@@ -44,8 +47,11 @@ RankedMatchCandidates::RankedMatchCandidates(Database& reader, const std::string
                                              int recency_code, const KeyDirectory* keys, uint64_t keys_at)
     : keys_of_rows_(reader.Cached(KeysOfRowsSql())), reader_(reader), recency_code_(recency_code), keys_(keys),
       keys_at_(keys_at) {
-  Statement& matches = reader.Cached("SELECT rowid, " + rank_expression + " FROM fts_text WHERE fts_text MATCH ?");
+  Statement& matches = reader.Cached("SELECT rowid, " + rank_expression + " FROM fts_text WHERE fts_text MATCH ?1");
   matches.BindText(1, match);
+  // The scores take the lengths of rows from the directory (rank_function.h).
+  RowLengths lengths{keys_, keys_at_};
+  matches.BindPointer(kLengthsParameter, &lengths, kRowLengthsType);
   while (matches.Step()) {
     const int64_t rowid = matches.Int(0);
     ranked_.emplace_back(matches.Real(1) - tiers.Bonus(rowid), rowid);
@@ -99,10 +105,22 @@ bool RankedMatchCandidates::LoadNextWindow() {
   for (size_t run = 0; run < window_.size();) {
     size_t run_end = run + 1;
     while (run_end < window_.size() && window_[run_end].rank == window_[run].rank) ++run_end;
-    if (run_end - run > 1) OrderRun(run, run_end);
+    // The window is loaded when the last one has been served whole.
+    if (run_end - run > 1 && RunNeedsOrder(served_ + run, served_ + run_end)) OrderRun(run, run_end);
     run = run_end;
   }
   return !window_.empty();
+}
+
+void RankedMatchCandidates::CountOnly(size_t count) {
+  count_only_ = true;
+  cut_ = count > SIZE_MAX - served_ ? SIZE_MAX : served_ + count;
+}
+
+bool RankedMatchCandidates::RunNeedsOrder(size_t begin, size_t end) const {
+  // Before the cut every member is counted whatever its place, past it none
+  // is; only a run the cut divides decides which members are counted.
+  return !count_only_ || (begin < cut_ && cut_ < end);
 }
 
 void RankedMatchCandidates::OrderRun(size_t begin, size_t end) {
@@ -136,6 +154,7 @@ void RankedMatchCandidates::OrderRun(size_t begin, size_t end) {
 bool RankedMatchCandidates::Next(int64_t* rowid, Hit* hit) {
   if (window_next_ >= window_.size() && !LoadNextWindow()) return false;
   Candidate& candidate = window_[window_next_++];
+  ++served_;
   *rowid = candidate.rowid;
   hit->key = std::move(candidate.key);
   hit->score = -candidate.rank;  // the tier bonus is part of it

@@ -22,6 +22,11 @@ class SearchCandidates {
   virtual ~SearchCandidates() = default;
   // Fills the next candidate (key, score, sort value); false when there is none.
   virtual bool Next(int64_t* rowid, Hit* hit) = 0;
+  // The caller's page is full: of the next `count` candidates it only
+  // counts the readable ones, and past them it asks only whether one more
+  // exists. They must be the same `count` candidates as in the full order,
+  // but may come in any order among themselves.
+  virtual void CountOnly(size_t /*count*/) {}
 };
 
 // The rows of a statement that selects (rowid, key, rank or 0, sort value).
@@ -52,10 +57,18 @@ class StatementCandidates : public SearchCandidates {
 class RankedMatchCandidates : public SearchCandidates {
  public:
   // `keys` (may be null) gives the keys when it is at generation `keys_at`
-  // (the reader's snapshot), else they are read from "docs".
+  // (the reader's snapshot), else they are read from "docs"; so for the
+  // rows' lengths, when `rank_expression` scores with corv_bm25 and takes
+  // them from parameter kLengthsParameter.
   RankedMatchCandidates(Database& reader, const std::string& match, const std::string& rank_expression,
                         const NameTiers& tiers, int recency_code, const KeyDirectory* keys, uint64_t keys_at);
+  static constexpr int kLengthsParameter = 2;
   bool Next(int64_t* rowid, Hit* hit) override;
+  // Runs of equal scores that lie wholly inside the counted candidates (or
+  // past them) are then left unordered: ordering one reads each member's
+  // date from its document, a random page of "docs", and a prefix matches
+  // a thousand documents whose scores mostly tie.
+  void CountOnly(size_t count) override;
 
  private:
   struct Candidate {
@@ -67,6 +80,8 @@ class RankedMatchCandidates : public SearchCandidates {
   };
   // Reads the recency of a run of equal scores and orders it.
   void OrderRun(size_t begin, size_t end);
+  // Whether the run of candidates served at positions [begin, end) must be ordered.
+  bool RunNeedsOrder(size_t begin, size_t end) const;
   // Reads the keys of the next window of matches (whole runs of equal
   // scores) and puts each run in key order.
   bool LoadNextWindow();
@@ -80,6 +95,9 @@ class RankedMatchCandidates : public SearchCandidates {
   size_t next_ = 0;
   std::vector<Candidate> window_;
   size_t window_next_ = 0;
+  size_t served_ = 0;       // candidates handed out by Next
+  bool count_only_ = false;  // CountOnly was called: order matters only at `cut_`
+  size_t cut_ = 0;           // the position where the caller stops counting
 };
 
 }  // namespace elasticd

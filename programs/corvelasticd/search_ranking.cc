@@ -65,8 +65,11 @@ int NameTiers::Tier(int64_t rowid) const {
   return named_.count(rowid) != 0 ? 1 : 2;
 }
 
-std::string WeightedRank(const IndexSchema& schema) {
-  std::string out = "bm25(fts_text";
+namespace {
+
+// ", w1, w2, ...)": the weights of the word index's columns, and the call's end.
+std::string ColumnWeights(const IndexSchema& schema) {
+  std::string out;
   const std::vector<const FieldSpec*> fields = schema.TextFields();
   for (const FieldSpec* field : fields) {
     const double weight = field->kind == FieldKind::kNgram        ? kNameWeight
@@ -76,6 +79,14 @@ std::string WeightedRank(const IndexSchema& schema) {
   }
   if (fields.empty()) out += ", 1.0";  // the placeholder column
   return out + ")";
+}
+
+}  // namespace
+
+std::string WeightedRank(const IndexSchema& schema) { return "bm25(fts_text" + ColumnWeights(schema); }
+
+std::string WeightedRankWithLengths(const IndexSchema& schema, int lengths) {
+  return "corv_bm25(fts_text, ?" + std::to_string(lengths) + ColumnWeights(schema);
 }
 
 int RecencyCode(const IndexSchema& schema) {

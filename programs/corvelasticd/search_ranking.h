@@ -38,6 +38,8 @@ class NameTiers {
 
 // bm25(fts_text, ...) with a weight for each column of the word index.
 std::string WeightedRank(const IndexSchema& schema);
+// The same score by corv_bm25 (rank_function.h), its row lengths bound to parameter `lengths`.
+std::string WeightedRankWithLengths(const IndexSchema& schema, int lengths);
 
 // Field code of the recency tie-break, or -1 when the schema has none.
 int RecencyCode(const IndexSchema& schema);

@@ -3,6 +3,7 @@
 #include "programs/corvelasticd/daemon_error.h"
 #include "programs/corvelasticd/document_codec.h"
 #include "programs/corvelasticd/fts_tokenizer.h"
+#include "programs/corvelasticd/rank_function.h"
 
 namespace corvlumex {
 namespace elasticd {
@@ -35,6 +36,11 @@ void Statement::BindText(int index, std::string_view text) {
 
 void Statement::BindBlob(int index, std::string_view bytes) {
   const int rc = sqlite3_bind_blob64(stmt_, index, bytes.data(), bytes.size(), SQLITE_TRANSIENT);
+  if (rc != SQLITE_OK) ThrowSqlite(db_, rc, "bind");
+}
+
+void Statement::BindPointer(int index, void* pointer, const char* type) {
+  const int rc = sqlite3_bind_pointer(stmt_, index, pointer, type, nullptr);
   if (rc != SQLITE_OK) ThrowSqlite(db_, rc, "bind");
 }
 
@@ -80,6 +86,7 @@ Database::Database(const std::string& path, bool create) {
   sqlite3_extended_result_codes(db_, 1);
   sqlite3_busy_timeout(db_, 5000);
   RegisterTokenizer(db_);
+  RegisterRankFunction(db_);
   RegisterDocumentFunctions(db_);
 }
 

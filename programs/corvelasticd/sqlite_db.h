@@ -29,6 +29,8 @@ class Statement {
   void Bind(int index, const SqlValue& value);
   void BindText(int index, std::string_view text);
   void BindBlob(int index, std::string_view bytes);
+  // A pointer for an SQL function that asks for `type` (it must outlive the statement's run).
+  void BindPointer(int index, void* pointer, const char* type);
   void BindAll(const std::vector<SqlValue>& values);
   // True while a row is available.
   bool Step();
