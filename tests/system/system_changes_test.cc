@@ -177,7 +177,10 @@ TEST_F(SystemChangesTest, AFileRewrittenAgainAndAgainIsExtractedOncePerSettleInt
   ASSERT_TRUE(Finds("tail39", {"docs/noisy.log"}));
   ASSERT_EQ(box_.Converge(Docs()), "");
   // ...after far fewer extractions than changes (300 ms, then 600, 1200...).
-  EXPECT_LE(box_.Extracted() - before, 8u);
+  // About 6 on an idle machine; a loaded one can stall the writer long enough
+  // for the file to count as quiet and start over, so the bound leaves room
+  // (the doubling itself is checked with time passed in, in SettleTrackerTest).
+  EXPECT_LE(box_.Extracted() - before, 12u);
 }
 
 }  // namespace

@@ -10,6 +10,7 @@
 #include <algorithm>
 #include <cstdlib>
 #include <filesystem>
+#include <functional>
 #include <sstream>
 #include <thread>
 
@@ -62,17 +63,38 @@ bool MidBatch(SystemSandbox& box) {
       std::chrono::seconds(30));
 }
 
+// Files written by `write` (which answers the name of the last one) while
+// indexing is paused, so that they make one batch when it resumes; returns
+// once the batch is under way. Written with indexing running, a loaded
+// machine can index them in many small rounds as they arrive.
+void StartABulkBatch(SystemSandbox& box, const std::function<std::string()>& write) {
+  fileindex::StatusMgr().Pause(0);
+  const std::string last = write();
+  ASSERT_TRUE(QueueHolds(box, last));
+  fileindex::StatusMgr().Resume();
+  ASSERT_TRUE(MidBatch(box)) << box.Logs();
+}
+
+void StartABulkBatch(SystemSandbox& box, const std::string& relative, int files) {
+  StartABulkBatch(box, [&] {
+    for (int i = 0; i < files; ++i) WriteText(box.Path(relative + "/f" + std::to_string(i) + ".txt"), "bulk " + std::to_string(i));
+    return "f" + std::to_string(files - 1) + ".txt";
+  });
+}
+
 TEST(SystemCrashTest, KillDuringALargeBatchThenRestartConverges) {
   SystemSandbox box;
   ASSERT_NO_FATAL_FAILURE(StartWithFolder(box, "bulk"));
-  for (int dir = 0; dir < 10; ++dir) {
-    fs::create_directories(box.Path("bulk/d" + std::to_string(dir)));
-    for (int i = 0; i < 150; ++i) {
-      WriteText(box.Path("bulk/d" + std::to_string(dir) + "/f" + std::to_string(i) + ".txt"),
-                "bulk file " + std::to_string(dir * 1000 + i));
+  ASSERT_NO_FATAL_FAILURE(StartABulkBatch(box, [&] {
+    for (int dir = 0; dir < 10; ++dir) {
+      fs::create_directories(box.Path("bulk/d" + std::to_string(dir)));
+      for (int i = 0; i < 150; ++i) {
+        WriteText(box.Path("bulk/d" + std::to_string(dir) + "/f" + std::to_string(i) + ".txt"),
+                  "bulk file " + std::to_string(dir * 1000 + i));
+      }
     }
-  }
-  ASSERT_TRUE(MidBatch(box)) << box.Logs();
+    return std::string("/bulk/d9/f149.txt");
+  }));
   box.StopIndexer(SIGKILL);
   // Changes while the indexer is down wait in the queue.
   ASSERT_EQ(unlink(box.Path("bulk/d0/f0.txt").c_str()), 0);
@@ -122,16 +144,6 @@ TEST(SystemCrashTest, AFolderRenameCutShortByACrashLeavesNoGhosts) {
   ASSERT_TRUE(QueueHolds(box, "/big/C"));
   box.StartIndexer();
   ASSERT_EQ(box.Converge(box.DiskPaths("big"), std::chrono::seconds(60)), "");
-}
-
-// Files written into `relative` while indexing is paused, so that they make
-// one batch when it resumes; returns once the batch is under way.
-void StartABulkBatch(SystemSandbox& box, const std::string& relative, int files) {
-  fileindex::StatusMgr().Pause(0);
-  for (int i = 0; i < files; ++i) WriteText(box.Path(relative + "/f" + std::to_string(i) + ".txt"), "bulk " + std::to_string(i));
-  ASSERT_TRUE(QueueHolds(box, "f" + std::to_string(files - 1) + ".txt"));
-  fileindex::StatusMgr().Resume();
-  ASSERT_TRUE(MidBatch(box)) << box.Logs();
 }
 
 size_t CountBelow(const std::set<std::string>& paths, const std::string& folder) {
