@@ -386,9 +386,16 @@ void IndexStore::FlushIndexWrites() {
 
 void IndexStore::Upsert(const std::string& doc_id, const Json::Value& input) {
   if (!input.isObject()) BadDocument("\"data\" must be a JSON object");
-  Json::Value document = input;
+  // The document is used as sent when it names its key (the indexer's
+  // always do): a copy of a large text is megabytes the daemon holds twice.
   const std::string& id_field = schema_.property_id();
-  if (!document.isMember(id_field) || document[id_field].isNull()) document[id_field] = doc_id;
+  const Json::Value* named = input.find(id_field.data(), id_field.data() + id_field.size());
+  Json::Value with_key;
+  if (named == nullptr || named->isNull()) {
+    with_key = input;
+    with_key[id_field] = doc_id;
+  }
+  const Json::Value& document = with_key.isNull() ? input : with_key;
   ValidateDocument(document);
   const std::string key = document[id_field].asString();
   Atomically([&] {
