@@ -28,7 +28,7 @@ constexpr size_t kMaxKeyChanges = 1000000;  // rows changed in one transaction k
 constexpr size_t kMaxReaders = 4;
 constexpr int kReaderCacheKb = 16384;
 // Full-text rows queued beyond this are handed to the engine before the next request.
-constexpr size_t kMaxPendingIndexBytes = 16u << 20;
+constexpr size_t kMaxPendingIndexBytes = 4u << 20;
 
 WalLimits g_wal_limits;
 std::mutex g_wal_limits_mutex;
