@@ -20,9 +20,10 @@ namespace extract {
 namespace {
 
 // Elements that stand on lines of their own.
-constexpr const char* kBlocks[] = {"p",  "div",   "br",         "li",      "tr",     "td",     "th",    "h1",
-                                   "h2", "h3",    "h4",         "h5",      "h6",     "title",  "pre",   "blockquote",
-                                   "section", "article", "header", "footer", "table", "ul", "ol", "dt", "dd"};
+constexpr const char* kBlocks[] = {"p",     "div",     "br",         "li",      "tr",     "td",     "th",
+                                   "h1",    "h2",      "h3",         "h4",      "h5",     "h6",     "title",
+                                   "pre",   "section", "blockquote", "article", "header", "footer", "table",
+                                   "ul",    "ol",      "dt",         "dd"};
 // Elements whose content is not the page's text.
 constexpr const char* kSkipped[] = {"script", "style", "head", "template"};
 
