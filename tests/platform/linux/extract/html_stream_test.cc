@@ -29,7 +29,7 @@ PageRead Read(const std::string& page, size_t chunk, size_t cap = kTextContentCa
 struct PageCase {
   const char* name;
   std::string page;
-  const char* text;
+  std::string text;
   const char* title;
   const char* description;
   const char* author;
@@ -71,7 +71,7 @@ TEST(HtmlStreamTest, PagesGiveTheTextAndHeadOfTheirTree) {
          for (int i = 0; i < 300; ++i) deep += "<span>a";
          return deep;
        }() + "lost",
-       std::string(255, 'a').c_str(), "", "", "", ""},
+       std::string(255, 'a'), "", "", "", ""},
   };
   for (const PageCase& c : cases) {
     for (size_t chunk : {size_t{1}, size_t{4096}, kHtmlChunk}) {
