@@ -5,6 +5,7 @@
 #include <cerrno>
 #include <chrono>
 #include <cstdlib>
+#include <utility>
 
 #include "common/error.h"
 #include "common/file_util.h"
@@ -87,11 +88,12 @@ Json::Value ExtractDocument(const std::string& path, bool need_meta) {
   return document;
 }
 
+// The document is moved into the request: a large text is held once less.
 void SendDocument(const std::string& command, const std::string& share, const std::string& path,
-                  const Json::Value& document) {
+                  Json::Value document) {
   Json::Value req = MakeRequest(command, share);
   req["data"]["doc_id"] = path;
-  req["data"]["data"] = document;
+  req["data"]["data"] = std::move(document);
   SendRequestNoResult(req);
 }
 

@@ -190,9 +190,10 @@ bool Dispatcher::MayWrite(const PeerIdentity& peer) const {
   return peer.uid == 0 || std::find(options_.writer_uids.begin(), options_.writer_uids.end(), peer.uid) != options_.writer_uids.end();
 }
 
-std::string Dispatcher::Handle(const std::string& text, const PeerIdentity& peer) {
+std::string Dispatcher::Handle(std::string text, const PeerIdentity& peer) {
   Json::Value request;
   if (!ParseJsonText(text, &request)) return ErrorAnswer(kCodeBadRequest, "The request is not valid JSON");
+  std::string().swap(text);
   return JsonText(HandleRequest(request, peer, false));
 }
 

@@ -25,7 +25,9 @@ class Dispatcher {
  public:
   Dispatcher(IndexRegistry& registry, DispatchOptions options) : registry_(registry), options_(std::move(options)) {}
 
-  std::string Handle(const std::string& text, const PeerIdentity& peer);
+  // Takes the request text to let it go once parsed: a large document's
+  // text is not held as text and as JSON while it is stored.
+  std::string Handle(std::string text, const PeerIdentity& peer);
   // The answer for a failure found before any request could be read.
   static std::string ErrorAnswer(int code, const std::string& message);
 

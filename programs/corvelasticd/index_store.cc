@@ -29,7 +29,7 @@ constexpr size_t kMaxKeyChanges = 1000000;  // rows changed in one transaction k
 constexpr size_t kMaxReaders = 4;
 constexpr int kReaderCacheKb = 16384;
 // Full-text rows queued beyond this are handed to the engine before the next request.
-constexpr size_t kMaxPendingIndexBytes = 16u << 20;
+constexpr size_t kMaxPendingIndexBytes = 4u << 20;
 
 WalLimits g_wal_limits;
 std::mutex g_wal_limits_mutex;
@@ -410,9 +410,16 @@ void IndexStore::FlushIndexWrites() {
 
 void IndexStore::Upsert(const std::string& doc_id, const Json::Value& input) {
   if (!input.isObject()) BadDocument("\"data\" must be a JSON object");
-  Json::Value document = input;
+  // The document is used as sent when it names its key (the indexer's
+  // always do): a copy of a large text is megabytes the daemon holds twice.
   const std::string& id_field = schema_.property_id();
-  if (!document.isMember(id_field) || document[id_field].isNull()) document[id_field] = doc_id;
+  const Json::Value* named = input.find(id_field.data(), id_field.data() + id_field.size());
+  Json::Value with_key;
+  if (named == nullptr || named->isNull()) {
+    with_key = input;
+    with_key[id_field] = doc_id;
+  }
+  const Json::Value& document = with_key.isNull() ? input : with_key;
   ValidateDocument(document);
   const std::string key = document[id_field].asString();
   Atomically([&] {

@@ -208,8 +208,10 @@ void Server::Serve(int fd, const PeerIdentity& peer) {
       return;
     }
     if (status != FrameStatus::kOk) return;
-    SendAnswer(fd, AnswerTo(request, peer));
-    if (request.size() >= kTrimAfterBytes) {
+    const size_t request_bytes = request.size();
+    // Handed over whole: the request's text is let go once it is parsed.
+    SendAnswer(fd, AnswerTo(std::move(request), peer));
+    if (request_bytes >= kTrimAfterBytes) {
       // A large document passes through several copies (frame, JSON, tokens)
       // on whichever connection thread served it; each thread's heap would
       // keep that peak for good. Handing it back costs little beside the
@@ -220,13 +222,14 @@ void Server::Serve(int fd, const PeerIdentity& peer) {
   }
 }
 
-std::string Server::AnswerTo(const std::string& request, const PeerIdentity& peer) {
+std::string Server::AnswerTo(std::string request, const PeerIdentity& peer) {
   // Whatever one request throws ends that request, never the daemon: an
   // exception leaving a worker thread would abort every search.
+  const size_t request_bytes = request.size();
   try {
-    return dispatcher_.Handle(request, peer);
+    return dispatcher_.Handle(std::move(request), peer);
   } catch (const std::bad_alloc&) {
-    CORV_LOG("a request of %zu bytes ran out of memory", request.size());
+    CORV_LOG("a request of %zu bytes ran out of memory", request_bytes);
     return Dispatcher::ErrorAnswer(kCodeInternal, "The daemon ran out of memory for this request");
   } catch (const std::exception& error) {
     CORV_LOG("a request failed unexpectedly: %s", error.what());

@@ -55,7 +55,7 @@ class Server {
  private:
   void Serve(int fd, const PeerIdentity& peer);
   // The answer to one request text; never throws.
-  std::string AnswerTo(const std::string& request, const PeerIdentity& peer);
+  std::string AnswerTo(std::string request, const PeerIdentity& peer);
   // With mutex_ held.
   void StartWorker();
   void WorkerLoop();

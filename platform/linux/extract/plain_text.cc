@@ -72,7 +72,7 @@ bool ReadPlainTextInProcess(int fd, const std::string& name, size_t size, size_t
   TextSink text(text_cap);
   text.Append(bytes.data() + (marked ? 3 : 0), bytes.size() - (marked ? 3 : 0));
   fields[kFieldMediaTypes] = PlainTextMediaType(extension);
-  const std::string content = text.Trimmed();
+  const std::string content = text.TakeTrimmed();
   if (!content.empty()) fields[kFieldTextContent] = content;
   return true;
 }

@@ -11,6 +11,7 @@
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
+#include <utility>
 #include <memory>
 #include <mutex>
 #include <vector>
@@ -151,7 +152,8 @@ class WorkerProcess {
     }
     broken_ = false;
     if (!reply["ok"].asBool()) Fail(reply["error"].isString() ? reply["error"].asString() : "extraction failed");
-    return reply["fields"];
+    // Moved out: a large text is not held twice.
+    return std::move(reply["fields"]);
   }
 
   bool Reusable(const ExtractLimits& limits) const { return !broken_ && used_ < limits.files_per_worker; }
@@ -309,7 +311,7 @@ Json::Value ExtractInWorker(int fd, const std::string& path, bool need_meta) {
   for (const std::string& name : fields.getMemberNames()) {
     FieldType type;
     if (ContentFieldType(name, &type) && ValueFitsType(fields[name], type)) {
-      checked[name] = fields[name];
+      checked[name] = std::move(fields[name]);
     } else {
       CORV_LOG("content extraction of %s: field %s dropped (unknown or of the wrong type)", path.c_str(),
                name.c_str());

@@ -80,6 +80,15 @@ std::string TextSink::Trimmed() const {
   return text_.substr(begin, end - begin + 1);
 }
 
+std::string TextSink::TakeTrimmed() {
+  const size_t end = text_.find_last_not_of(" \t\r\n");
+  text_.erase(end == std::string::npos ? 0 : end + 1);
+  text_.erase(0, text_.find_first_not_of(" \t\r\n"));
+  std::string taken;
+  taken.swap(text_);
+  return taken;
+}
+
 bool IsValidUtf8(const std::string& bytes) {
   const unsigned char* p = reinterpret_cast<const unsigned char*>(bytes.data());
   const size_t size = bytes.size();

@@ -36,6 +36,9 @@ class TextSink {
   const std::string& text() const { return text_; }
   // The text without blanks and line breaks at either end.
   std::string Trimmed() const;
+  // The same, handed over: the sink is left empty, and a text of megabytes
+  // is not copied.
+  std::string TakeTrimmed();
 
  private:
   void Put(const char* bytes, size_t size);
