@@ -1,4 +1,4 @@
-#include "tests/fileindex/optree/queue_fixture.h"
+#include "tests/fileindex/queue/queue_fixture.h"
 
 #include <sstream>
 

@@ -2,7 +2,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include "tests/fileindex/optree/queue_fixture.h"
+#include "tests/fileindex/queue/queue_fixture.h"
 
 namespace corvlumex {
 namespace fileindex {

@@ -6,7 +6,7 @@
 #include <vector>
 
 #include "common/log.h"
-#include "tests/fileindex/optree/queue_fixture.h"
+#include "tests/fileindex/queue/queue_fixture.h"
 
 namespace corvlumex {
 namespace fileindex {
