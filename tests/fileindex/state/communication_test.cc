@@ -1,6 +1,5 @@
 #include <signal.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 #include <gtest/gtest.h>
@@ -15,23 +14,18 @@
 #include "common/frame.h"
 #include "common/json_util.h"
 #include "common/sys.h"
-#include "common/frame.h"
 #include "fileindex/state/communication.h"
 #include "tests/fileindex/state/syscall_script.h"
+#include "tests/support/frame_client.h"
 #include "tests/support/sandbox.h"
-#include "tests/support/expect_error.h"
 
 namespace corvlumex {
 namespace fileindex {
 namespace {
 
-using testing_support::ErrorOf;
 using testing_support::FakeDaemon;
-using testing_support::LogCapture;
 using testing_support::OpenDescriptors;
-using testing_support::Sandbox;
 using testing_support::ScopedSyscallScript;
-using testing_support::SleepRecorder;
 using testing_support::SyscallScript;
 
 constexpr int P = SyscallScript::kPass;
@@ -54,16 +48,8 @@ std::string ReasonOf(Fn fn) {
 
 // A socket bound on the daemon's path of `root`, listening or not.
 int BindDaemonSocket(const Sandbox& root, bool listening) {
-  const std::string path = root.MakeDir("var/run") + "/fileindexd.sock";
-  const int fd = socket(AF_UNIX, SOCK_STREAM, 0);
-  struct sockaddr_un address;
-  memset(&address, 0, sizeof(address));
-  address.sun_family = AF_UNIX;
-  memcpy(address.sun_path, path.c_str(), path.size());
-  EXPECT_EQ(bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)), 0);
-  if (listening) {
-    EXPECT_EQ(listen(fd, 4), 0);
-  }
+  const int fd = testing_support::BindSocket(root.MakeDir("var/run") + "/fileindexd.sock", listening);
+  EXPECT_GE(fd, 0);
   return fd;
 }
 
