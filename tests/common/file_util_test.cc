@@ -18,17 +18,19 @@ namespace {
 using testing_support::Sandbox;
 
 TEST(PathTextTest, BasenameDirnameExtension) {
-  EXPECT_EQ(Dirname("file"), "file");
-  EXPECT_EQ(Dirname("/a"), "");
-  EXPECT_EQ(Dirname("/a/b/c"), "/a/b");
-  EXPECT_EQ(Basename("a/b/"), "");
-  EXPECT_EQ(Basename("plain"), "plain");
-  EXPECT_EQ(Basename("/x/y.txt"), "y.txt");
-  EXPECT_EQ(GetFileExtension("/x/Photo.JPG", true), "jpg");
+  for (const auto& [path, dirname] : std::vector<std::pair<std::string, std::string>>{
+           {"file", "file"}, {"/a", ""}, {"/a/b/c", "/a/b"}}) {
+    EXPECT_EQ(Dirname(path), dirname) << path;
+  }
+  for (const auto& [path, basename] : std::vector<std::pair<std::string, std::string>>{
+           {"a/b/", ""}, {"plain", "plain"}, {"/x/y.txt", "y.txt"}}) {
+    EXPECT_EQ(Basename(path), basename) << path;
+  }
+  for (const auto& [path, extension] : std::vector<std::pair<std::string, std::string>>{
+           {"/x/Photo.JPG", "jpg"}, {"/x.d/README", ""}, {"/x/.bashrc", "bashrc"}, {"/x/a.tar.GZ", "gz"}}) {
+    EXPECT_EQ(GetFileExtension(path, true), extension) << path;
+  }
   EXPECT_EQ(GetFileExtension("/x/Photo.JPG", false), "JPG");
-  EXPECT_EQ(GetFileExtension("/x.d/README", true), "");
-  EXPECT_EQ(GetFileExtension("/x/.bashrc", true), "bashrc");
-  EXPECT_EQ(GetFileExtension("/x/a.tar.GZ", true), "gz");
   EXPECT_TRUE(StringStartWith("/volume1/share", "/volume1"));
   EXPECT_TRUE(StringStartWith("abc", ""));
   EXPECT_FALSE(StringStartWith("ab", "abc"));
@@ -45,16 +47,18 @@ TEST_F(FileUtilTest, FileAndDirectoryPredicatesAndLinks) {
   ASSERT_EQ(symlink(Path("dir/file.txt").c_str(), Path("link-to-file").c_str()), 0);
   ASSERT_EQ(symlink(Path("dir").c_str(), Path("link-to-dir").c_str()), 0);
   ASSERT_EQ(symlink(Path("link-to-dir").c_str(), Path("link-to-link").c_str()), 0);
-  EXPECT_TRUE(IsFileExist(Path("dir/file.txt")));
-  EXPECT_FALSE(IsFileExist(Path("link-to-file")));
-  EXPECT_FALSE(IsFileExist(Path("dir")));
-  EXPECT_FALSE(IsFileExist(Path("missing")));
-  EXPECT_TRUE(IsDirExist(Path("dir"), false));
-  EXPECT_FALSE(IsDirExist(Path("link-to-dir"), false));
-  EXPECT_TRUE(IsDirExist(Path("link-to-dir"), true));
-  EXPECT_TRUE(IsDirExist(Path("link-to-link"), true));
-  EXPECT_FALSE(IsDirExist(Path("link-to-file"), true));
-  EXPECT_FALSE(IsDirExist(Path("missing"), true));
+  // A file: a regular one, never a link. A directory: links followed only when asked.
+  const struct {
+    const char* path;
+    bool file, dir, dir_through_links;
+  } cases[] = {{"dir/file.txt", true, false, false}, {"link-to-file", false, false, false},
+               {"dir", false, true, true},           {"missing", false, false, false},
+               {"link-to-dir", false, false, true},  {"link-to-link", false, false, true}};
+  for (const auto& c : cases) {
+    EXPECT_EQ(IsFileExist(Path(c.path)), c.file) << c.path;
+    EXPECT_EQ(IsDirExist(Path(c.path), false), c.dir) << c.path;
+    EXPECT_EQ(IsDirExist(Path(c.path), true), c.dir_through_links) << c.path;
+  }
 }
 
 // A relative link target is tested as it stands, against the working directory.

@@ -98,24 +98,20 @@ TEST(VolumeTest, SnapshotsAreRealSnapshotFolders) {
   root.WriteFile("other/#snapshot", "");
   symlink((share + "/#snapshot").c_str(), (root.path() + "/linked#snapshot").c_str());
   int in_snapshot = -1;
-  ASSERT_EQ(platform.FhsPathInSnapshot(share + "/#snapshot/daily/a", &in_snapshot), 0);
-  EXPECT_EQ(in_snapshot, 1);
-  ASSERT_EQ(platform.FhsPathInSnapshot(share + "/x#snapshot/b", &in_snapshot), 0);
-  EXPECT_EQ(in_snapshot, 0);
-  ASSERT_EQ(platform.FhsPathInSnapshot(root.path() + "/other/#snapshot", &in_snapshot), 0);
-  EXPECT_EQ(in_snapshot, 0);  // a file of that name is no snapshot
-  ASSERT_EQ(platform.FhsPathInSnapshot(share + "/#snapshot-old/x", &in_snapshot), 0);
-  EXPECT_EQ(in_snapshot, 0);
+  // A file of that name is no snapshot.
+  for (const auto& [path, expected] : std::vector<std::pair<std::string, int>>{
+           {share + "/#snapshot/daily/a", 1}, {share + "/x#snapshot/b", 0},
+           {root.path() + "/other/#snapshot", 0}, {share + "/#snapshot-old/x", 0}}) {
+    ASSERT_EQ(platform.FhsPathInSnapshot(path, &in_snapshot), 0) << path;
+    EXPECT_EQ(in_snapshot, expected) << path;
+  }
   EXPECT_LT(platform.FhsPathInSnapshot("photo/#snapshot", &in_snapshot), 0);
 }
 
 TEST(VolumeTest, HiddenMetadataNames) {
   LinuxPlatform platform;
-  EXPECT_EQ(platform.EAIsHiddenDir("@eaDir"), 1);
-  EXPECT_EQ(platform.EAIsHiddenDir("@tmp"), 1);
-  EXPECT_EQ(platform.EAIsHiddenDir("@eadir"), 0);
-  EXPECT_EQ(platform.EAIsHiddenDir("eaDir"), 0);
-  EXPECT_EQ(platform.EAIsHiddenDir(""), 0);
+  for (const char* name : {"@eaDir", "@tmp"}) EXPECT_EQ(platform.EAIsHiddenDir(name), 1) << name;
+  for (const char* name : {"@eadir", "eaDir", ""}) EXPECT_EQ(platform.EAIsHiddenDir(name), 0) << name;
 }
 
 TEST(VolumeTest, FreeSpaceAndTheTwoLackOfSpaceErrors) {

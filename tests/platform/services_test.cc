@@ -10,9 +10,9 @@
 #include <chrono>
 #include <cstdlib>
 #include <filesystem>
-#include <fstream>
 #include <map>
 #include <memory>
+#include <functional>
 #include <sstream>
 #include <vector>
 
@@ -28,14 +28,8 @@ namespace corvlumex {
 namespace platform {
 namespace {
 
+using testing_support::ReadFileText;
 using testing_support::Sandbox;
-
-std::string ReadAll(const std::string& path) {
-  std::ifstream input(path);
-  std::stringstream content;
-  content << input.rdbuf();
-  return content.str();
-}
 
 // Sets an environment variable while alive.
 class ScopedEnv {
@@ -49,7 +43,7 @@ class ScopedEnv {
 
 class ServicesTest : public ::testing::Test {
  protected:
-  std::string RequestLog() const { return ReadAll(root_.path() + "/var/log/corvlumex/service_requests.log"); }
+  std::string RequestLog() const { return ReadFileText(root_.path() + "/var/log/corvlumex/service_requests.log"); }
   // A service command that appends its arguments to <root>/asked.
   std::string RecordingCommand(int exit_status) const {
     const std::string script = root_.WriteFile(
@@ -84,7 +78,7 @@ TEST_F(ServicesTest, TheConfiguredCommandCarriesTheRequest) {
   root_.WriteFile("etc/corvlumex/service_command", RecordingCommand(0) + "\n");
   EXPECT_EQ(platform_.ServiceStart("corvcontentextractd", true), 0);
   EXPECT_EQ(platform_.ServiceRestart("nginx.socket"), 0);
-  EXPECT_EQ(ReadAll(root_.path() + "/asked"), "start corvcontentextractd.service\nrestart nginx.socket\n");
+  EXPECT_EQ(ReadFileText(root_.path() + "/asked"), "start corvcontentextractd.service\nrestart nginx.socket\n");
   EXPECT_EQ(RequestLog(), "");
 
   // The environment wins over the file; a failing command is a failure.
@@ -106,11 +100,11 @@ TEST_F(ServicesTest, SambaIsReloadedNeverRestarted) {
   setenv("PATH", (root_.path() + "/bin:" + old_path).c_str(), 1);
   EXPECT_EQ(platform_.ServiceRestart("samba"), 0);
   setenv("PATH", old_path.c_str(), 1);
-  EXPECT_EQ(ReadAll(root_.path() + "/asked"), "smbcontrol smbd reload-config\n");
+  EXPECT_EQ(ReadFileText(root_.path() + "/asked"), "smbcontrol smbd reload-config\n");
   // Through an administrator's own service command it is a reload too.
   ScopedEnv command("CORVLUMEX_SERVICE_COMMAND", RecordingCommand(0));
   EXPECT_EQ(platform_.ServiceRestart("samba"), 0);
-  EXPECT_EQ(ReadAll(root_.path() + "/asked"), "smbcontrol smbd reload-config\nreload smbd.service\n");
+  EXPECT_EQ(ReadFileText(root_.path() + "/asked"), "smbcontrol smbd reload-config\nreload smbd.service\n");
 }
 
 // Samba's RPC workers (rpcd_mdssvc answers Finder) keep the configuration
@@ -197,17 +191,17 @@ TEST_F(ServicesTest, ExecClosesDescriptorsAndSilencesOutputWhenAsked) {
   const int inherited = fcntl(opened, F_DUPFD, 100);
   close(opened);
   ASSERT_GE(inherited, 100);
-  EXPECT_EQ(platform_.Exec(script, {}, kExecWait | kExecCloseFds | kExecNullStdout | kExecNullStderr), 0);
-  std::istringstream listing(ReadAll(out));
-  std::vector<std::string> fds;
-  for (std::string fd; listing >> fd;) fds.push_back(fd);
-  EXPECT_FALSE(fds.empty());
-  EXPECT_EQ(std::count(fds.begin(), fds.end(), std::to_string(inherited)), 0);
-  EXPECT_EQ(platform_.Exec(script, {}, kExecWait | kExecNullStdout), 0);
-  listing = std::istringstream(ReadAll(out));
-  fds.clear();
-  for (std::string fd; listing >> fd;) fds.push_back(fd);
-  EXPECT_EQ(std::count(fds.begin(), fds.end(), std::to_string(inherited)), 1);  // kept when not asked
+  // Whether the program saw the inherited descriptor, after running with `flags`.
+  const auto inherited_seen = [&](int flags) {
+    EXPECT_EQ(platform_.Exec(script, {}, kExecWait | flags), 0);
+    std::istringstream listing(ReadFileText(out));
+    std::vector<std::string> fds;
+    for (std::string fd; listing >> fd;) fds.push_back(fd);
+    EXPECT_FALSE(fds.empty());
+    return std::count(fds.begin(), fds.end(), std::to_string(inherited)) == 1;
+  };
+  EXPECT_FALSE(inherited_seen(kExecCloseFds | kExecNullStdout | kExecNullStderr));
+  EXPECT_TRUE(inherited_seen(kExecNullStdout));  // kept when not asked
   close(inherited);
 }
 
@@ -215,21 +209,21 @@ TEST_F(ServicesTest, SpotlightIsASambaIncludeFile) {
   EXPECT_EQ(platform_.SMBIsEnableSpotlight(), 0);
   ASSERT_EQ(platform_.SMBSetSpotlight(true), 0);
   const std::string include = root_.path() + "/etc/samba/corvlumex-spotlight.conf";
-  EXPECT_NE(ReadAll(include).find("[global]\n\tspotlight backend = elasticsearch\n"), std::string::npos);
+  EXPECT_NE(ReadFileText(include).find("[global]\n\tspotlight backend = elasticsearch\n"), std::string::npos);
   EXPECT_EQ(platform_.SMBIsEnableSpotlight(), 1);
   // The indexed shares, with their index names; a change is reported once.
   EXPECT_EQ(platform_.SMBSetSpotlightShares({"photo", "music", "a]b"}), 1);
   EXPECT_EQ(platform_.SMBSetSpotlightShares({"music", "photo"}), 0);
-  EXPECT_NE(ReadAll(include).find("[photo]\n\tspotlight = yes\n\tspotlight backend = elasticsearch\n"
+  EXPECT_NE(ReadFileText(include).find("[photo]\n\tspotlight = yes\n\tspotlight backend = elasticsearch\n"
                                   "\telasticsearch:index = fileindex_photo\n"),
             std::string::npos);
-  EXPECT_EQ(ReadAll(include).find("a]b"), std::string::npos);
+  EXPECT_EQ(ReadFileText(include).find("a]b"), std::string::npos);
   // Off keeps the shares, with Spotlight off there too.
   ASSERT_EQ(platform_.SMBSetSpotlight(false), 0);
   EXPECT_EQ(platform_.SMBIsEnableSpotlight(), 0);
-  EXPECT_NE(ReadAll(include).find("[music]\n\tspotlight = no\n"), std::string::npos);
+  EXPECT_NE(ReadFileText(include).find("[music]\n\tspotlight = no\n"), std::string::npos);
   ASSERT_EQ(platform_.SMBSetSpotlight(true), 0);
-  EXPECT_NE(ReadAll(include).find("[music]\n\tspotlight = yes\n"), std::string::npos);
+  EXPECT_NE(ReadFileText(include).find("[music]\n\tspotlight = yes\n"), std::string::npos);
 }
 
 class MonitorQueueTest : public ServicesTest {
@@ -289,19 +283,18 @@ TEST_F(MonitorQueueTest, QueuesWithSimilarPathsGetTheirOwnFiles) {
 }
 
 TEST_F(MonitorQueueTest, MalformedConfigurationsAreRefused) {
-  Json::Value bad = Queue();
-  bad.removeMember("queue");
-  EXPECT_FALSE(platform_.MonitorQueueUpsert(bad, "fileindex", kMonitorQueueTypeApplication));
-  bad = Queue();
-  bad["queue"] = "relative/queue";
-  EXPECT_FALSE(platform_.MonitorQueueUpsert(bad, "fileindex", kMonitorQueueTypeApplication));
-  bad = Queue();
-  bad["config"][0]["mask"] = "all";
-  EXPECT_FALSE(platform_.MonitorQueueUpsert(bad, "fileindex", kMonitorQueueTypeApplication));
+  const std::function<void(Json::Value&)> spoilers[] = {
+      [](Json::Value& q) { q.removeMember("queue"); },
+      [](Json::Value& q) { q["queue"] = "relative/queue"; },
+      [](Json::Value& q) { q["config"] = Json::Value(Json::objectValue); },
+      [](Json::Value& q) { q["config"][0]["mask"] = "all"; },  // last: its message is checked
+  };
+  for (const auto& spoil : spoilers) {
+    Json::Value bad = Queue();
+    spoil(bad);
+    EXPECT_FALSE(platform_.MonitorQueueUpsert(bad, "fileindex", kMonitorQueueTypeApplication)) << bad;
+  }
   EXPECT_NE(LastError().message.find("\"mask\""), std::string::npos);
-  bad = Queue();
-  bad["config"] = Json::Value(Json::objectValue);
-  EXPECT_FALSE(platform_.MonitorQueueUpsert(bad, "fileindex", kMonitorQueueTypeApplication));
   EXPECT_FALSE(platform_.MonitorQueueUpsert(Queue(), "", kMonitorQueueTypeApplication));
   EXPECT_FALSE(platform_.MonitorQueueUpsert(Queue(), "../x", kMonitorQueueTypeApplication));
   EXPECT_FALSE(platform_.MonitorQueueUpsert(Queue(), "fileindex", 2));

@@ -2,15 +2,14 @@
 
 #include <sys/socket.h>
 #include <sys/time.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 #include <chrono>
-#include <cstring>
 #include <filesystem>
 #include <stdexcept>
 
 #include "tests/support/child_process.h"
+#include "tests/support/frame_client.h"
 
 namespace corvlumex {
 namespace testing_support {
@@ -45,16 +44,8 @@ FakeDaemon::FakeDaemon(const std::string& socket_path, std::string reply_body)
     : reply_body_(std::move(reply_body)) {
   std::filesystem::create_directories(std::filesystem::path(socket_path).parent_path());
   unlink(socket_path.c_str());
-  listen_fd_ = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  struct sockaddr_un address;
-  memset(&address, 0, sizeof(address));
-  address.sun_family = AF_UNIX;
-  if (socket_path.size() >= sizeof(address.sun_path)) throw std::runtime_error("socket path too long");
-  memcpy(address.sun_path, socket_path.c_str(), socket_path.size());
-  if (listen_fd_ < 0 || bind(listen_fd_, reinterpret_cast<sockaddr*>(&address), sizeof(address)) != 0 ||
-      listen(listen_fd_, 16) != 0) {
-    throw std::runtime_error("fake daemon cannot listen on " + socket_path);
-  }
+  listen_fd_ = BindSocket(socket_path, true);
+  if (listen_fd_ < 0) throw std::runtime_error("fake daemon cannot listen on " + socket_path);
   thread_ = std::thread([this] { Serve(); });
 }
 

@@ -17,17 +17,34 @@
 namespace corvlumex {
 namespace testing_support {
 
+namespace {
+// A socket and the address of `path` for it; -1 when the path does not fit.
+int SocketFor(const std::string& path, sockaddr_un* address) {
+  memset(address, 0, sizeof(*address));
+  address->sun_family = AF_UNIX;
+  if (path.size() >= sizeof(address->sun_path)) return -1;
+  memcpy(address->sun_path, path.c_str(), path.size());
+  return socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+}
+}  // namespace
+
 int ConnectTo(const std::string& path) {
-  const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
   sockaddr_un address;
-  memset(&address, 0, sizeof(address));
-  address.sun_family = AF_UNIX;
-  strncpy(address.sun_path, path.c_str(), sizeof(address.sun_path) - 1);
-  if (connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)) != 0) {
-    close(fd);
-    return -1;
+  const int fd = SocketFor(path, &address);
+  if (fd >= 0 && connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)) == 0) return fd;
+  if (fd >= 0) close(fd);
+  return -1;
+}
+
+int BindSocket(const std::string& path, bool listening) {
+  sockaddr_un address;
+  const int fd = SocketFor(path, &address);
+  if (fd >= 0 && bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)) == 0 &&
+      (!listening || listen(fd, 16) == 0)) {
+    return fd;
   }
-  return fd;
+  if (fd >= 0) close(fd);
+  return -1;
 }
 
 bool WaitUntilListening(const std::string& socket, std::chrono::milliseconds timeout) {

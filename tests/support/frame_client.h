@@ -10,6 +10,9 @@ namespace testing_support {
 
 // A connection to the socket (-1 when refused).
 int ConnectTo(const std::string& socket);
+// A socket bound on `path`, listening when asked (-1 when it cannot be): a
+// daemon's own, or with `listening` false the file a crashed one leaves.
+int BindSocket(const std::string& path, bool listening);
 // Polls until `socket` takes connections: its file exists from bind(), before
 // the daemon listens.
 bool WaitUntilListening(const std::string& socket, std::chrono::milliseconds timeout = std::chrono::seconds(20));

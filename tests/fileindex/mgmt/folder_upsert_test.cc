@@ -8,12 +8,11 @@ namespace corvlumex {
 namespace fileindex {
 namespace {
 
-
-std::string Kinds(const Json::Value& data) {
-  std::string text;
-  for (const char* kind : {"document", "audio", "video", "photo"}) text += data[kind].asBool() ? "1" : "0";
-  return text;
+// The reindex event of a folder as queued: the kinds to index again.
+std::string ReindexLine(const std::string& path, const std::string& kinds) {
+  return "{\"data\":" + kinds + ",\"event\":131072,\"path\":\"" + path + "\",\"path_old\":\"\"}";
 }
+const char kAllKinds[] = R"({"audio":true,"document":true,"photo":true,"video":true})";
 
 class FolderUpsertTest : public testing_support::MgmtTest {
  protected:
@@ -24,9 +23,8 @@ class FolderUpsertTest : public testing_support::MgmtTest {
     sandbox_.MakeDir("volume1/photo/a");
     sandbox_.MakeDir("volume1/photo/b");
   }
-  void ExpectUpsertRefused(const Json::Value& list, bool create, ErrorCode code, const std::string& reason,
-                           const std::string& condition) {
-    ExpectRefused([&] { FolderUpsert(list, create, false); }, code, condition, reason);
+  std::string QueueText(const std::string& share, size_t index) const {
+    return JsonToString(sandbox_.QueueEvents(share).at(index));
   }
 
   std::string photo_;
@@ -34,7 +32,8 @@ class FolderUpsertTest : public testing_support::MgmtTest {
 };
 
 TEST_F(FolderUpsertTest, AddPreparesIndexMonitorDaemonAndReindex) {
-  FolderAdd(JsonList({FolderJson("/photo/a"), FolderJson("/music", true, true, false, false), FolderJson("/photo/b")}),
+  FolderAdd(JsonList({FolderJson("/photo/a"), FolderJson("/music", true, true, false, false),
+                      FolderJson("/photo/b")}),
             false);
 
   // Touched shares in name order, one index each, created once.
@@ -44,26 +43,15 @@ TEST_F(FolderUpsertTest, AddPreparesIndexMonitorDaemonAndReindex) {
   ASSERT_EQ(cfg["config"].size(), 2u);
   EXPECT_EQ(cfg["config"][0]["path"].asString(), photo_ + "/a");
   EXPECT_EQ(MonitorCfg("music")["config"][0]["path"].asString(), music_);
-
   EXPECT_THAT(SavedPaths(), ElementsAre("/photo/a", "/music", "/photo/b"));
-
-  const std::vector<Json::Value> commands = sandbox_.DaemonCommands();
-  ASSERT_EQ(commands.size(), 2u);
-  EXPECT_EQ(commands[0]["type"].asString(), "notify_setting_changed");
-  EXPECT_EQ(commands[0]["data"]["share_name"].asString(), "music");
-  EXPECT_EQ(commands[1]["data"]["share_name"].asString(), "photo");
-  EXPECT_TRUE(commands[1]["data"]["is_upsert"].asBool());
+  EXPECT_THAT(NewDaemonSummaries(),
+              ElementsAre("notify_setting_changed music", "notify_setting_changed photo"));
+  EXPECT_TRUE(sandbox_.DaemonCommands()[1]["data"]["is_upsert"].asBool());
 
   // Everything in a new folder is indexed: all four kinds, whatever it selects.
-  const std::vector<Json::Value> events = sandbox_.QueueEvents("photo");
-  ASSERT_EQ(events.size(), 2u);
-  EXPECT_EQ(events[0]["event"].asUInt(), 131072u);
-  EXPECT_EQ(events[0]["path"].asString(), photo_ + "/a");
-  EXPECT_EQ(events[0]["path_old"].asString(), "");
-  EXPECT_EQ(Kinds(events[0]["data"]), "1111");
-  EXPECT_EQ(events[1]["path"].asString(), photo_ + "/b");
-  ASSERT_EQ(sandbox_.QueueEvents("music").size(), 1u);
-  EXPECT_EQ(Kinds(sandbox_.QueueEvents("music")[0]["data"]), "1111");
+  EXPECT_THAT(QueueSummaries("photo"), ElementsAre("131072 " + photo_ + "/a", "131072 " + photo_ + "/b"));
+  EXPECT_EQ(QueueText("photo", 0), ReindexLine(photo_ + "/a", kAllKinds));
+  EXPECT_EQ(QueueText("music", 0), ReindexLine(music_, kAllKinds));
   EXPECT_EQ(ServiceRequests().back(), "start pkg-CorvLumex-fileindexd.service");
 
   // A second folder of an indexed share does not create its index again.
@@ -77,44 +65,44 @@ TEST_F(FolderUpsertTest, SetReindexesOnlyTheKindsThatChanged) {
   const size_t requests = SearchRequests().size();
   FolderSet(JsonList({FolderJson("/photo/a", false, true, true, false)}), false);
   EXPECT_EQ(SearchRequests().size(), requests);  // no index created for a change
-  const std::vector<Json::Value> events = sandbox_.QueueEvents("photo");
-  ASSERT_EQ(events.size(), 2u);
-  EXPECT_EQ(Kinds(events[1]["data"]), "1001");
+  ASSERT_EQ(sandbox_.QueueEvents("photo").size(), 2u);
+  EXPECT_EQ(QueueText("photo", 1),
+            ReindexLine(photo_ + "/a", R"({"audio":false,"document":true,"photo":true,"video":false})"));
   EXPECT_EQ(sandbox_.DaemonCommands().size(), 2u);
 
   // A new folder inside an indexed one, set rather than added: only what differs
   // from the folder that governed it.
   sandbox_.MakeDir("volume1/photo/a/x");
   FolderSet(JsonList({FolderJson("/photo/a/x", false, true, false, false)}), false);
-  EXPECT_EQ(Kinds(sandbox_.QueueEvents("photo")[2]["data"]), "0010");
+  EXPECT_EQ(QueueText("photo", 2),
+            ReindexLine(photo_ + "/a/x", R"({"audio":false,"document":false,"photo":false,"video":true})"));
 }
 
 TEST_F(FolderUpsertTest, RefusalsChangeNothing) {
   FolderAdd(JsonList({FolderJson("/photo/a")}), false);
-  ExpectUpsertRefused(Json::Value(Json::objectValue), true, kErrorBadArgument, "{}", "!folder_list.isArray()");
-  {
-    LogCapture log;  // failures are logged under the operation's own name
-    EXPECT_EQ(ErrorOf([] { FolderSet(Json::Value(Json::objectValue), false); }).code, kErrorBadArgument);
-    EXPECT_EQ(log.Matching("(FolderUpsert) Failed [!folder_list.isArray()], reason: {}").size(), 1u);
+  const auto refused = [this](const Json::Value& list, bool create, ErrorCode code, const std::string& reason,
+                              const std::string& condition) {
+    ExpectRefused([&] { FolderUpsert(list, create, false); }, code, condition, reason);
+  };
+  refused(Json::Value(Json::objectValue), true, kErrorBadArgument, "{}", "!folder_list.isArray()");
+  // Failures are logged under the operation's own name.
+  ExpectRefused([] { FolderSet(Json::Value(Json::objectValue), false); }, kErrorBadArgument,
+                "!folder_list.isArray()", "{}", "FolderUpsert");
+  refused(JsonList({FolderJson("/photo/b"), FolderJson("/ro")}), true, kErrorPathCannotIndex,
+          "Path cannot index: /ro", "!CanPathBeIndexed(folder_new->GetPath()) && !updater_mode");
+  for (const char* twice : {"/photo/a", "/photo/b"}) {
+    refused(JsonList({FolderJson("/photo/b"), FolderJson(twice)}), true, kErrorDuplicatedId,
+            std::string("Duplicated ID: ") + twice, "create && folder_mgr.HasFolder(folder_new->GetPath())");
   }
-  ExpectUpsertRefused(JsonList({FolderJson("/photo/b"), FolderJson("/ro")}), true, kErrorPathCannotIndex,
-                "Path cannot index: /ro", "!CanPathBeIndexed(folder_new->GetPath()) && !updater_mode");
-  ExpectUpsertRefused(JsonList({FolderJson("/photo/b"), FolderJson("/photo/a")}), true, kErrorDuplicatedId,
-                "Duplicated ID: /photo/a", "create && folder_mgr.HasFolder(folder_new->GetPath())");
-  ExpectUpsertRefused(JsonList({FolderJson("/photo/b"), FolderJson("/photo/b")}), true, kErrorDuplicatedId,
-                "Duplicated ID: /photo/b", "create && folder_mgr.HasFolder(folder_new->GetPath())");
   // A malformed element, and a share that does not exist.
   Json::Value no_name = FolderJson("/photo/b");
   no_name.removeMember("name");
-  ExpectUpsertRefused(JsonList({FolderJson("/photo/b"), FolderJson("/nosuch")}), false, kErrorShareNotFound, "", "");
-  ExpectUpsertRefused(JsonList({no_name}), false, kErrorBadArgument, "", "");
-}
-
-TEST_F(FolderUpsertTest, FullVolumeRefusesTheRequest) {
-  ScopedFakePlatform platform;
+  refused(JsonList({FolderJson("/photo/b"), FolderJson("/nosuch")}), false, kErrorShareNotFound, "", "");
+  refused(JsonList({no_name}), false, kErrorBadArgument, "", "");
+  ScopedFakePlatform platform;  // a full volume
   platform->QuotaIsEnoughHook = [](auto&&...) { return FakePlatform::NoSpace(); };
-  ExpectUpsertRefused(JsonList({FolderJson("/photo/a")}), true, kErrorNoSpace, "Share (photo) space not enough",
-                "!share.IsSpaceEnough()");
+  refused(JsonList({FolderJson("/photo/a")}), true, kErrorNoSpace, "Share (photo) space not enough",
+          "!share.IsSpaceEnough()");
 }
 
 // Once every folder is accepted the steps run in order and a failure stops
@@ -140,20 +128,19 @@ TEST_F(FolderUpsertTest, LateFailurePropagatesAndLeavesEarlierStepsInPlace) {
   EXPECT_EQ(sandbox_.QueueEvents("photo").size(), 1u);
 }
 
-TEST_F(FolderUpsertTest, UpdaterModeStoresRefusedPathsWithoutReindex) {
-  FolderAdd(JsonList({FolderJson("/ro")}), true);
-  EXPECT_THAT(SavedPaths(), ElementsAre("/ro"));
-  EXPECT_THAT(SearchCommands(), ElementsAre("index_create fileindex_ro"));
-  EXPECT_EQ(sandbox_.DaemonCommands().size(), 1u);
-  EXPECT_TRUE(sandbox_.QueueEvents("ro").empty());
-}
-
-TEST_F(FolderUpsertTest, EmptyListStartsServicesAndSavesTheSameList) {
+// The updater stores refused paths without a reindex; an empty list starts
+// the services and saves the same (empty) list.
+TEST_F(FolderUpsertTest, UpdaterModeAndEmptyList) {
   FolderAdd(Json::Value(Json::arrayValue), false);
   EXPECT_EQ(ReadFileText(FoldersFile()), "[]\n");
   EXPECT_EQ(ServiceRequests().back(), "start pkg-CorvLumex-fileindexd.service");
   EXPECT_TRUE(SearchRequests().empty());
   EXPECT_TRUE(sandbox_.DaemonCommands().empty());
+  FolderAdd(JsonList({FolderJson("/ro")}), true);
+  EXPECT_THAT(SavedPaths(), ElementsAre("/ro"));
+  EXPECT_THAT(SearchCommands(), ElementsAre("index_create fileindex_ro"));
+  EXPECT_EQ(sandbox_.DaemonCommands().size(), 1u);
+  EXPECT_TRUE(sandbox_.QueueEvents("ro").empty());
 }
 
 TEST_F(FolderUpsertTest, ListAndGet) {
@@ -165,18 +152,11 @@ TEST_F(FolderUpsertTest, ListAndGet) {
   ASSERT_EQ(out["folder"].size(), 1u);
   EXPECT_EQ(out["folder"][0]["path"].asString(), "/photo/a");
   EXPECT_FALSE(out["folder"][0].isMember("additional"));
-
-  Json::Value additional(Json::arrayValue);
-  additional.append("status");
-  FolderList(out, 0, 0, "", "", additional);
+  FolderList(out, 0, 0, "", "", JsonList({"status"}));
   ASSERT_EQ(out["folder"].size(), 3u);
   EXPECT_TRUE(out["folder"][2]["additional"]["status"].isMember("text"));
-
   FolderList(out, 10, 5, "name", "DESC", Json::Value(Json::arrayValue));
-  EXPECT_EQ(out["offset"].asUInt(), 10u);
-  EXPECT_EQ(out["total"].asUInt(), 3u);
-  EXPECT_TRUE(out["folder"].isArray());
-  EXPECT_EQ(out["folder"].size(), 0u);
+  EXPECT_EQ(JsonToString(out), "{\"folder\":[],\"offset\":10,\"total\":3}");
 
   FolderGet(out, "/music");
   EXPECT_EQ(out["path"].asString(), "/music");

@@ -118,12 +118,20 @@ std::vector<std::string> MgmtTest::NewDaemonSummaries() const {
   return out;
 }
 
+std::vector<std::string> MgmtTest::QueueSummaries(const std::string& share) const {
+  std::vector<std::string> out;
+  for (const Json::Value& event : sandbox_.QueueEvents(share)) {
+    out.push_back(event["event"].asString() + " " + event["path"].asString());
+  }
+  return out;
+}
+
 std::vector<std::string> MgmtTest::NewServiceRequests() const {
   return Since(ServiceRequests(), services_mark_);
 }
 
 void MgmtTest::ExpectRefused(const std::function<void()>& action, ErrorCode code, const std::string& condition,
-                             const std::string& reason) {
+                             const std::string& reason, const std::string& function) {
   const SystemSnapshot before = Snapshot();
   LogCapture log;
   const Error error = ErrorOf(action);
@@ -132,7 +140,8 @@ void MgmtTest::ExpectRefused(const std::function<void()>& action, ErrorCode code
     EXPECT_EQ(error.reason, reason);
   }
   if (!condition.empty()) {
-    const std::string needle = "Failed [" + condition + "]" + (reason.empty() ? "" : ", reason: " + reason);
+    const std::string needle = (function.empty() ? "" : "(" + function + ") ") + "Failed [" + condition + "]" +
+                               (reason.empty() ? "" : ", reason: " + reason);
     EXPECT_EQ(log.Matching(needle).size(), 1u) << ::testing::PrintToString(log.Lines());
   }
   EXPECT_EQ(Snapshot(), before);

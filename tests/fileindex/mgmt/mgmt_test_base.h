@@ -54,12 +54,15 @@ class MgmtTest : public ::testing::Test {
   std::vector<Json::Value> NewDaemonCommands() const;
   // "<type> <share_name>" of each new daemon command.
   std::vector<std::string> NewDaemonSummaries() const;
+  // "<event> <path>" of each line of the share's queue.
+  std::vector<std::string> QueueSummaries(const std::string& share) const;
   std::vector<std::string> NewServiceRequests() const;
-  // `action` throws `code` (with `reason` unless empty), logs "Failed
-  // [<condition>]" (", reason: <reason>") once unless the condition is
-  // empty, and nothing outside the process changed.
+  // `action` throws `code` (with `reason` unless empty), logs "(<function>)
+  // Failed [<condition>]" (", reason: <reason>"; the function part only when
+  // given) once unless the condition is empty, and nothing outside the
+  // process changed.
   void ExpectRefused(const std::function<void()>& action, ErrorCode code, const std::string& condition,
-                     const std::string& reason = "");
+                     const std::string& reason = "", const std::string& function = "");
 
   Sandbox sandbox_{true, Sandbox::kFakeIndexer};
   SleepRecorder sleeps_;

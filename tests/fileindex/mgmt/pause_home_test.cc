@@ -70,13 +70,13 @@ TEST_F(PauseHomeTest, VolumeAndSharePausesAddUp) {
 }
 
 TEST_F(PauseHomeTest, PauseRefusalsAndUnreachableDaemonChangeNothing) {
-  ExpectRefused([] { SharePause(""); }, kErrorBadArgument, "share_name.empty()");
-  ExpectRefused([] { ShareResume(""); }, kErrorBadArgument, "share_name.empty()");
-  ExpectRefused([] { ShareClearPaused(""); }, kErrorBadArgument, "share_name.empty()");
+  for (const auto operation : {SharePause, ShareResume, ShareClearPaused}) {
+    ExpectRefused([&] { operation(""); }, kErrorBadArgument, "share_name.empty()");
+  }
   ExpectRefused([] { SharePause("nosuch"); }, kErrorShareNotFound, "");
-  ExpectRefused([] { VolumePause(""); }, kErrorBadArgument, "volume_path.empty()");
-  ExpectRefused([] { VolumeResume(""); }, kErrorBadArgument, "volume_path.empty()");
-  ExpectRefused([] { VolumeClearPaused(""); }, kErrorBadArgument, "volume_path.empty()");
+  for (const auto operation : {VolumePause, VolumeResume, VolumeClearPaused}) {
+    ExpectRefused([&] { operation(""); }, kErrorBadArgument, "volume_path.empty()");
+  }
 
   // The daemon cannot be told: the pause is not recorded either.
   StatusMgr().SetShareStatus("video", kShareStatusNeedReindex);
@@ -99,18 +99,8 @@ TEST_F(PauseHomeTest, HomeServiceSwitchSuspendsAndRestoresTheHomes) {
   EXPECT_EQ(JsonToString(MonitorCfg("homes")), JsonToString(cfg));
   EXPECT_EQ(StatusMgr().GetShareStatus("homes"), 0u);
   EXPECT_THAT(NewDaemonSummaries(), ElementsAre("worker_delete homes", "worker_create homes"));
-  const std::vector<Json::Value> events = sandbox_.QueueEvents("homes");
-  ASSERT_EQ(events.size(), 1u);
-  EXPECT_EQ(events[0]["event"].asUInt(), 65536u);
-  EXPECT_EQ(events[0]["path"].asString(), homes_ + "/alice/docs");
+  EXPECT_THAT(QueueSummaries("homes"), ElementsAre("65536 " + homes_ + "/alice/docs"));
   EXPECT_TRUE(NewSearchCommands().empty());  // the index stayed all along
-}
-
-TEST_F(PauseHomeTest, HomeSwitchWithoutTheHomesShareChangesNothing) {
-  sandbox_.RemoveShare("homes");
-  ExpectRefused([] { HomeDisable(); }, kErrorShareNotFound, "");
-  ExpectRefused([] { HomeEnable(); }, kErrorShareNotFound, "");
-  ExpectRefused([] { UserRename("alice", "carol"); }, kErrorShareNotFound, "");
 }
 
 TEST_F(PauseHomeTest, UserRenameMovesTheUsersFolders) {
@@ -124,9 +114,7 @@ TEST_F(PauseHomeTest, UserRenameMovesTheUsersFolders) {
               ElementsAre("document_del_by_query fileindex_homes prefix=" + homes_ + "/alice/docs/",
                           "document_del_by_id fileindex_homes " + homes_ + "/alice/docs"));
   EXPECT_THAT(NewDaemonSummaries(), ElementsAre("notify_setting_changed homes"));
-  const std::vector<Json::Value> events = sandbox_.QueueEvents("homes");
-  ASSERT_EQ(events.size(), 1u);
-  EXPECT_EQ(events[0]["path"].asString(), homes_ + "/carol/docs");
+  EXPECT_THAT(QueueSummaries("homes"), ElementsAre("65536 " + homes_ + "/carol/docs"));
 
   // A user without folders of their own changes nothing.
   const SystemSnapshot before = Snapshot();
@@ -134,9 +122,14 @@ TEST_F(PauseHomeTest, UserRenameMovesTheUsersFolders) {
   EXPECT_EQ(Snapshot(), before);
 }
 
-TEST_F(PauseHomeTest, UserRenameRefusalsChangeNothing) {
+TEST_F(PauseHomeTest, HomeAndUserRenameRefusalsChangeNothing) {
   ExpectRefused([] { UserRename("", "carol"); }, kErrorBadArgument, "user_from.empty()");
   ExpectRefused([] { UserRename("alice", ""); }, kErrorBadArgument, "user_to.empty()");
+  sandbox_.RemoveShare("homes");  // without the homes share
+  ExpectRefused([] { HomeDisable(); }, kErrorShareNotFound, "");
+  ExpectRefused([] { HomeEnable(); }, kErrorShareNotFound, "");
+  ExpectRefused([] { UserRename("alice", "carol"); }, kErrorShareNotFound, "");
+  sandbox_.AddShare("homes");
   sandbox_.MakeDir("volume1/homes/bob/docs");
   FolderAdd(JsonList({FolderJson("/homes/bob/docs")}), false);
   ExpectRefused([] { UserRename("alice", "bob"); }, kErrorDuplicatedId, "folder_mgr.HasFolder(renamed->GetPath())");

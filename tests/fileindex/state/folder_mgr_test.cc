@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <tuple>
+
 #include "common/error.h"
 #include "common/json_util.h"
 #include "fileindex/state/folder_mgr.h"
@@ -94,32 +96,30 @@ TEST_F(FolderMgrTest, EqualFullPathsKeepTheEarlierFolder) {
   EXPECT_EQ(FolderMgr().GetMostSuitableCfg(s_ + "/a/x")->GetName(), "first");
 }
 
+// Indexed: the folder or below it; own settings: the folder itself.
 TEST_F(FolderMgrTest, PathPredicates) {
   const FolderMgr mgr = With({"/s/a"});
-  EXPECT_TRUE(mgr.IsFullPathIndexed(s_ + "/a"));
-  EXPECT_TRUE(mgr.IsFullPathIndexed(s_ + "/a/x"));
-  EXPECT_FALSE(mgr.IsFullPathIndexed(s_ + "/ab"));
-  EXPECT_FALSE(mgr.IsFullPathIndexed(s_));
-  EXPECT_TRUE(mgr.IsFullPathHasOwnCfg(s_ + "/a"));
-  EXPECT_FALSE(mgr.IsFullPathHasOwnCfg(s_ + "/a/x"));
-  EXPECT_FALSE(mgr.IsFullPathHasOwnCfg(s_ + "/a/"));
+  for (const auto& [path, indexed, own] : std::vector<std::tuple<std::string, bool, bool>>{
+           {s_ + "/a", true, true}, {s_ + "/a/x", true, false}, {s_ + "/ab", false, false},
+           {s_, false, false}, {s_ + "/a/", true, false}}) {
+    EXPECT_EQ(mgr.IsFullPathIndexed(path), indexed) << path;
+    EXPECT_EQ(mgr.IsFullPathHasOwnCfg(path), own) << path;
+  }
   EXPECT_TRUE(mgr.HasFolder("/s/a"));
   EXPECT_FALSE(mgr.HasFolder("/s/a/"));
 }
 
+// The governing folder's categories; a nested folder governs its own subtree.
 TEST_F(FolderMgrTest, NeedMetaFollowsTheGoverningFoldersCategories) {
   WriteFolders("[" + MakeFolder("/s/a", true, false, true, false)->GetStoredText() + "," +
                MakeFolder("/s/a/music", false, true, false, false)->GetStoredText() + "]");
   const FolderMgr mgr;
-  EXPECT_TRUE(mgr.IsFullPathNeedMeta(s_ + "/a/report.PDF"));
-  EXPECT_TRUE(mgr.IsFullPathNeedMeta(s_ + "/a/clip.mkv"));
-  EXPECT_FALSE(mgr.IsFullPathNeedMeta(s_ + "/a/song.mp3"));
-  EXPECT_FALSE(mgr.IsFullPathNeedMeta(s_ + "/a/photo.jpg"));
-  EXPECT_FALSE(mgr.IsFullPathNeedMeta(s_ + "/a/archive.xyz123"));
-  // The nested folder governs its own subtree.
-  EXPECT_TRUE(mgr.IsFullPathNeedMeta(s_ + "/a/music/song.mp3"));
-  EXPECT_FALSE(mgr.IsFullPathNeedMeta(s_ + "/a/music/report.pdf"));
-  EXPECT_FALSE(mgr.IsFullPathNeedMeta(s_ + "/b/report.pdf"));
+  for (const auto& [path, need] : std::vector<std::pair<std::string, bool>>{
+           {"/a/report.PDF", true}, {"/a/clip.mkv", true}, {"/a/song.mp3", false}, {"/a/photo.jpg", false},
+           {"/a/archive.xyz123", false}, {"/a/music/song.mp3", true}, {"/a/music/report.pdf", false},
+           {"/b/report.pdf", false}}) {
+    EXPECT_EQ(mgr.IsFullPathNeedMeta(s_ + path), need) << path;
+  }
 }
 
 // What to reindex: every kind for a new folder, what differs from the

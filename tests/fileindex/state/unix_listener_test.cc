@@ -1,17 +1,13 @@
 #include "fileindex/unix_listener.h"
 
 #include <gtest/gtest.h>
-#include <sys/socket.h>
 #include <sys/stat.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 #include <cerrno>
-#include <cstring>
 #include <fstream>
 #include <functional>
 #include <memory>
-#include <sstream>
 
 #include "common/error.h"
 #include "tests/support/frame_client.h"
@@ -21,25 +17,6 @@
 namespace corvlumex {
 namespace fileindex {
 namespace {
-
-// A socket file left behind by a process that died: bound, never unlinked,
-// nobody listening.
-void LeaveStaleSocket(const std::string& path) {
-  const int fd = socket(AF_UNIX, SOCK_STREAM, 0);
-  sockaddr_un address;
-  memset(&address, 0, sizeof(address));
-  address.sun_family = AF_UNIX;
-  strncpy(address.sun_path, path.c_str(), sizeof(address.sun_path) - 1);
-  ASSERT_EQ(bind(fd, reinterpret_cast<const sockaddr*>(&address), sizeof(address)), 0) << strerror(errno);
-  close(fd);
-}
-
-std::string Contents(const std::string& path) {
-  std::ifstream in(path);
-  std::ostringstream text;
-  text << in.rdbuf();
-  return text.str();
-}
 
 class UnixListenerTest : public ::testing::Test {
  protected:
@@ -61,7 +38,7 @@ TEST_F(UnixListenerTest, WhatLiesAtThePathDecidesWhetherItIsTakenOver) {
     const char* refusal;  // empty: the listener takes the path
   } cases[] = {
       {"nothing", [] {}, ""},
-      {"a socket left by a crash", [&] { LeaveStaleSocket(path_); }, ""},
+      {"a socket left by a crash", [&] { close(testing_support::BindSocket(path_, false)); }, ""},
       {"a socket another daemon answers on", [&] { live = Listen(); }, "another daemon already answers on "},
       {"a file that is no socket", [&] { std::ofstream(path_) << "keep me"; }, " exists and is not a socket"},
   };
@@ -90,7 +67,7 @@ TEST_F(UnixListenerTest, WhatLiesAtThePathDecidesWhetherItIsTakenOver) {
       live.reset();
     }
     if (std::string(c.what) == "a file that is no socket") {
-      EXPECT_EQ(Contents(path_), "keep me");
+      EXPECT_EQ(testing_support::ReadFileText(path_), "keep me");
     }
     unlink(path_.c_str());
   }

@@ -2,6 +2,8 @@
 // renders what ProcessOP hands out in the printed form of OPs.
 #pragma once
 
+#include <gtest/gtest.h>
+
 #include <memory>
 #include <string>
 #include <vector>
@@ -18,17 +20,6 @@ namespace queue_testing {
 
 std::string CfgLine(const std::string& path, const std::string& data_json);
 
-class QueueTest {
- public:
-  QueueTest();
-  // Writes `lines` (each followed by "\n") as a queue file; returns its path.
-  std::string WriteQueue(const std::vector<std::string>& lines, const std::string& name = "queue");
-  std::string WriteRaw(const std::string& content, const std::string& name = "queue");
-  std::shared_ptr<OPTree> Build(const std::vector<std::string>& lines);
-
-  testing_support::Sandbox sandbox_{false};
-};
-
 // Printed forms of the OPs ProcessOP hands out, and the count it returns.
 struct Processed {
   std::vector<std::string> ops;
@@ -36,6 +27,30 @@ struct Processed {
 };
 Processed Process(OPTree& tree);
 std::string Print(const std::shared_ptr<OP>& op);
+
+// Logs at info level (no line-by-line debug output) while a test runs.
+class QueueTest : public ::testing::Test {
+ protected:
+  QueueTest() { log_level = 6; }
+  ~QueueTest() override { log_level = 7; }
+  // Writes `lines` (each followed by "\n") as a queue file; returns its path.
+  std::string WriteQueue(const std::vector<std::string>& lines, const std::string& name = "queue");
+  std::string WriteRaw(const std::string& content) { return sandbox_.WriteFile("queue", content); }
+  std::shared_ptr<OPTree> Build(const std::vector<std::string>& lines);
+  Processed Run(const std::vector<std::string>& lines) { return Process(*Build(lines)); }
+
+  testing_support::Sandbox sandbox_{false};
+  testing_support::LogCapture log_;
+};
+
+// One case of the merge tables: queue lines in, the printed OPs handed out
+// and the count ProcessOP returns (the cancelled OPs stay counted).
+struct MergeCase {
+  const char* name;
+  std::vector<std::string> lines;
+  std::vector<std::string> ops;
+  unsigned count;
+};
 
 }  // namespace queue_testing
 }  // namespace fileindex

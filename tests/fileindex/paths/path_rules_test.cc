@@ -26,23 +26,22 @@ std::string ShareNameOf(const std::string& share_path) {
   return name;
 }
 
-TEST(ShareNameTest, FirstComponentOfASharePath) {
-  EXPECT_EQ(ShareNameOf("/photo/2019/a.jpg"), "photo");
-  EXPECT_EQ(ShareNameOf("/photo"), "photo");
-  EXPECT_EQ(ShareNameOf("/photo/"), "photo");
-  EXPECT_EQ(ShareNameOf("/"), "");
-  EXPECT_EQ(ShareNameOf("//x"), "");
+TEST(ShareNameTest, FirstComponentOfASharePathAndItsReplacement) {
+  for (const auto& [path, name] : std::vector<std::pair<std::string, std::string>>{
+           {"/photo/2019/a.jpg", "photo"}, {"/photo", "photo"}, {"/photo/", "photo"}, {"/", ""},
+           {"//x", ""}}) {
+    EXPECT_EQ(ShareNameOf(path), name) << path;
+  }
   for (const std::string& bad : {std::string(), std::string("photo"), std::string("photo/a")}) {
     ExpectError([&] { ShareNameOf(bad); }, kErrorBadArgument, bad, "1 > share_path.size() || '/' != share_path.at(0)");
   }
-}
-
-TEST(ReplacePathShareTest, FirstWholeComponentOnly) {
-  EXPECT_EQ(ReplacePathShare("/volume1/photo", "pics", "photo"), "/volume1/pics");
-  EXPECT_EQ(ReplacePathShare("/volume1/photo/", "pics", "photo"), "/volume1/pics/");
-  EXPECT_EQ(ReplacePathShare("/volume1/photo/2019/a.jpg", "pics", "photo"), "/volume1/pics/2019/a.jpg");
-  EXPECT_EQ(ReplacePathShare("/photo/x", "pics", "photo"), "/pics/x");
-  EXPECT_EQ(ReplacePathShare("/volume1/a/x/a", "b", "a"), "/volume1/b/x/a");
+  // Only the first whole component named like the share is replaced.
+  for (const auto& [path, replaced] : std::vector<std::pair<std::string, std::string>>{
+           {"/volume1/photo", "/volume1/pics"}, {"/volume1/photo/", "/volume1/pics/"},
+           {"/volume1/photo/2019/a.jpg", "/volume1/pics/2019/a.jpg"}, {"/photo/x", "/pics/x"},
+           {"/volume1/photo/x/photo", "/volume1/pics/x/photo"}}) {
+    EXPECT_EQ(ReplacePathShare(path, "pics", "photo"), replaced) << path;
+  }
   ExpectError([] { ReplacePathShare("/volume1/photos/a", "pics", "photo"); }, kErrorBadArgument,
               "Cannot find share: photo", "string::npos == pos");
   EXPECT_THROW(ReplacePathShare("photo", "pics", "photo"), Error);  // no "/" before the name
@@ -85,51 +84,40 @@ TEST_F(PathRulesTest, FullPathsAndSharePathsConvert) {
 TEST_F(PathRulesTest, RecycleBins) {
   sandbox_.MakeDir(photo_ + "/#recycle/old");
   sandbox_.MakeDir(homes_ + "/alice/#recycle/x");
-  EXPECT_TRUE(IsFullPathInRecycleBin(photo_ + "/#recycle/old"));
-  EXPECT_TRUE(IsFullPathInRecycleBin(photo_ + "/#recycle"));
-  EXPECT_FALSE(IsFullPathInRecycleBin(photo_ + "/2019/#recycle"));  // not the share's bin
-  EXPECT_FALSE(IsFullPathInRecycleBin(photo_ + "/2019"));
-  EXPECT_TRUE(IsFullPathInRecycleBin(homes_ + "/alice/#recycle/x"));
-  EXPECT_TRUE(IsFullPathInRecycleBin(homes_ + "/#recycle"));
-  EXPECT_FALSE(IsFullPathInRecycleBin(homes_ + "/alice/docs"));
+  for (const auto& [path, in_bin] : std::vector<std::pair<std::string, bool>>{
+           {photo_ + "/#recycle/old", true}, {photo_ + "/#recycle", true},
+           {photo_ + "/2019/#recycle", false},  // not the share's bin
+           {photo_ + "/2019", false}, {homes_ + "/alice/#recycle/x", true},
+           {homes_ + "/#recycle", true}, {homes_ + "/alice/docs", false}}) {
+    EXPECT_EQ(IsFullPathInRecycleBin(path), in_bin) << path;
+  }
   EXPECT_THROW(IsFullPathInRecycleBin(sandbox_.volume() + "/video/#recycle"), Error);
 }
 
-TEST_F(PathRulesTest, CanonicalPathsInWritableSharesAreIndexable) {
-  EXPECT_TRUE(CanFullPathBeIndexed(photo_));
-  EXPECT_TRUE(CanFullPathBeIndexed(photo_ + "/2019/trip"));
-  EXPECT_TRUE(CanPathBeIndexed("/photo/2019"));
-  EXPECT_FALSE(CanFullPathBeIndexed(photo_ + "/"));
-  EXPECT_FALSE(CanFullPathBeIndexed(photo_ + "/2019/"));
-  EXPECT_FALSE(CanFullPathBeIndexed(photo_ + "//2019"));
-  EXPECT_FALSE(CanFullPathBeIndexed(photo_ + "/./2019"));
-  EXPECT_FALSE(CanFullPathBeIndexed(photo_ + "/2019/trip/.."));
-  EXPECT_FALSE(CanPathBeIndexed("/photo/2019/../2019"));
-  EXPECT_FALSE(CanFullPathBeIndexed(photo_ + "/missing"));
-  ASSERT_EQ(symlink((photo_ + "/2019").c_str(), (photo_ + "/latest").c_str()), 0);
-  EXPECT_FALSE(CanFullPathBeIndexed(photo_ + "/latest"));
-  EXPECT_FALSE(CanFullPathBeIndexed(photo_ + "/latest/trip"));
-}
-
-TEST_F(PathRulesTest, ReadOnlyEncryptedRecycledAndUnknown) {
-  EXPECT_FALSE(CanFullPathBeIndexed(archive_));
-  EXPECT_FALSE(CanFullPathBeIndexed(secret_));
+// Canonical existing paths of writable shares, no link on the way, no bin,
+// no snapshot.
+TEST_F(PathRulesTest, IndexableFullPaths) {
   sandbox_.MakeDir(photo_ + "/#recycle/old");
   sandbox_.MakeDir(homes_ + "/alice/#recycle");
-  EXPECT_FALSE(CanFullPathBeIndexed(photo_ + "/#recycle/old"));
-  EXPECT_FALSE(CanFullPathBeIndexed(homes_ + "/alice/#recycle"));
-  EXPECT_TRUE(CanFullPathBeIndexed(homes_ + "/alice"));
+  sandbox_.MakeDir(photo_ + "/#snapshot/daily");
+  sandbox_.MakeDir(photo_ + "/my#snapshot");
+  ASSERT_EQ(symlink((photo_ + "/2019").c_str(), (photo_ + "/latest").c_str()), 0);
+  for (const auto& [path, indexable] : std::vector<std::pair<std::string, bool>>{
+           {photo_, true}, {photo_ + "/2019/trip", true}, {homes_ + "/alice", true},
+           {photo_ + "/my#snapshot", true}, {photo_ + "/", false}, {photo_ + "/2019/", false},
+           {photo_ + "//2019", false}, {photo_ + "/./2019", false},
+           {photo_ + "/2019/trip/..", false}, {photo_ + "/missing", false},
+           {photo_ + "/latest", false}, {photo_ + "/latest/trip", false}, {archive_, false},
+           {secret_, false}, {photo_ + "/#recycle/old", false}, {homes_ + "/alice/#recycle", false},
+           {photo_ + "/#snapshot/daily", false}}) {
+    EXPECT_EQ(CanFullPathBeIndexed(path), indexable) << path;
+  }
+  EXPECT_TRUE(CanPathBeIndexed("/photo/2019"));
+  EXPECT_FALSE(CanPathBeIndexed("/photo/2019/../2019"));
   // A path in no share cannot be answered: it throws rather than says no.
   const std::string outside = sandbox_.MakeDir(sandbox_.volume() + "/video");
   EXPECT_THROW(CanFullPathBeIndexed(outside), Error);
   EXPECT_THROW(CanPathBeIndexed("/video"), Error);
-}
-
-TEST_F(PathRulesTest, SnapshotsOnlyWhenThePlatformConfirms) {
-  sandbox_.MakeDir(photo_ + "/#snapshot/daily");
-  sandbox_.MakeDir(photo_ + "/my#snapshot");
-  EXPECT_FALSE(CanFullPathBeIndexed(photo_ + "/#snapshot/daily"));
-  EXPECT_TRUE(CanFullPathBeIndexed(photo_ + "/my#snapshot"));
 }
 
 // Answers statfs for the whole sandbox as a given file system would.
@@ -191,14 +179,12 @@ TEST_F(PathRulesTest, MountPointsOnlyAsAnEncryptedSharesDirectory) {
 }
 
 TEST(PreservedNameTest, PlatformHiddenNamesAndTheFixedList) {
-  EXPECT_TRUE(IsSystemPreservedFileName(".DS_Store"));
-  EXPECT_TRUE(IsSystemPreservedFileName(".TemporaryItems"));
-  EXPECT_TRUE(IsSystemPreservedFileName(".CORVPPSDB"));
-  EXPECT_TRUE(IsSystemPreservedFileName("@eaDir"));
-  EXPECT_FALSE(IsSystemPreservedFileName(".ds_store"));
-  EXPECT_FALSE(IsSystemPreservedFileName("DS_Store"));
-  EXPECT_FALSE(IsSystemPreservedFileName("#recycle"));
-  EXPECT_FALSE(IsSystemPreservedFileName(""));
+  for (const char* name : {".DS_Store", ".TemporaryItems", ".CORVPPSDB", "@eaDir"}) {
+    EXPECT_TRUE(IsSystemPreservedFileName(name)) << name;
+  }
+  for (const char* name : {".ds_store", "DS_Store", "#recycle", ""}) {
+    EXPECT_FALSE(IsSystemPreservedFileName(name)) << name;
+  }
   ScopedFakePlatform installed;
   installed->EAIsHiddenDirHook = [](const std::string& name) { return name == ".ds_store" ? 1 : 0; };
   EXPECT_TRUE(IsSystemPreservedFileName(".ds_store"));

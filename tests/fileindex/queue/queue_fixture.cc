@@ -1,8 +1,6 @@
-#include "tests/fileindex/optree/queue_fixture.h"
+#include "tests/fileindex/queue/queue_fixture.h"
 
 #include <sstream>
-
-#include "common/json_util.h"
 
 namespace corvlumex {
 namespace fileindex {
@@ -12,15 +10,9 @@ std::string CfgLine(const std::string& path, const std::string& data_json) {
   return "{\"event\":131072,\"path\":\"" + path + "\",\"data\":" + data_json + "}";
 }
 
-QueueTest::QueueTest() {}
-
 std::string QueueTest::WriteQueue(const std::vector<std::string>& lines, const std::string& name) {
   std::string content;
   for (const std::string& line : lines) content += line + "\n";
-  return WriteRaw(content, name);
-}
-
-std::string QueueTest::WriteRaw(const std::string& content, const std::string& name) {
   return sandbox_.WriteFile(name, content);
 }
 

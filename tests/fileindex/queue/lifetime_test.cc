@@ -6,19 +6,14 @@
 #include <vector>
 
 #include "common/log.h"
-#include "tests/fileindex/optree/queue_fixture.h"
+#include "tests/fileindex/queue/queue_fixture.h"
 
 namespace corvlumex {
 namespace fileindex {
 namespace queue_testing {
 namespace {
 
-class LifetimeTest : public ::testing::Test, public QueueTest {
- protected:
-  void SetUp() override { log_level = 6; }
-  void TearDown() override { log_level = 7; }
-  testing_support::LogCapture log_;
-};
+using LifetimeTest = QueueTest;
 
 TEST_F(LifetimeTest, ReleasingTheTreeFreesNodesAndOPs) {
   auto tree = Build({Line(kEventCreate, "/v/s/a/x"), Line(kEventRename, "/v/s/b", true, "/v/s/a"),
@@ -105,6 +100,9 @@ TEST_F(LifetimeTest, NamesOfAnyLengthAndNodesMadeOutsideATree) {
   auto loose = std::make_shared<OPNode>(root, "a name longer than any short string");
   EXPECT_EQ(loose->name_, "a name longer than any short string");
   EXPECT_EQ(loose->GetPath(), "/a name longer than any short string");
+  OPNode unshared(nullptr, "");  // not owned by a shared_ptr: cannot hand out children
+  EXPECT_THROW(unshared.GetChild("x"), std::bad_weak_ptr);
+  EXPECT_TRUE(unshared.Children().empty());
 }
 
 TEST_F(LifetimeTest, FailedConstructionLeavesNothingBehind) {

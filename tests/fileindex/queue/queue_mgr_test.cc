@@ -11,19 +11,16 @@
 #include "fileindex/queue/event.h"
 #include "fileindex/queue/optree.h"
 #include "fileindex/queue/queue_mgr.h"
+#include "tests/support/queue_line.h"
 #include "tests/support/sandbox.h"
 
 namespace corvlumex {
 namespace fileindex {
 namespace {
 
+// A queue line with its newline.
 std::string Line(unsigned event, const std::string& path, const std::string& path_old = "", bool is_dir = false) {
-  Json::Value line(Json::objectValue);
-  line["event"] = event;
-  line["path"] = path;
-  if (!path_old.empty()) line["path_old"] = path_old;
-  if (is_dir) line["is_dir"] = true;
-  return JsonToString(line) + "\n";
+  return queue_testing::Line(event, path, is_dir, path_old) + "\n";
 }
 
 class QueueMgrTest : public ::testing::Test {
@@ -111,41 +108,54 @@ TEST_F(QueueMgrTest, FailedRenameIs502) {
   EXPECT_TRUE(IsFileExist(queue_)) << "the queue stays where it was";
 }
 
-TEST_F(QueueMgrTest, ProcessingMeansAnEventOnThePathOrBelowInEitherFile) {
+// Processing: an event on the path or below it (a rename's old name too);
+// reindex: a pure reindex of the path or a folder above it. Both look in the
+// live queue and in the taken-over one; a last line still being appended is
+// not there yet.
+TEST_F(QueueMgrTest, ProcessingAndReindexPredicates) {
+  const std::string reindex = Line(kEventReindex, "/v/s/dir");
+  const struct {
+    std::string live, taken_over, path;
+    bool processing, reindexed;
+  } rows[] = {
+      {Line(kEventCreate, "/v/s/dir/f"), "", "/v/s/dir", true, false},
+      {Line(kEventCreate, "/v/s/dir/f"), "", "/v/s/dir/f", true, false},
+      {Line(kEventCreate, "/v/s/dir/f"), "", "/v/s/dir/f/g", false, false},
+      {Line(kEventCreate, "/v/s/dirx"), "", "/v/s/dir", false, false},
+      {Line(kEventCreate, "/v/s/dirx"), Line(kEventRename, "/v/s/elsewhere", "/v/s/dir/moved", true), "/v/s/dir",
+       true, false},
+      {"", Line(kEventRename, "/v/s/elsewhere", "/v/s/dir/moved", true), "/v/s/dir", true, false},
+      {reindex, "", "/v/s/dir/f", false, true},
+      {reindex, "", "/v/s/dir", true, true},
+      {reindex, "", "/v/s/dirx/f", false, false},
+      {reindex, "", "/v/s", true, false},
+      {Line(kEventReindex, "/v/s/dir/f/g"), "", "/v/s/dir/f", true, false},
+      // A directory create is not a reindex, nor is a reindex with another bit.
+      {Line(kEventCreate, "/v/s/dir", "", true) + Line(kEventReindex | kEventCreate, "/v/s/dir"), "", "/v/s/dir/f",
+       false, false},
+      {"", Line(kEventReindex, "/v/s"), "/v/s/dir/f", false, true},
+      {Line(kEventCreate, "/v/s/a") + reindex.substr(0, reindex.size() / 2), "", "/v/s/dir/f", false, false},
+      {Line(kEventCreate, "/v/s/a") + reindex.substr(0, reindex.size() / 2), "", "/v/s/a", true, false},
+      // Complete but without its newline yet: it counts.
+      {reindex.substr(0, reindex.size() - 1), "", "/v/s/dir/f", false, true},
+  };
   QueueMgr mgr(queue_);
-  Write(queue_, Line(kEventCreate, "/v/s/dir/f"));
-  EXPECT_TRUE(mgr.IsFullPathProcessing("/v/s/dir"));
-  EXPECT_TRUE(mgr.IsFullPathProcessing("/v/s/dir/f"));
-  EXPECT_FALSE(mgr.IsFullPathProcessing("/v/s/dir/f/g"));
-  Write(queue_, Line(kEventCreate, "/v/s/dirx"));
-  EXPECT_FALSE(mgr.IsFullPathProcessing("/v/s/dir"));
-  // The old name of a rename counts, and so does the taken-over file.
-  Write(tmp_, Line(kEventRename, "/v/s/elsewhere", "/v/s/dir/moved", true));
-  EXPECT_TRUE(mgr.IsFullPathProcessing("/v/s/dir"));
-  ASSERT_EQ(unlink(queue_.c_str()), 0);
-  EXPECT_TRUE(mgr.IsFullPathProcessing("/v/s/dir"));
-}
-
-TEST_F(QueueMgrTest, ProcessingLoadsTheFolderFile) {
+  for (const auto& row : rows) {
+    SCOPED_TRACE(row.live + " | " + row.taken_over + " | " + row.path);
+    unlink(queue_.c_str());
+    unlink(tmp_.c_str());
+    if (!row.live.empty()) Write(queue_, row.live);
+    if (!row.taken_over.empty()) Write(tmp_, row.taken_over);
+    EXPECT_EQ(mgr.IsFullPathProcessing(row.path), row.processing);
+    EXPECT_EQ(mgr.IsFullPathHasReindex(row.path), row.reindexed);
+  }
+  // The folder file is loaded for the processing check; a malformed queue
+  // line fails the scan unless a hit before it ends the scan first.
+  Write(queue_, Line(kEventCreate, "/v/s/a") + "\n" + Line(kEventCreate, "/v/s/dir/f"));
+  EXPECT_EQ(ErrorOf([&] { mgr.IsFullPathProcessing("/v/s/dir"); }).code, kErrorMalformedEvent);
+  EXPECT_TRUE(mgr.IsFullPathProcessing("/v/s/a"));
   sandbox_.Write("var/packages/CorvLumex/etc/fileindex.folders", "not json");
-  QueueMgr mgr(queue_);
-  EXPECT_EQ(ErrorOf([&] { mgr.IsFullPathProcessing("/v/s/dir"); }).code, kErrorLoadJson);
-}
-
-TEST_F(QueueMgrTest, ReindexCoversThePathAndWhatIsBelowIt) {
-  QueueMgr mgr(queue_);
-  Write(queue_, Line(kEventReindex, "/v/s/dir"));
-  EXPECT_TRUE(mgr.IsFullPathHasReindex("/v/s/dir/f"));
-  EXPECT_TRUE(mgr.IsFullPathHasReindex("/v/s/dir"));
-  EXPECT_FALSE(mgr.IsFullPathHasReindex("/v/s/dirx/f"));
-  EXPECT_FALSE(mgr.IsFullPathHasReindex("/v/s"));
-  Write(queue_, Line(kEventReindex, "/v/s/dir/f/g"));
-  EXPECT_FALSE(mgr.IsFullPathHasReindex("/v/s/dir/f"));
-  // A directory create is not a reindex, nor is a reindex with another bit.
-  Write(queue_, Line(kEventCreate, "/v/s/dir", "", true) + Line(kEventReindex | kEventCreate, "/v/s/dir"));
-  EXPECT_FALSE(mgr.IsFullPathHasReindex("/v/s/dir/f"));
-  Write(tmp_, Line(kEventReindex, "/v/s"));
-  EXPECT_TRUE(mgr.IsFullPathHasReindex("/v/s/dir/f"));
+  EXPECT_EQ(ErrorOf([&] { mgr.IsFullPathProcessing("/v/s/a"); }).code, kErrorLoadJson);
 }
 
 // A crash marker in either file means the share's events were lost and it
@@ -164,25 +174,6 @@ TEST_F(QueueMgrTest, LostEventsAreACrashMarkerInTheLiveOrTheTakenOverQueue) {
   EXPECT_FALSE(mgr.HasLostEvents());
   Write(queue_, Line(kEventQueueCrash | kEventCreate, "/v/s/b"));
   EXPECT_TRUE(mgr.HasLostEvents());
-}
-
-TEST_F(QueueMgrTest, AMalformedLineFailsTheScan) {
-  QueueMgr mgr(queue_);
-  Write(queue_, Line(kEventCreate, "/v/s/a") + "\n" + Line(kEventCreate, "/v/s/dir/f"));
-  EXPECT_EQ(ErrorOf([&] { mgr.IsFullPathProcessing("/v/s/dir"); }).code, kErrorMalformedEvent);
-  // A hit before the bad line ends the scan first.
-  EXPECT_TRUE(mgr.IsFullPathProcessing("/v/s/a"));
-}
-
-TEST_F(QueueMgrTest, ALastLineStillBeingAppendedIsNotThereYet) {
-  QueueMgr mgr(queue_);
-  const std::string whole = Line(kEventReindex, "/v/s/dir");
-  Write(queue_, Line(kEventCreate, "/v/s/a") + whole.substr(0, whole.size() / 2));
-  EXPECT_FALSE(mgr.IsFullPathHasReindex("/v/s/dir/f"));
-  EXPECT_TRUE(mgr.IsFullPathProcessing("/v/s/a"));
-  // Complete but without its newline yet: it counts.
-  Write(queue_, whole.substr(0, whole.size() - 1));
-  EXPECT_TRUE(mgr.IsFullPathHasReindex("/v/s/dir/f"));
 }
 
 TEST_F(QueueMgrTest, AppendIsCreatedWhenMissingAndSilentWithoutADirectory) {
