@@ -26,10 +26,12 @@ namespace corvlumex {
 namespace fileindex {
 namespace {
 
-// Lock back-off stays randomised but is scaled down tenfold: real
-// contention, short waits.
+// Lock back-off stays randomised but is scaled down fourfold: real
+// contention, short waits, and still some seconds of patience for a writer
+// that keeps losing the lock on a loaded machine under the sanitizers
+// (tenfold left under 3 s, and a writer gave up there once).
 void UseShortSleeps() {
-  SetSleepHook([](std::chrono::microseconds duration) { std::this_thread::sleep_for(duration / 10); });
+  SetSleepHook([](std::chrono::microseconds duration) { std::this_thread::sleep_for(duration / 4); });
 }
 
 // Runs `work` in `count` child processes; returns their pids.
