@@ -74,11 +74,6 @@ class ElasticControlTest : public ::testing::Test {
   std::string share_path_;
 };
 
-TEST_F(ElasticControlTest, IndexIdIsThePrefixAndTheShareNameUnchanged) {
-  EXPECT_EQ(GetFileIndexID("Music Share"), "fileindex_Music Share");
-  EXPECT_EQ(GetFileIndexID(""), "fileindex_");
-}
-
 // The look whether a restarted daemon can take the share's requests: one
 // "index_list", never the busy retry's sleep.
 TEST_F(ElasticControlTest, AnIndexIsReadyUnlessTheDaemonIsBusyOrStillOpeningIt) {
@@ -109,6 +104,8 @@ TEST_F(ElasticControlTest, ShareIndexCommandsCarryTheirEnvelopes) {
   } cases[] = {
       {[] { ShareIndexDelete("music"); }, R"({"command": "index_delete", "data": {"id": "fileindex_music"}})"},
       {[] { ShareIndexPause("music"); }, R"({"command": "index_pause", "data": {"id": "fileindex_music"}})"},
+      // The index id is the prefix and the share name unchanged.
+      {[] { ShareIndexPause("Music Share"); }, R"({"command": "index_pause", "data": {"id": "fileindex_Music Share"}})"},
       {[] { ShareIndexResume("music"); }, R"({"command": "index_resume", "data": {"id": "fileindex_music"}})"},
       {[] { ShareIndexRename("music", "audio", "/volume2/audio/@eaDir/fileindex.db"); },
        R"({"command": "index_config_set", "data": {"id": "fileindex_music",
