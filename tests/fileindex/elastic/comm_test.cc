@@ -192,7 +192,8 @@ class CompoundTest : public SendRequestTest {
 // fails the whole request with its bare message (and ends the reading).
 TEST_F(CompoundTest, FailedSubRequestsAreLoggedAndABusyOneFailsTheWhole) {
   const auto sub = [&](int i) { return JsonToString(compound_["compound"][i]); };
-  const std::string busy = R"("data": [{"success": false, "error": {"code": 1400, "msg": "busy"}}])";
+  const std::string busy =
+      R"("data": [{"success": false, "error": {"code": 1400, "msg": "busy"}}])";
   const struct {
     std::string answer;
     int code;
@@ -209,7 +210,8 @@ TEST_F(CompoundTest, FailedSubRequestsAreLoggedAndABusyOneFailsTheWhole) {
           {"success": false, "error": {"code": 1300, "msg": "never looked at"}}]})",
        elasticd::kCodeBusy, {sub(0) + " (1300) no such doc"}, true},
       {R"({"success": true, "has_fail": true, "data": [
-          5, {"success": "no"}, {"success": false, "error": "oops"}, {"success": false, "error": {"code": "x"}}]})",
+          5, {"success": "no"}, {"success": false, "error": "oops"},
+          {"success": false, "error": {"code": "x"}}]})",
        0, {sub(0) + " (0) ", sub(1) + " (0) ", sub(2) + " (0) ", "null (0) "}, true},
       {R"({"success": true, "has_fail": false, )" + busy + "}", 0, {}, true},
       {R"({"success": true, )" + busy + "}", 0, {}, true},
@@ -224,8 +226,11 @@ TEST_F(CompoundTest, FailedSubRequestsAreLoggedAndABusyOneFailsTheWhole) {
     EXPECT_EQ(error.reason, c.code != 0 ? "busy" : "");
     const auto lines = log_.Matching("(SendRequestImpl) Compound failed: ");
     ASSERT_EQ(lines.size(), c.logged.size()) << ::testing::PrintToString(log_.Lines());
-    for (size_t i = 0; i < lines.size(); ++i) EXPECT_NE(lines[i].find(c.logged[i]), std::string::npos) << lines[i];
-    EXPECT_TRUE(!c.logged.empty() || log_.Lines().empty()) << ::testing::PrintToString(log_.Lines());
+    for (size_t i = 0; i < lines.size(); ++i) {
+      EXPECT_NE(lines[i].find(c.logged[i]), std::string::npos) << lines[i];
+    }
+    EXPECT_TRUE(!c.logged.empty() || log_.Lines().empty())
+        << ::testing::PrintToString(log_.Lines());
   }
 }
 

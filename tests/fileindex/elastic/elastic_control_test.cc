@@ -105,7 +105,8 @@ TEST_F(ElasticControlTest, ShareIndexCommandsCarryTheirEnvelopes) {
       {[] { ShareIndexDelete("music"); }, R"({"command": "index_delete", "data": {"id": "fileindex_music"}})"},
       {[] { ShareIndexPause("music"); }, R"({"command": "index_pause", "data": {"id": "fileindex_music"}})"},
       // The index id is the prefix and the share name unchanged.
-      {[] { ShareIndexPause("Music Share"); }, R"({"command": "index_pause", "data": {"id": "fileindex_Music Share"}})"},
+      {[] { ShareIndexPause("Music Share"); },
+       R"({"command": "index_pause", "data": {"id": "fileindex_Music Share"}})"},
       {[] { ShareIndexResume("music"); }, R"({"command": "index_resume", "data": {"id": "fileindex_music"}})"},
       {[] { ShareIndexRename("music", "audio", "/volume2/audio/@eaDir/fileindex.db"); },
        R"({"command": "index_config_set", "data": {"id": "fileindex_music",
@@ -124,8 +125,10 @@ TEST_F(ElasticControlTest, ShareIndexCommandsCarryTheirEnvelopes) {
          UpdateTermSuggestion("fileindex_music", {});
        },
        R"({"compound": [
-           {"command": "update_term_suggestion", "data": {"doc_id_field": "CORVMDFSName", "db_name": "fileindex_music"}},
-           {"command": "update_term_suggestion", "data": {"doc_id_field": "CORVMDTitle", "db_name": "fileindex_music"}}]})"},
+           {"command": "update_term_suggestion",
+            "data": {"doc_id_field": "CORVMDFSName", "db_name": "fileindex_music"}},
+           {"command": "update_term_suggestion",
+            "data": {"doc_id_field": "CORVMDTitle", "db_name": "fileindex_music"}}]})"},
   };
   size_t index = 0;
   for (const auto& c : cases) {

@@ -81,8 +81,9 @@ TEST(SchemaTest, MappingsHaveKeyFieldAndDefaultsSettingsAreEmptyAndTheHandlerFol
   EXPECT_TRUE(GetFileIndexMappings()["properties"].isMember("CORVMDPath"));
   // The event handler's path follows the system root.
   testing_support::Sandbox root;
-  EXPECT_EQ(GetFileIndexEventHandler(), testing_support::JsonOf(R"({"lib_path": ")" + root.path() +
-                                                               R"(/var/packages/CorvLumex/target/handler/fileindex_event_handler.so"})"));
+  EXPECT_EQ(GetFileIndexEventHandler()["lib_path"],
+            root.path() + "/var/packages/CorvLumex/target/handler/fileindex_event_handler.so");
+  EXPECT_EQ(GetFileIndexEventHandler().size(), 1u);
 }
 
 TEST(SchemaTest, EveryFieldHoldsOnlyWhatDiffersFromTheDefault) {

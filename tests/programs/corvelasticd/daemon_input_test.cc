@@ -289,21 +289,27 @@ TEST_F(DaemonInputTest, UsersSeeOnlyFilesTheyCanReadDirectlyOrOnTheirBehalf) {
   const struct passwd user = *nobody;
   const std::string share = OpenShare();
   // Many unreadable hits first in key order, so paging has to look past them.
-  for (int i = 0; i < 150; ++i) AddFile(share + "/a-secret-" + std::to_string(1000 + i) + ".txt", 0600, "common zanzibar");
+  for (int i = 0; i < 150; ++i) {
+    AddFile(share + "/a-secret-" + std::to_string(1000 + i) + ".txt", 0600, "common zanzibar");
+  }
   Names readable;
   for (int i = 0; i < 3; ++i) {
     readable.push_back(share + "/b-public-" + std::to_string(i) + ".txt");
     AddFile(readable.back(), 0644, "common word");
   }
-  ASSERT_TRUE(Run("update_term_suggestion", R"({"doc_id_field": "CORVMDTextContent", "db_name": "fileindex_share"})")["success"].asBool());
+  const char* suggestions =
+      R"({"doc_id_field": "CORVMDTextContent", "db_name": "fileindex_share"})";
+  ASSERT_TRUE(Run("update_term_suggestion", suggestions)["success"].asBool());
   Commit();
   const std::string socket = daemon_->socket_path();
-  const char* query = R"({"query": {"qsl": {"match": {"_all": "common"}}}, "size": 2, "sort": "_key", "track_total": true})";
+  const char* query = R"({"query": {"qsl": {"match": {"_all": "common"}}},
+                          "size": 2, "sort": "_key", "track_total": true})";
   // `data` sent by the user nobody.
   const auto as_nobody = [&](const std::string& command, Json::Value data) {
     data["id"] = kIndex;
     Json::Value answer;
-    const std::string text = AsUser(user, [&] { return JsonToString(Command(socket, command, data)); });
+    const std::string text =
+        AsUser(user, [&] { return JsonToString(Command(socket, command, data)); });
     EXPECT_TRUE(JsonFromString(answer, text)) << text;
     return answer;
   };
@@ -313,7 +319,8 @@ TEST_F(DaemonInputTest, UsersSeeOnlyFilesTheyCanReadDirectlyOrOnTheirBehalf) {
   EXPECT_TRUE(direct["data"]["total_exact"].asBool());
   Json::Value remove;
   remove["doc_id"] = readable[0];
-  EXPECT_EQ(as_nobody("document_del_by_id", remove)["error"]["code"].asInt(), elasticd::kCodePermissionDenied);
+  EXPECT_EQ(as_nobody("document_del_by_id", remove)["error"]["code"].asInt(),
+            elasticd::kCodePermissionDenied);
   Json::Value as_root = Data(query);
   as_root["as_user"] = "root";
   EXPECT_EQ(as_nobody("search", as_root)["error"]["code"].asInt(), elasticd::kCodePermissionDenied);

@@ -82,7 +82,8 @@ TEST_F(IndexStoreTest, WordQueriesSeeUncommittedChangesInOrderAndAnUpsertReplace
   Put("/s/a", R"({"body": "alpha beta", "size": 5})");
   Put("/s/b", R"({"body": "alpha"})");
   EXPECT_EQ(WriterKeys(R"({"match": {"body": "alpha"}})"), (Keys{"/s/a", "/s/b"}));
-  EXPECT_EQ(Refusal([&] { store_->SetById("/s/a", JsonOf(R"({"size": "big"})")); }).first, kCodeBadDocument);
+  EXPECT_EQ(Refusal([&] { store_->SetById("/s/a", JsonOf(R"({"size": "big"})")); }).first,
+            kCodeBadDocument);
   Put("/s/a", R"({"body": "gamma"})");  // the whole document: its old words and size go
   EXPECT_EQ(store_->DeleteByQuery(Q(R"({"match": {"body": "alpha"}})")), 1);
   Put("/s/c", R"({"body": "beta gamma"})");

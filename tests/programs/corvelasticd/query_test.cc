@@ -172,7 +172,8 @@ TEST(QueryParseTest, BadQueriesNameTheFaultyPart) {
       {R"({"term": {"body": [1]}})", "the value for \"body\" must be a string, a number or a bool"},
       {R"({"match": {"body": {"query": 5}}})", "\"match\" on \"body\" needs a string \"query\""},
       {R"({"match": {"body": {"query": "a", "operator": "xor"}}})", "\"operator\" must be \"and\" or \"or\""},
-      {R"({"match": {"body": {"query": "a", "operator": {}}}})", "\"operator\" must be \"and\" or \"or\""},
+      {R"({"match": {"body": {"query": "a", "operator": {}}}})",
+       "\"operator\" must be \"and\" or \"or\""},
       {R"({"match_phrase": {"size": "1"}})", "\"match_phrase\" needs a text field, \"size\" is not one"},
       {R"({"terms": {"kind": "a"}})", "\"terms\" on \"kind\" needs an array"},
       {R"({"prefix": {"kind": 5}})", "\"prefix\" on \"kind\" needs a string"},
@@ -188,7 +189,8 @@ TEST(QueryParseTest, BadQueriesNameTheFaultyPart) {
       {deep, "clauses nested deeper than 32"},
       {R"({"terms": {"size": [)" + many_terms + "]}}", "more than 1024 clauses and \"terms\" values; split the query"},
       {R"({"match": {"body": ")" + many_words + R"("}})", "more than 64 words in one clause; search for fewer words"},
-      {R"({"match": {"body": ")" + dashed + R"("}})", "more than 64 words in one clause; search for fewer words"},
+      {R"({"match": {"body": ")" + dashed + R"("}})",
+       "more than 64 words in one clause; search for fewer words"},
       {R"({"bool": {"must": [)" + four_clauses + R"({"match": {"body": "last"}}]}})", "more than 256 words in the query"},
       {R"({"match": {"kind": ")" + long_words + R"("}})", "the texts of the query are longer than 65536 bytes"},
       {R"({"match": {"name": ")" + std::string(1025, 'n') + R"("}})", "the text searched in \"name\" is longer than 1024 bytes"},
@@ -203,7 +205,8 @@ TEST(QueryParseTest, BadQueriesNameTheFaultyPart) {
     }
   }
   // The limits leave ordinary queries alone: 64 words in a clause, 256 in all.
-  EXPECT_NO_THROW(Query::Parse(JsonOf(R"({"bool": {"must": [)" + four_clauses + R"({"match_all": {}}]}})"), Schema()));
+  const std::string at_limits = R"({"bool": {"must": [)" + four_clauses + R"({"match_all": {}}]}})";
+  EXPECT_NO_THROW(Query::Parse(JsonOf(at_limits), Schema()));
 }
 
 TEST(QueryParseTest, PrefixUpperBoundAndPhraseQuoting) {

@@ -93,7 +93,8 @@ TEST(AnalyzeTest, EachAnalyzerSplitsAndFoldsAsItsFieldsNeed) {
     std::vector<std::string> tokens;
   } cases[] = {
       // Joined and camelCase words give the whole word, then each part.
-      {Analyzer::kStandard, "pthread_mutex_lock", {"pthread_mutex_lock", "pthread", "mutex", "lock"}},
+      {Analyzer::kStandard, "pthread_mutex_lock",
+       {"pthread_mutex_lock", "pthread", "mutex", "lock"}},
       {Analyzer::kStandard, "readFileSync", {"readfilesync", "read", "file", "sync"}},
       {Analyzer::kStandard, "XMLParser", {"xmlparser", "xml", "parser"}},
       {Analyzer::kStandard, "utf8Decode", {"utf8decode", "utf8", "decode"}},
@@ -102,7 +103,8 @@ TEST(AnalyzeTest, EachAnalyzerSplitsAndFoldsAsItsFieldsNeed) {
       {Analyzer::kStandard, "plain Words UPPER", {"plain", "words", "upper"}},
       {Analyzer::kStandard, "foo_bar e-mail C++", {"foo_bar", "foo", "bar", "e", "mail", "c"}},
       // Punctuation splits, accents fold away, and each CJK character is a word.
-      {Analyzer::kStandard, "AC-3 decoder_v2, \xC3\x89t\xC3\xA9!", {"ac", "3", "decoder_v2", "decoder", "v2", "ete"}},
+      {Analyzer::kStandard, "AC-3 decoder_v2, \xC3\x89t\xC3\xA9!",
+       {"ac", "3", "decoder_v2", "decoder", "v2", "ete"}},
       {Analyzer::kStandard, "\xE6\x9D\xB1\xE4\xBA\xAC", {"\xE6\x9D\xB1", "\xE4\xBA\xAC"}},
       // Keyword values stay whole, their blanks kept as unit separators.
       {Analyzer::kKeyword, "My File.TXT", {"my\x1F" "file.txt"}},

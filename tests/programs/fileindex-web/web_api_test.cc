@@ -45,13 +45,14 @@ class WebSandbox : public SystemSandbox {
     const std::string link = root() + "/var/run/fileindex-web.sign-in";
     for (int attempt = 0; attempt < 5 && !web_; ++attempt) {
       port_ = FreePort();
-      std::vector<std::string> args = {"--port", std::to_string(port_), "--web-root",
-                                       std::string(FILEINDEX_SOURCE_DIR) + "/web", "--sign-in-link-file", link};
+      std::vector<std::string> args = {"--port", std::to_string(port_), "--sign-in-link-file", link,
+                                       "--web-root", std::string(FILEINDEX_SOURCE_DIR) + "/web"};
       args.insert(args.end(), web_args.begin(), web_args.end());
-      web_ = std::make_unique<ChildProcess>(ProgramPath("fileindex-web"), args, root() + "/fileindex-web.log");
+      web_ = std::make_unique<ChildProcess>(ProgramPath("fileindex-web"), args,
+                                            root() + "/fileindex-web.log");
       // The link is written once the port is bound; a lost race for the port ends the daemon.
-      if (!PollUntil([&] { return access(link.c_str(), F_OK) == 0 || !web_->Running(); }, std::chrono::seconds(20)) ||
-          !web_->Running()) {
+      const auto written = [&] { return access(link.c_str(), F_OK) == 0 || !web_->Running(); };
+      if (!PollUntil(written, std::chrono::seconds(20)) || !web_->Running()) {
         web_.reset();
       }
     }
@@ -137,14 +138,17 @@ class WebClient {
     JsonFromString(reply.json, result->body);
     const std::string set_cookie = result->get_header_value("Set-Cookie");
     const std::string name = "fileindex_session=";
-    if (set_cookie.compare(0, name.size(), name) == 0) cookie = set_cookie.substr(name.size(), set_cookie.find(';') - name.size());
+    if (set_cookie.compare(0, name.size(), name) == 0) {
+      cookie = set_cookie.substr(name.size(), set_cookie.find(';') - name.size());
+    }
     if (reply.json["data"].isObject() && reply.json["data"]["csrf_token"].isString()) {
       csrf_token = reply.json["data"]["csrf_token"].asString();
     }
     return reply;
   }
   httplib::Client Connect() const {
-    httplib::Client client((https_ ? "https://127.0.0.1:" : "http://127.0.0.1:") + std::to_string(port_));
+    httplib::Client client((https_ ? "https://127.0.0.1:" : "http://127.0.0.1:") +
+                           std::to_string(port_));
     client.enable_server_certificate_verification(false);  // the test's own certificate
     return client;
   }
@@ -289,8 +293,9 @@ TEST_F(WebApiTest, BadRequestsGetAJsonErrorAndTheDaemonStaysUp) {
     EXPECT_FALSE(reply.json["error"]["reason"].asString().empty()) << reply.body;
     EXPECT_FALSE(reply.json["error"]["what_to_do"].asString().empty()) << reply.body;
   }
-  for (const char* read : {"/api/search?q=%22unclosed", "/api/search?size=100000", "/api/search?q=a&q=b",
-                           "/api/search?category=spreadsheet", "/api/folders?sort=colour"}) {
+  for (const char* read : {"/api/search?q=%22unclosed", "/api/search?size=100000",
+                           "/api/search?q=a&q=b", "/api/search?category=spreadsheet",
+                           "/api/folders?sort=colour"}) {
     const Reply reply = admin.Get(read);
     EXPECT_EQ(reply.status, 400) << read << ": " << reply.body;
     EXPECT_FALSE(reply.json["error"]["reason"].asString().empty()) << read;
