@@ -121,11 +121,6 @@ std::vector<Json::Value> FakeSearchDaemon::Requests() const {
   return requests_;
 }
 
-std::vector<std::string> FakeSearchDaemon::RawRequests() const {
-  std::lock_guard<std::mutex> guard(mutex_);
-  return raw_requests_;
-}
-
 int FakeSearchDaemon::Connections() const {
   std::lock_guard<std::mutex> guard(mutex_);
   return connections_;
@@ -182,7 +177,6 @@ void FakeSearchDaemon::HandleConnection(int fd) {
   {
     std::lock_guard<std::mutex> guard(mutex_);
     requests_.push_back(request);
-    raw_requests_.push_back(text);
   }
   const FakeAnswer answer = NextAnswer(request);
   if (answer.action != FakeAnswer::Action::kAnswer) return;

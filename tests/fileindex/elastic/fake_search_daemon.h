@@ -59,7 +59,6 @@ class FakeSearchDaemon {
 
   // Requests as received (null where the text was not JSON), in order.
   std::vector<Json::Value> Requests() const;
-  std::vector<std::string> RawRequests() const;
   // Number of connections accepted so far.
   int Connections() const;
 
@@ -77,7 +76,6 @@ class FakeSearchDaemon {
   std::deque<FakeAnswer> script_;
   std::function<FakeAnswer(const Json::Value&)> handler_;
   std::vector<Json::Value> requests_;
-  std::vector<std::string> raw_requests_;
   int connections_ = 0;
   std::thread thread_;
 };

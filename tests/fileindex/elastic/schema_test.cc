@@ -63,7 +63,7 @@ bool Has(const std::vector<std::string>& names, const std::string& name) {
   return std::find(names.begin(), names.end(), name) != names.end();
 }
 
-TEST(SchemaTest, MappingsHaveKeyFieldAndDefaultsAndSettingsAreEmpty) {
+TEST(SchemaTest, MappingsHaveKeyFieldAndDefaultsSettingsAreEmptyAndTheHandlerFollowsTheRoot) {
   const Json::Value mappings = GetFileIndexMappings();
   EXPECT_EQ(mappings["property_id"].asString(), "CORVMDPath");
   Json::Value defaults(Json::objectValue);
@@ -75,6 +75,15 @@ TEST(SchemaTest, MappingsHaveKeyFieldAndDefaultsAndSettingsAreEmpty) {
   EXPECT_EQ(mappings["default"], defaults);
   EXPECT_EQ(mappings.size(), 3u);
   EXPECT_EQ(GetFileIndexSettings(), Json::Value(Json::objectValue));
+  // Each call returns a fresh value.
+  Json::Value changed = GetFileIndexMappings();
+  changed["properties"].removeMember("CORVMDPath");
+  EXPECT_TRUE(GetFileIndexMappings()["properties"].isMember("CORVMDPath"));
+  // The event handler's path follows the system root.
+  testing_support::Sandbox root;
+  EXPECT_EQ(GetFileIndexEventHandler()["lib_path"],
+            root.path() + "/var/packages/CorvLumex/target/handler/fileindex_event_handler.so");
+  EXPECT_EQ(GetFileIndexEventHandler().size(), 1u);
 }
 
 TEST(SchemaTest, EveryFieldHoldsOnlyWhatDiffersFromTheDefault) {
@@ -112,20 +121,6 @@ TEST(SchemaTest, SourceTextKeepsTheFieldOrder) {
     position = found;
   }
   EXPECT_NE(text.find("\n\t\"default\""), std::string::npos) << "tab-indented";
-}
-
-TEST(SchemaTest, EventHandlerPathFollowsTheSystemRoot) {
-  testing_support::Sandbox root;
-  const Json::Value handler = GetFileIndexEventHandler();
-  EXPECT_EQ(handler.size(), 1u);
-  EXPECT_EQ(handler["lib_path"].asString(),
-            root.path() + "/var/packages/CorvLumex/target/handler/fileindex_event_handler.so");
-}
-
-TEST(SchemaTest, EachCallReturnsAFreshValue) {
-  Json::Value first = GetFileIndexMappings();
-  first["properties"].removeMember("CORVMDPath");
-  EXPECT_TRUE(GetFileIndexMappings()["properties"].isMember("CORVMDPath"));
 }
 
 }  // namespace

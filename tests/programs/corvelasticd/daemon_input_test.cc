@@ -25,15 +25,6 @@ constexpr const char* kDecomposedName = "Cafe\xCC\x81 Paris.jpg";
 
 class DaemonInputTest : public DaemonTest {
  protected:
-  std::vector<std::string> ExtraArgs() override { return {"--max-frame-bytes", "4096"}; }
-
-  // The error code of the answer to `text` sent as it stands (-1: no JSON answer).
-  int ErrorCode(const std::string& text) {
-    Json::Value answer;
-    if (!JsonFromString(answer, SendRaw(daemon_->socket_path(), Frame(text)))) return -1;
-    return answer["error"]["code"].asInt();
-  }
-
   // The daemon still answers after whatever the test did.
   void ExpectAlive() { EXPECT_TRUE(Run("index_list")["success"].asBool()); }
 
@@ -55,45 +46,84 @@ class DaemonInputTest : public DaemonTest {
   }
 };
 
-TEST_F(DaemonInputTest, BadRequestsAreAnsweredWithTheirCode) {
+std::string Repeat(const std::string& piece, int times) {
+  std::string out;
+  for (int i = 0; i < times; ++i) out += piece;
+  return out;
+}
+
+// Every request that is malformed, names what does not exist, or is built to
+// stop or tie up the daemon gets an answer with its code and the part at
+// fault, and the daemon serves on. What each refusal says in detail is
+// checked in-process (query_test, search_test, index_store_test); here, that
+// the daemon gives it back over the socket.
+TEST_F(DaemonInputTest, EveryBadOrHostileRequestIsAnsweredWithItsCodeAndTheDaemonServesOn) {
   std::string deep = R"({"match_all": {}})";
   for (int i = 0; i < 40; ++i) deep = R"({"bool": {"must": [)" + deep + "]}}";
+  std::string words;
+  for (int i = 0; i < 100000; ++i) words += "w" + std::to_string(i) + " ";
   const std::string upsert = R"({"command": "document_upsert_by_id", "data": {"id": "fileindex_share", )";
   const std::string search = R"({"command": "search", "data": {"query": {"qsl": )";
-  const std::pair<std::string, int> cases[] = {
+  const std::string create = R"({"command": "index_create", "data": {"id": "x", )";
+  const struct {
+    std::string request;
+    int code;
+    const char* message;  // a part of the answer's message
+  } cases[] = {
       // Envelopes.
-      {"", elasticd::kCodeBadRequest}, {"{not json", elasticd::kCodeBadRequest}, {"[1, 2]", elasticd::kCodeBadRequest}, {R"({"data": {}})", elasticd::kCodeBadRequest}, {R"({"command": 5})", elasticd::kCodeBadRequest},
-      {R"({"command": "commit", "data": "x"})", elasticd::kCodeBadRequest}, {R"({"compound": 3})", elasticd::kCodeBadRequest}, {R"({"command": "no_such"})", elasticd::kCodeUnknownCommand},
+      {"", elasticd::kCodeBadRequest, ""},
+      {"{not json", elasticd::kCodeBadRequest, "JSON"},
+      {"[1, 2]", elasticd::kCodeBadRequest, ""},
+      {R"({"data": {}})", elasticd::kCodeBadRequest, ""},
+      {R"({"command": 5})", elasticd::kCodeBadRequest, ""},
+      {R"({"command": "commit", "data": "x"})", elasticd::kCodeBadRequest, ""},
+      {R"({"compound": 3})", elasticd::kCodeBadRequest, ""},
+      {R"({"command": "no_such"})", elasticd::kCodeUnknownCommand, ""},
+      {"{\"command\": \"\xff\xfe\x80\"}", elasticd::kCodeUnknownCommand, "Unknown"},
+      // JSON nested past the reader's limit, alone or inside a request.
+      {Repeat("[", 1001) + Repeat("]", 1001), elasticd::kCodeBadRequest, "JSON"},
+      {Repeat(R"({"a":)", 1001) + "1" + Repeat("}", 1001), elasticd::kCodeBadRequest, "JSON"},
+      {search + Repeat("[", 1200) + Repeat("]", 1200) + "}}}", elasticd::kCodeBadRequest, "JSON"},
       // Arguments of the wrong type or meaning.
-      {upsert + R"("doc_id": "/a", "data": []}})", elasticd::kCodeBadArgument},
-      {upsert + R"("doc_id": "/a", "data": {"CORVMDFSSize": "big"}}})", elasticd::kCodeBadDocument},
-      {upsert + R"("doc_id": "/a", "data": {"CORVMDTitle": {"x": 1}}}})", elasticd::kCodeBadDocument},
-      {R"({"command": "document_upsert_by_id", "data": {"id": "nope", "doc_id": "/a", "data": {}}})", elasticd::kCodeIndexNotFound},
-      {R"({"command": "index_create", "data": {"id": "x", "path": "/tmp/x", "mappings": {"property_id": "P", "properties": {}}}})", elasticd::kCodeBadMappings},
-      {R"({"command": "index_create", "data": {"id": "x", "path": "relative",
-          "mappings": {"property_id": "P", "properties": {"P": {"analyzer": "keyword"}}}}})", elasticd::kCodeIndexPath},
-      {R"({"command": "search", "data": {"size": -1}})", elasticd::kCodeBadArgument},
-      {R"({"command": "search", "data": {"ids": "fileindex_share"}})", elasticd::kCodeBadArgument},
+      {upsert + R"("doc_id": 7, "data": {}}})", elasticd::kCodeBadArgument, "doc_id"},
+      {upsert + R"("doc_id": "/a", "data": []}})", elasticd::kCodeBadArgument, ""},
+      {upsert + R"("doc_id": "/a", "data": {"CORVMDFSSize": "big"}}})", elasticd::kCodeBadDocument,
+       "CORVMDFSSize"},
+      {R"({"command": "commit", "data": {"id": "nope"}})", elasticd::kCodeIndexNotFound, ""},
+      {create + R"("path": "/tmp/x", "mappings": {"property_id": "P", "properties": {}}}})",
+       elasticd::kCodeBadMappings, ""},
+      {create + R"("path": "relative",
+          "mappings": {"property_id": "P", "properties": {"P": {"analyzer": "keyword"}}}}})",
+       elasticd::kCodeIndexPath, ""},
+      {R"({"command": "search", "data": {"size": -1}})", elasticd::kCodeBadArgument, "size"},
       // Queries.
-      {search + R"({"match": {"NoSuchField": "x"}}}}})", elasticd::kCodeBadQuery}, {search + R"({"range": {"CORVMDFSName": {"gt": 1}}}}}})", elasticd::kCodeBadQuery},
-      {search + R"({"range": {"CORVMDFSSize": {"between": 1}}}}}})", elasticd::kCodeBadQuery}, {search + R"({"bool": {"must": 5}}}}})", elasticd::kCodeBadQuery},
-      {search + R"({"match": {"a": 1}, "term": {"b": 2}}}}})", elasticd::kCodeBadQuery}, {search + R"({"fuzzy": {"CORVMDFSName": "x"}}}}})", elasticd::kCodeBadQuery},
-      {search + R"({"term": {"CORVMDIsDir": "maybe"}}}}})", elasticd::kCodeBadQuery}, {search + R"("text"}}})", elasticd::kCodeBadQuery}, {search + deep + "}}}", elasticd::kCodeBadQuery},
+      {search + R"({"match": {"NoSuchField": "x"}}}}})", elasticd::kCodeBadQuery, "NoSuchField"},
+      {search + deep + "}}}", elasticd::kCodeBadQuery, "deeper"},
+      {search + R"({"match": {"_all": ")" + words + R"("}}}}})", elasticd::kCodeBadQuery, "words"},
   };
-  for (const auto& [request, code] : cases) EXPECT_EQ(ErrorCode(request), code) << request;
-  // The member at fault is named.
-  const Json::Value answer = Send(daemon_->socket_path(), Data(upsert + R"("doc_id": 7, "data": {}}})"));
-  EXPECT_EQ(answer["error"]["code"].asInt(), elasticd::kCodeBadArgument);
-  EXPECT_NE(answer["error"]["msg"].asString().find("doc_id"), std::string::npos);
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.request.substr(0, 120));
+    const std::string answer_text = SendRaw(daemon_->socket_path(), Frame(c.request));
+    Json::Value answer;
+    ASSERT_TRUE(JsonFromString(answer, answer_text)) << "no answer; " << daemon_->LogText();
+    EXPECT_EQ(answer["error"]["code"].asInt(), c.code) << answer_text;
+    EXPECT_NE(answer["error"]["msg"].asString().find(c.message), std::string::npos) << answer_text;
+    ASSERT_TRUE(Run("index_list")["success"].asBool());
+  }
   // Elements of a compound are judged one by one.
   const Json::Value nested = Send(daemon_->socket_path(), Data(R"({"compound": [{"compound": []}, "text"]})"));
   EXPECT_TRUE(nested["has_fail"].asBool());
   EXPECT_EQ(nested["data"][0]["error"]["code"].asInt(), elasticd::kCodeBadRequest);
   EXPECT_EQ(nested["data"][1]["error"]["code"].asInt(), elasticd::kCodeBadRequest);
-  ExpectAlive();
 }
 
-TEST_F(DaemonInputTest, OversizeFramesAndClientsThatVanishMidFrameDisturbNobody) {
+// The daemon started with a small frame bound.
+class FrameBoundTest : public DaemonInputTest {
+ protected:
+  std::vector<std::string> ExtraArgs() override { return {"--max-frame-bytes", "4096"}; }
+};
+
+TEST_F(FrameBoundTest, OversizeFramesAndClientsThatVanishMidFrameDisturbNobody) {
   Json::Value answer;
   ASSERT_TRUE(JsonFromString(answer, SendRaw(daemon_->socket_path(), Frame(std::string(5000, 'x')))));
   EXPECT_EQ(answer["error"]["code"].asInt(), elasticd::kCodeFrameTooLarge);
@@ -111,74 +141,11 @@ TEST_F(DaemonInputTest, OversizeFramesAndClientsThatVanishMidFrameDisturbNobody)
   ExpectAlive();
 }
 
-// Requests built to stop or tie up the daemon, at its default frame bound.
-class HostileInputTest : public DaemonTest {
- protected:
-  std::string Repeat(const std::string& piece, int times) {
-    std::string out;
-    for (int i = 0; i < times; ++i) out += piece;
-    return out;
-  }
-  std::string Words(int count) {
-    std::string out;
-    for (int i = 0; i < count; ++i) out += "w" + std::to_string(i) + " ";
-    return out;
-  }
-  std::string SearchOf(const std::string& qsl, const std::string& extra = "") {
-    return R"({"command": "search", "data": {)" + extra + R"("query": {"qsl": )" + qsl + "}}}";
-  }
-  std::string Match(const std::string& text) { return R"({"match": {"_all": ")" + text + R"("}})"; }
-};
-
-TEST_F(HostileInputTest, EveryHostileRequestIsAnsweredWithItsCodeAndTheDaemonServesOn) {
-  std::string many_terms;
-  for (int i = 0; i < 2000; ++i) many_terms += (i > 0 ? ", \"" : "\"") + std::to_string(i) + "\"";
-  std::string wide_bool;
-  for (int i = 0; i < 5; ++i) wide_bool += std::string(i > 0 ? ", " : "") + Match(Words(60));
-  const struct {
-    const char* what;
-    std::string request;
-    int code;
-    const char* message;  // a part of the answer's message
-  } cases[] = {
-      {"arrays nested past the JSON reader's limit", Repeat("[", 1001) + Repeat("]", 1001), elasticd::kCodeBadRequest, "JSON"},
-      {"objects nested past the limit", Repeat(R"({"a":)", 1001) + "1" + Repeat("}", 1001), elasticd::kCodeBadRequest, "JSON"},
-      {"nesting past the limit inside a request", SearchOf(Repeat("[", 1200) + Repeat("]", 1200)), elasticd::kCodeBadRequest, "JSON"},
-      {"a match of 100,000 words", SearchOf(Match(Words(100000))), elasticd::kCodeBadQuery, "words"},
-      {"65 words in one clause", SearchOf(Match(Words(65))), elasticd::kCodeBadQuery, "64 words"},
-      {"300 words over five clauses", SearchOf(R"({"bool": {"should": [)" + wide_bool + "]}}"), elasticd::kCodeBadQuery, "256 words"},
-      {"one word of 70,000 letters", SearchOf(Match(std::string(70000, 'a'))), elasticd::kCodeBadQuery, "bytes"},
-      {"a word that analyzes to 100 words", SearchOf(Match(Repeat("ab-", 100))), elasticd::kCodeBadQuery, "64 words"},
-      {"a name substring longer than any name", SearchOf(R"({"match": {"CORVMDSearchFileName": ")" + std::string(2000, 'n') + R"("}})"), elasticd::kCodeBadQuery, "1024"},
-      {"2,000 terms", SearchOf(R"({"terms": {"CORVMDExtension": [)" + many_terms + "]}}"), elasticd::kCodeBadQuery, "terms"},
-      {"a huge from", SearchOf(R"({"match_all": {}})", R"("from": 9223372036854775807, "size": 10, )"), elasticd::kCodeBadArgument, "from"},
-      {"a size beyond 64 bits", SearchOf(R"({"match_all": {}})", R"("size": 1e300, )"), elasticd::kCodeBadArgument, "size"},
-      {"a sort order that is an array", SearchOf(R"({"match_all": {}})", R"("sort": {"field": "CORVMDFSSize", "order": []}, )"), elasticd::kCodeBadArgument, "order"},
-      {"an operator that is an object", SearchOf(R"({"match": {"_all": {"query": "x", "operator": {}}}})"), elasticd::kCodeBadQuery, "operator"},
-      {"bytes that are not UTF-8", "{\"command\": \"\xff\xfe\x80\"}", elasticd::kCodeUnknownCommand, "Unknown"},
-      {"highlight marks of 1 MB", SearchOf(R"({"match_all": {}})", R"("highlight": {"pre": ")" + std::string(1 << 20, '<') + R"("}, )"), elasticd::kCodeBadArgument, "pre"},
-      {"10,000 fields to load", SearchOf(R"({"match_all": {}})", R"("load_field": [)" + Repeat(R"("a", )", 10000) + R"("a"], )"), elasticd::kCodeBadArgument, "load_field"},
-  };
-  for (const auto& c : cases) {
-    const std::string answer_text = SendRaw(daemon_->socket_path(), Frame(c.request));
-    Json::Value answer;
-    ASSERT_TRUE(JsonFromString(answer, answer_text)) << c.what << ": no answer; " << daemon_->LogText();
-    EXPECT_EQ(answer["error"]["code"].asInt(), c.code) << c.what << ": " << answer_text;
-    EXPECT_NE(answer["error"]["msg"].asString().find(c.message), std::string::npos) << c.what << ": " << answer_text;
-    ASSERT_TRUE(Run("index_list")["success"].asBool()) << c.what;
-  }
-  // An index named 100,000 times is searched once.
-  Upsert("/volume1/share/one.txt", "word");
-  Commit();
-  const Json::Value repeated = Send(daemon_->socket_path(), Data(SearchOf(R"({"match_all": {}})", R"("ids": [)" +
-                                                                 Repeat(R"("fileindex_share", )", 100000) + R"("fileindex_share"], )")));
-  EXPECT_EQ(repeated["data"]["total"].asInt(), 1) << JsonToString(repeated).substr(0, 300);
-  // The limits leave ordinary queries alone: 64 words in a clause, 256 in all.
-  std::string at_limit;
-  for (int i = 0; i < 4; ++i) at_limit += std::string(i > 0 ? ", " : "") + Match(Words(64));
-  EXPECT_TRUE(Search(R"({"bool": {"should": [)" + at_limit + "]}}")["success"].asBool());
-}
-
+// What each clause finds in a real index. Words, phrases, prefixes, name
+// fragments, extensions, sizes, dates, OR and NOT over many documents are
+// proved against a scan (corpus_scan_test); these rows are the cases a
+// random corpus does not make: decomposed names, blanks inside name parts,
+// phrases across a gap, exact keys.
 TEST_F(DaemonInputTest, TheSearchLanguage) {
   const auto add = [&](const std::string& path, const std::string& text, long long size, long long date) {
     Json::Value data;
@@ -210,40 +177,25 @@ TEST_F(DaemonInputTest, TheSearchLanguage) {
   } cases[] = {
       // Full text is case and accent insensitive; the words of names are part of the catch-all field.
       {R"({"match": {"_all": "REVENUE"}})", R"({"sort": "CORVMDFSName"})", {report, summary}},
-      {R"({"match": {"_all": "revenue north"}})", "{}", {report}},
-      {R"({"match": {"_all": {"query": "north summary", "operator": "or"}}})", R"({"sort": "CORVMDFSName"})", {report, summary}},
       {R"({"match": {"CORVMDTextContent": "ac-3"}})", "{}", {code}},
-      {R"({"match": {"_all": "東京"}})", "{}", {song}},
       {R"({"match": {"_all": "cafe"}})", "{}", {photo}},
       // Phrases: the words next to each other, in this order, within one field.
       {R"({"match_phrase": {"_all": "GREW in the"}})", "{}", {report}},
-      {R"({"match_phrase": {"_all": "in grew"}})", "{}", {}},
       {R"({"match_phrase": {"_all": "revenue grew north"}})", "{}", {}},
       {R"({"match_phrase": {"CORVMDTextContent": {"query": "quarterly revenue"}}})", "{}", {summary}},
-      {R"({"match_phrase": {"_all": "東京の"}})", "{}", {song}},
       {R"({"match_phrase": {"_all": "..."}})", "{}", {}},
-      {R"({"prefix": {"_all": "quarter"}})", R"({"sort": "CORVMDFSName"})", {report, summary}},
       {R"({"prefix": {"_all": "revenue gr"}})", "{}", {report}},
       // Name substrings match inside names whatever the normalisation.
       {R"({"match": {"CORVMDSearchFileName": "RTERLY rep"}})", "{}", {report}},
       {R"({"match": {"CORVMDSearchFileName": "café"}})", "{}", {photo}},
       {R"({"match": {"CORVMDSearchFileName": "CAFE"}})", "{}", {photo}},
-      {R"({"match": {"CORVMDSearchFileName": "タワ"}})", "{}", {song}},
-      {R"({"match": {"CORVMDSearchFileName": "y.t"}})", "{}", {summary}},
       // Keyword terms (a decomposed query meets a precomposed keyword), prefixes and ranges; paths are exact.
       {R"({"term": {"CORVMDFSName": "SUMMARY.txt"}})", "{}", {summary}},
       {R"({"term": {"CORVMDFSName": "Café Paris.jpg"}})", "{}", {photo}},
-      {R"({"terms": {"CORVMDExtension": ["pdf", "mp3"]}})", R"({"sort": "CORVMDFSName"})", {report, song}},
       {R"({"prefix": {"CORVMDPath": "/v/share/Reports/"}})", R"({"sort": "CORVMDFSName"})", {report, summary}},
       {R"({"prefix": {"CORVMDPath": "/v/share/reports/"}})", "{}", {}},
       {R"({"prefix": {"CORVMDFSName": "quart"}})", "{}", {report}},
-      {R"({"range": {"CORVMDFSSize": {"gte": 1200, "lt": 900000}}})", R"({"sort": "CORVMDFSSize"})", {code, report}},
-      {R"({"range": {"CORVMDFSContentChangeDate": {"gte": "2023-11-01"}}})", "{}", {report}},
       {R"({"term": {"CORVMDIsDir": false}})", R"({"sort": "CORVMDFSSize"})", {summary, code, report, photo, song}},
-      // Bool.
-      {R"({"bool": {"must": [{"match": {"_all": "revenue"}}], "must_not": [{"term": {"CORVMDExtension": "pdf"}}]}})", "{}", {summary}},
-      {R"({"bool": {"should": [{"term": {"CORVMDExtension": "c"}}, {"term": {"CORVMDExtension": "mp3"}}]}})",
-       R"({"sort": "CORVMDFSName"})", {code, song}},
   };
   for (const auto& c : cases) EXPECT_EQ(names(c.qsl, c.extra), c.expected) << c.qsl;
 
@@ -326,95 +278,80 @@ std::string AsUser(const struct passwd& user, const std::function<std::string()>
   return out;
 }
 
-TEST_F(DaemonInputTest, OrdinaryUsersSeeOnlyFilesTheyCanReadAndCannotChangeIndexes) {
+// An ordinary user sees only files they can read, filtered before paging,
+// and cannot change indexes; a front end running as root searches on behalf
+// of a signed-in user with that user's ids and groups, and an ordinary user
+// cannot borrow another identity.
+TEST_F(DaemonInputTest, UsersSeeOnlyFilesTheyCanReadDirectlyOrOnTheirBehalf) {
   if (geteuid() != 0) GTEST_SKIP() << "needs root to run a client as another user";
   const struct passwd* nobody = getpwnam("nobody");
   ASSERT_NE(nobody, nullptr);
   const struct passwd user = *nobody;
   const std::string share = OpenShare();
-  std::vector<std::string> readable;
-  const auto add = [&](const std::string& path, mode_t mode) { AddFile(path, mode, "common word"); };
   // Many unreadable hits first in key order, so paging has to look past them.
-  for (int i = 0; i < 150; ++i) add(share + "/a-secret-" + std::to_string(1000 + i) + ".txt", 0600);
+  for (int i = 0; i < 150; ++i) {
+    AddFile(share + "/a-secret-" + std::to_string(1000 + i) + ".txt", 0600, "common zanzibar");
+  }
+  Names readable;
   for (int i = 0; i < 3; ++i) {
     readable.push_back(share + "/b-public-" + std::to_string(i) + ".txt");
-    add(readable.back(), 0644);
+    AddFile(readable.back(), 0644, "common word");
   }
+  const char* suggestions =
+      R"({"doc_id_field": "CORVMDTextContent", "db_name": "fileindex_share"})";
+  ASSERT_TRUE(Run("update_term_suggestion", suggestions)["success"].asBool());
   Commit();
   const std::string socket = daemon_->socket_path();
-  Json::Value answer;
-  const std::string seen = AsUser(user, [&] {
-    return JsonToString(Command(socket, "search", Data(R"({"query": {"qsl": {"match": {"_all": "common"}}}, "size": 2, "sort": "_key"})")));
-  });
-  ASSERT_TRUE(JsonFromString(answer, seen)) << seen;
-  EXPECT_EQ(HitIds(answer), Names({readable[0], readable[1]}));
-  EXPECT_EQ(answer["data"]["total"].asInt(), 3);
-  EXPECT_TRUE(answer["data"]["total_exact"].asBool());
-  const std::string refused = AsUser(user, [&] {
-    Json::Value data;
+  const char* query = R"({"query": {"qsl": {"match": {"_all": "common"}}},
+                          "size": 2, "sort": "_key", "track_total": true})";
+  // `data` sent by the user nobody.
+  const auto as_nobody = [&](const std::string& command, Json::Value data) {
     data["id"] = kIndex;
-    data["doc_id"] = readable[0];
-    return JsonToString(Command(socket, "document_del_by_id", data));
-  });
-  ASSERT_TRUE(JsonFromString(answer, refused)) << refused;
-  EXPECT_EQ(answer["error"]["code"].asInt(), elasticd::kCodePermissionDenied);
-  // Root sees everything.
-  EXPECT_EQ(Search(R"({"match": {"_all": "common"}})")["data"]["total"].asInt(), 153);
-}
-
-// A front end running as root searches on behalf of a signed-in user: the
-// daemon filters with that user's ids and groups, before paging; an ordinary
-// user cannot borrow another identity.
-TEST_F(DaemonInputTest, SearchOnBehalfOfAUserSeesOnlyThatUsersFiles) {
-  if (geteuid() != 0) GTEST_SKIP() << "needs root to ask on behalf of another user";
-  const struct passwd* nobody = getpwnam("nobody");
-  ASSERT_NE(nobody, nullptr);
-  const struct passwd user = *nobody;
-  const std::string share = OpenShare();
-  const auto add = [&](const std::string& path, mode_t mode) { AddFile(path, mode, "shared word"); };
-  for (int i = 0; i < 5; ++i) add(share + "/a-private-" + std::to_string(i) + ".txt", 0600);
-  add(share + "/b-open.txt", 0644);
-  Commit();
-  const char* query = R"({"query": {"qsl": {"match": {"_all": "shared"}}}, "size": 1, "sort": "_key", "track_total": true})";
+    Json::Value answer;
+    const std::string text =
+        AsUser(user, [&] { return JsonToString(Command(socket, command, data)); });
+    EXPECT_TRUE(JsonFromString(answer, text)) << text;
+    return answer;
+  };
+  const Json::Value direct = as_nobody("search", Data(query));
+  EXPECT_EQ(HitIds(direct), Names({readable[0], readable[1]}));
+  EXPECT_EQ(direct["data"]["total"].asInt(), 3);
+  EXPECT_TRUE(direct["data"]["total_exact"].asBool());
+  Json::Value remove;
+  remove["doc_id"] = readable[0];
+  EXPECT_EQ(as_nobody("document_del_by_id", remove)["error"]["code"].asInt(),
+            elasticd::kCodePermissionDenied);
+  Json::Value as_root = Data(query);
+  as_root["as_user"] = "root";
+  EXPECT_EQ(as_nobody("search", as_root)["error"]["code"].asInt(), elasticd::kCodePermissionDenied);
   const struct {
     const char* as_user;
-    int code;     // 0: answered
+    int code;  // 0: answered
     int total;
+    size_t suggestions;  // of "zan"
   } cases[] = {
-      {"nobody", 0, 1},
-      {"root", 0, 6},
-      {"no-such-user-here", elasticd::kCodeBadArgument, 0},
+      {nullptr, 0, 153, 1},
+      {"root", 0, 153, 1},
+      {"nobody", 0, 3, 0},
+      {"no-such-user-here", elasticd::kCodeBadArgument, 0, 0},
   };
   for (const auto& c : cases) {
+    SCOPED_TRACE(c.as_user == nullptr ? "root itself" : c.as_user);
     Json::Value data = Data(query);
-    data["as_user"] = c.as_user;
+    Json::Value suggest = Data(R"({"field": "CORVMDTextContent", "text": "zan"})");
+    if (c.as_user != nullptr) data["as_user"] = suggest["as_user"] = c.as_user;
     const Json::Value answer = Run("search", data);
+    const Json::Value suggested = Run("suggest", suggest);
     if (c.code != 0) {
-      EXPECT_EQ(answer["error"]["code"].asInt(), c.code) << c.as_user;
+      EXPECT_EQ(answer["error"]["code"].asInt(), c.code);
       continue;
     }
-    ASSERT_TRUE(answer["success"].asBool()) << c.as_user << ": " << answer;
-    EXPECT_EQ(answer["data"]["total"].asInt(), c.total) << c.as_user;
+    EXPECT_EQ(answer["data"]["total"].asInt(), c.total) << answer;
+    EXPECT_EQ(suggested["data"]["suggestions"].size(), c.suggestions) << suggested;
+    if (c.total == 3) {
+      EXPECT_EQ(answer["data"]["hits"], direct["data"]["hits"]);
+    }
   }
-  Json::Value as_nobody = Data(query);
-  as_nobody["as_user"] = "nobody";
-  EXPECT_EQ(HitIds(Run("search", as_nobody)), Names({share + "/b-open.txt"}));
-  Json::Value suggest = Data(R"({"field": "CORVMDSearchFileName", "text": "a-pri"})");
-  suggest["as_user"] = "nobody";
-  const Json::Value suggested = Run("suggest", suggest);
-  EXPECT_TRUE(suggested["success"].asBool()) << suggested;
-  EXPECT_EQ(suggested["data"]["suggestions"].size(), 0u) << suggested;
-  // An ordinary user may not search as root.
-  const std::string socket = daemon_->socket_path();
-  const std::string refused = AsUser(user, [&] {
-    Json::Value data = Data(query);
-    data["id"] = kIndex;
-    data["as_user"] = "root";
-    return JsonToString(Command(socket, "search", data));
-  });
-  Json::Value answer;
-  ASSERT_TRUE(JsonFromString(answer, refused)) << refused;
-  EXPECT_EQ(answer["error"]["code"].asInt(), elasticd::kCodePermissionDenied);
 }
 
 }  // namespace

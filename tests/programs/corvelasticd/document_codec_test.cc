@@ -60,17 +60,14 @@ TEST_F(DocumentCodecTest, EveryJsonTypeComesBackExactly) {
   EXPECT_TRUE(back["big"].isUInt64() && !back["big"].isInt64());
   EXPECT_EQ(back["CORVMDFSSize"].type(), document["CORVMDFSSize"].type());
   EXPECT_EQ(back["CORVMDDurationSecond"].type(), Json::realValue);
-}
-
-TEST_F(DocumentCodecTest, TextWithNulBytesAndInvalidUtf8IsKept) {
-  Json::Value document;
-  document["CORVMDPath"] = kKey;
+  // Text with NUL bytes and invalid UTF-8 is kept.
   const std::string text("a\0b\xFF", 4);
-  document["CORVMDTitle"] = Json::Value(text.data(), text.data() + text.size());
-  EXPECT_EQ(RoundTrip(document)["CORVMDTitle"].asString(), text);
+  Json::Value binary;
+  binary["CORVMDTitle"] = Json::Value(text.data(), text.data() + text.size());
+  EXPECT_EQ(RoundTrip(binary)["CORVMDTitle"].asString(), text);
 }
 
-TEST_F(DocumentCodecTest, RepeatedNamesAndTheParentFolderAreStoredOnce) {
+TEST_F(DocumentCodecTest, RepeatedNamesAndTheKeysOwnParentFolderAreStoredOnce) {
   const Json::Value document = elasticd_test::Data(R"({"CORVMDPath": "/v/share/Reports/Quarterly Report.pdf",
       "CORVMDParent": "/v/share/Reports", "CORVMDFSName": "Quarterly Report.pdf",
       "CORVMDSearchFileName": "Quarterly Report.pdf", "CORVMDDisplayName": "Quarterly Report.pdf"})");
@@ -81,12 +78,9 @@ TEST_F(DocumentCodecTest, RepeatedNamesAndTheParentFolderAreStoredOnce) {
   EXPECT_EQ(DecodeDocument(schema_, kKey, record), document);
   EXPECT_EQ(SqlField(record, "CORVMDParent"), "text:'/v/share/Reports'");
   EXPECT_EQ(SqlField(record, "CORVMDDisplayName"), "text:'Quarterly Report.pdf'");
-}
-
-TEST_F(DocumentCodecTest, ParentOfAKeyWithoutFolderOrOfAnotherKey) {
+  // The parent of a key without a folder, and a parent not the key's own.
   const Json::Value plain = elasticd_test::Data(R"({"CORVMDPath": "plain-key", "CORVMDParent": ""})");
   EXPECT_EQ(RoundTrip(plain, "plain-key"), plain);
-  // A parent that is not the key's own stays a plain text.
   const Json::Value other = elasticd_test::Data(R"({"CORVMDPath": "/v/share/Reports/Quarterly Report.pdf", "CORVMDParent": "/v/share"})");
   EXPECT_EQ(RoundTrip(other), other);
 }

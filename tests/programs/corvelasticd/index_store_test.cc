@@ -76,6 +76,24 @@ TEST_F(IndexStoreTest, TheWriterSeesItsOwnWritesReadersOnlyCommittedOnes) {
   EXPECT_EQ(WriterKeys(), (Keys{"/s/a", "/s/b"}));
 }
 
+TEST_F(IndexStoreTest, WordQueriesSeeUncommittedChangesInOrderAndAnUpsertReplacesAll) {
+  // Word-index rows wait for the commit; queries through the writer and the
+  // commit itself must still see every change, in the order it was made.
+  Put("/s/a", R"({"body": "alpha beta", "size": 5})");
+  Put("/s/b", R"({"body": "alpha"})");
+  EXPECT_EQ(WriterKeys(R"({"match": {"body": "alpha"}})"), (Keys{"/s/a", "/s/b"}));
+  EXPECT_EQ(Refusal([&] { store_->SetById("/s/a", JsonOf(R"({"size": "big"})")); }).first,
+            kCodeBadDocument);
+  Put("/s/a", R"({"body": "gamma"})");  // the whole document: its old words and size go
+  EXPECT_EQ(store_->DeleteByQuery(Q(R"({"match": {"body": "alpha"}})")), 1);
+  Put("/s/c", R"({"body": "beta gamma"})");
+  store_->Commit();
+  EXPECT_EQ(HitKeys(Find(R"({"match": {"body": "gamma"}})")), (Keys{"/s/a", "/s/c"}));
+  EXPECT_EQ(HitKeys(Find(R"({"match": {"body": "beta"}})")), Keys{"/s/c"});
+  EXPECT_EQ(Find(R"({"match": {"body": "alpha"}})").total, 0);
+  EXPECT_EQ(Find(R"({"term": {"size": 5}})").total, 0);
+}
+
 TEST_F(IndexStoreTest, SetByIdMergesAndMovesAKeyOverAnExistingDocument) {
   Put("/s/a", R"({"size": 1, "body": "alpha"})");
   Put("/s/b", R"({"size": 2})");

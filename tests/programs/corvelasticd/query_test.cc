@@ -161,6 +161,8 @@ TEST(QueryParseTest, BadQueriesNameTheFaultyPart) {
   std::string four_clauses;  // 4 x 64 words + 1
   for (int i = 0; i < 4; ++i) four_clauses += R"({"match": {"body": ")" + many_words.substr(0, many_words.rfind(" w64")) + R"("}}, )";
   for (int i = 0; i < 9; ++i) long_words += std::string(8000, 'x') + " ";
+  std::string dashed;  // one word that analyzes to 100
+  for (int i = 0; i < 100; ++i) dashed += "ab-";
   const std::pair<std::string, std::string> cases[] = {
       {R"({"match": {"nope": "x"}})", "unknown field \"nope\""},
       {R"({"fuzzy": {"body": "x"}})", "unknown clause \"fuzzy\""},
@@ -170,6 +172,8 @@ TEST(QueryParseTest, BadQueriesNameTheFaultyPart) {
       {R"({"term": {"body": [1]}})", "the value for \"body\" must be a string, a number or a bool"},
       {R"({"match": {"body": {"query": 5}}})", "\"match\" on \"body\" needs a string \"query\""},
       {R"({"match": {"body": {"query": "a", "operator": "xor"}}})", "\"operator\" must be \"and\" or \"or\""},
+      {R"({"match": {"body": {"query": "a", "operator": {}}}})",
+       "\"operator\" must be \"and\" or \"or\""},
       {R"({"match_phrase": {"size": "1"}})", "\"match_phrase\" needs a text field, \"size\" is not one"},
       {R"({"terms": {"kind": "a"}})", "\"terms\" on \"kind\" needs an array"},
       {R"({"prefix": {"kind": 5}})", "\"prefix\" on \"kind\" needs a string"},
@@ -185,6 +189,8 @@ TEST(QueryParseTest, BadQueriesNameTheFaultyPart) {
       {deep, "clauses nested deeper than 32"},
       {R"({"terms": {"size": [)" + many_terms + "]}}", "more than 1024 clauses and \"terms\" values; split the query"},
       {R"({"match": {"body": ")" + many_words + R"("}})", "more than 64 words in one clause; search for fewer words"},
+      {R"({"match": {"body": ")" + dashed + R"("}})",
+       "more than 64 words in one clause; search for fewer words"},
       {R"({"bool": {"must": [)" + four_clauses + R"({"match": {"body": "last"}}]}})", "more than 256 words in the query"},
       {R"({"match": {"kind": ")" + long_words + R"("}})", "the texts of the query are longer than 65536 bytes"},
       {R"({"match": {"name": ")" + std::string(1025, 'n') + R"("}})", "the text searched in \"name\" is longer than 1024 bytes"},
@@ -198,6 +204,9 @@ TEST(QueryParseTest, BadQueriesNameTheFaultyPart) {
       EXPECT_EQ(std::string(error.what()).rfind("Bad query: " + message, 0), 0u) << error.what();
     }
   }
+  // The limits leave ordinary queries alone: 64 words in a clause, 256 in all.
+  const std::string at_limits = R"({"bool": {"must": [)" + four_clauses + R"({"match_all": {}}]}})";
+  EXPECT_NO_THROW(Query::Parse(JsonOf(at_limits), Schema()));
 }
 
 TEST(QueryParseTest, PrefixUpperBoundAndPhraseQuoting) {

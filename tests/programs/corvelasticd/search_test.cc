@@ -52,6 +52,10 @@ TEST_F(SearchTest, HitsOfSeveralIndexesMergeIntoOneOrderAndPage) {
   EXPECT_EQ(HitIds("{" + both + R"(, "sort": {"field": "size", "order": "desc"}})"), (Ids{"/one/5", "/two/4", "/one/3", "/two/2", "/one/1"}));
   EXPECT_EQ(HitIds("{" + both + R"(, "sort": "size", "from": 1, "size": 2})"), (Ids{"/two/2", "/one/3"}));
   EXPECT_EQ(HitIds(R"({"sort": ["_key"], "size": 3})"), (Ids{"/one/1", "/one/3", "/one/5"}));
+  // An index named 100,000 times is searched once.
+  std::string many_ids = R"({"ids": [)";
+  for (int i = 0; i < 100000; ++i) many_ids += R"("two", )";
+  EXPECT_EQ(HitIds(many_ids + R"("two"], "sort": "_key"})"), (Ids{"/two/2", "/two/4"}));
   EXPECT_EQ(HitIds(R"({"id": "two", "query": {"qsl": {"range": {"size": {"gte": 3}}}}})"), Ids{"/two/4"});
   const Json::Value answer = Run(R"({"id": "one", "size": 1, "load_field": ["size", "secret"], "track_total": true,
                                      "query": {"qsl": {"match": {"CORVMDTextContent": "size 3"}}},
@@ -73,7 +77,9 @@ TEST_F(SearchTest, BadMembersAreRefusedByName) {
       {R"({"from": 9223372036854775807, "size": 10})", "\"from\" + \"size\" must not exceed 100000"},
       {R"({"from": 99995, "size": 10})", "\"from\" + \"size\" must not exceed 100000"},
       {R"({"size": "10"})", "\"size\" must be an integer"},
+      {R"({"size": 1e300})", "\"size\" must be an integer"},
       {R"({"sort": {"field": "size", "order": "up"}})", "\"order\" must be \"asc\" or \"desc\""},
+      {R"({"sort": {"field": "size", "order": []}})", "\"order\" must be \"asc\" or \"desc\""},
       {R"({"sort": 5})", "\"sort\" must be a field name or {\"field\", \"order\"}"},
       {R"({"sort": "nope"})", "Cannot sort by the unknown field \"nope\""},
       {R"({"ids": "one"})", "\"ids\" must be an array of index ids"},

@@ -4,7 +4,6 @@
 
 #include "programs/corvelasticd/daemon_error.h"
 #include "programs/corvelasticd/index_schema.h"
-#include "programs/corvelasticd/query.h"
 #include "programs/corvelasticd/text_analysis.h"
 #include "tests/programs/corvelasticd/daemon_harness.h"
 
@@ -87,64 +86,39 @@ TEST(AnalyzeTest, JoinedTokensAreTheTokensJoinedByBlanks) {
   }
 }
 
-TEST(AnalyzeTest, KeywordValuesStayWholeWithoutBlanks) {
-  EXPECT_EQ(Tokens(Analyzer::kKeyword, "My File.TXT"), std::vector<std::string>({"my\x1F" "file.txt"}));
-  EXPECT_TRUE(Tokens(Analyzer::kKeyword, "").empty());
-}
-
-TEST(AnalyzeTest, StandardSplitsOnPunctuationAndCjkCharacters) {
-  EXPECT_EQ(Tokens(Analyzer::kStandard, "AC-3 decoder_v2, \xC3\x89t\xC3\xA9!"),
-            std::vector<std::string>({"ac", "3", "decoder_v2", "decoder", "v2", "ete"}));
-  EXPECT_EQ(Tokens(Analyzer::kStandard, "\xE6\x9D\xB1\xE4\xBA\xAC"), std::vector<std::string>({"\xE6\x9D\xB1", "\xE4\xBA\xAC"}));
-}
-
-TEST(AnalyzeTest, JoinedAndCamelCaseWordsGiveTheWholeWordThenEachPart) {
+TEST(AnalyzeTest, EachAnalyzerSplitsAndFoldsAsItsFieldsNeed) {
   const struct {
+    Analyzer analyzer;
     const char* text;
     std::vector<std::string> tokens;
   } cases[] = {
-      {"pthread_mutex_lock", {"pthread_mutex_lock", "pthread", "mutex", "lock"}},
-      {"readFileSync", {"readfilesync", "read", "file", "sync"}},
-      {"XMLParser", {"xmlparser", "xml", "parser"}},
-      {"utf8Decode", {"utf8decode", "utf8", "decode"}},
-      {"__init__", {"__init__", "init"}},
-      {"IPv6 iPhone", {"ipv6", "iphone", "i", "phone"}},
-      {"plain Words UPPER", {"plain", "words", "upper"}},
-      {"foo_bar e-mail C++", {"foo_bar", "foo", "bar", "e", "mail", "c"}},
+      // Joined and camelCase words give the whole word, then each part.
+      {Analyzer::kStandard, "pthread_mutex_lock",
+       {"pthread_mutex_lock", "pthread", "mutex", "lock"}},
+      {Analyzer::kStandard, "readFileSync", {"readfilesync", "read", "file", "sync"}},
+      {Analyzer::kStandard, "XMLParser", {"xmlparser", "xml", "parser"}},
+      {Analyzer::kStandard, "utf8Decode", {"utf8decode", "utf8", "decode"}},
+      {Analyzer::kStandard, "__init__", {"__init__", "init"}},
+      {Analyzer::kStandard, "IPv6 iPhone", {"ipv6", "iphone", "i", "phone"}},
+      {Analyzer::kStandard, "plain Words UPPER", {"plain", "words", "upper"}},
+      {Analyzer::kStandard, "foo_bar e-mail C++", {"foo_bar", "foo", "bar", "e", "mail", "c"}},
+      // Punctuation splits, accents fold away, and each CJK character is a word.
+      {Analyzer::kStandard, "AC-3 decoder_v2, \xC3\x89t\xC3\xA9!",
+       {"ac", "3", "decoder_v2", "decoder", "v2", "ete"}},
+      {Analyzer::kStandard, "\xE6\x9D\xB1\xE4\xBA\xAC", {"\xE6\x9D\xB1", "\xE4\xBA\xAC"}},
+      // Keyword values stay whole, their blanks kept as unit separators.
+      {Analyzer::kKeyword, "My File.TXT", {"my\x1F" "file.txt"}},
+      {Analyzer::kKeyword, "", {}},
+      // Names' words ("white space" fields) keep their punctuation and are not split.
+      {Analyzer::kWhitespace, " Smith,John\tO'Neil ", {"smith,john", "o'neil"}},
+      {Analyzer::kWhitespace, "read_me.txt", {"read_me.txt"}},
   };
-  for (const auto& c : cases) EXPECT_EQ(Tokens(Analyzer::kStandard, c.text), c.tokens) << c.text;
-  // Names' words ("white space" fields) are not split.
-  EXPECT_EQ(Tokens(Analyzer::kWhitespace, "read_me.txt"), std::vector<std::string>({"read_me.txt"}));
-}
-
-TEST(AnalyzeTest, WhiteSpaceKeepsPunctuationInsideTokens) {
-  EXPECT_EQ(Tokens(Analyzer::kWhitespace, " Smith,John\tO'Neil "), std::vector<std::string>({"smith,john", "o'neil"}));
+  for (const auto& c : cases) EXPECT_EQ(Tokens(c.analyzer, c.text), c.tokens) << c.text;
 }
 
 TEST(AnalyzeTest, QueryWordsGroupTheirTokens) {
-  const auto groups = AnalyzeQuery(Analyzer::kStandard, "ac-3 tokyo");
-  ASSERT_EQ(groups.size(), 2u);
-  EXPECT_EQ(groups[0], std::vector<std::string>({"ac", "3"}));
-  EXPECT_EQ(groups[1], std::vector<std::string>({"tokyo"}));
-}
-
-TEST(QueryTest, PrefixUpperBoundSkipsTrailingFFBytes) {
-  EXPECT_EQ(PrefixUpperBound("/a/"), "/a0");
-  EXPECT_EQ(PrefixUpperBound(std::string("a\xFF", 2)), "b");
-  EXPECT_EQ(PrefixUpperBound(std::string("\xFF\xFF", 2)), "");
-}
-
-TEST(QueryTest, RankedClauseIsTheFirstRequiredFullTextClause) {
-  const IndexSchema schema = IndexSchema::FromMappings(elasticd_test::LibraryMappings());
-  Json::Value clause;
-  Json::Value text;
-  text["match"]["_all"] = "hello";
-  clause["bool"]["must"].append(text);
-  EXPECT_TRUE(Query::Parse(clause, schema).HasRankedClause());
-  Json::Value should;
-  should["bool"]["should"].append(text);
-  EXPECT_FALSE(Query::Parse(should, schema).HasRankedClause());
-  EXPECT_EQ(Query::Parse(clause, schema).HighlightTokens(), std::set<std::string>({"hello"}));
+  EXPECT_EQ(AnalyzeQuery(Analyzer::kStandard, "ac-3 tokyo"),
+            (std::vector<std::vector<std::string>>{{"ac", "3"}, {"tokyo"}}));
 }
 
 TEST(SchemaTest, MappingsDecideHowEachFieldIsStored) {
