@@ -4,7 +4,8 @@
 # missing is left out and the count printed says what was used). Prints the
 # files indexed per second from "folder add" until the folder is reported
 # finished, the peak memory of all the stack's processes together (the sum
-# of their resident memory sampled every 0.2 s, extraction workers included)
+# of their resident memory sampled every 0.2 s, extraction workers included,
+# as RSS and as PSS)
 # and each one's own peak, and what the index holds: documents and words,
 # each with a hash, so a run before and after a change can be compared.
 #
@@ -40,17 +41,23 @@ for program in "${SYSTEM_PROGRAMS[@]}"; do daemons+=("$(cat "$(system_pid_file "
 indexer="$(cat "$(system_pid_file fileindexd)")"
 
 # Resident memory of the daemons and of the indexer's extraction workers
-# (its children), summed at each sample; the largest sum is the peak.
+# (its children), summed at each sample; the largest sum is the peak. Two
+# sums: RSS counts a library page mapped by several processes once in each,
+# PSS divides it among them, so the PSS sum is what the machine really gives
+# the stack.
 sample_memory() {
-  local peak=0 total pid kib
+  local peak=0 peak_pss=0 total total_pss pid kib
   while :; do
-    total=0
+    total=0 total_pss=0
     for pid in "${daemons[@]}" $(pgrep -P "$indexer" || true); do
       # A worker may end between the listing and the reading.
       kib=$(awk '/^VmRSS/ {print $2}' "/proc/$pid/status" 2>/dev/null || true)
       total=$((total + ${kib:-0}))
+      kib=$(awk '/^Pss:/ {print $2}' "/proc/$pid/smaps_rollup" 2>/dev/null || true)
+      total_pss=$((total_pss + ${kib:-0}))
     done
     if [ "$total" -gt "$peak" ]; then peak=$total; echo "$peak" > "$SCRATCH/memory_peak"; fi
+    if [ "$total_pss" -gt "$peak_pss" ]; then peak_pss=$total_pss; echo "$peak_pss" > "$SCRATCH/memory_peak_pss"; fi
     for pid in $(pgrep -P "$indexer" || true); do
       kib=$(awk '/VmHWM/ {print $2}' "/proc/$pid/status" 2>/dev/null || true)
       [ "${kib:-0}" -gt "$(cat "$SCRATCH/worker_peak" 2>/dev/null || echo 0)" ] && echo "$kib" > "$SCRATCH/worker_peak"
@@ -58,7 +65,7 @@ sample_memory() {
     sleep 0.2
   done
 }
-rm -f "$SCRATCH/memory_peak" "$SCRATCH/worker_peak"
+rm -f "$SCRATCH/memory_peak" "$SCRATCH/memory_peak_pss" "$SCRATCH/worker_peak"
 sample_memory & sampler=$!
 start=$(date +%s.%N)
 "$(system_program fileindex)" folder add /corpus --wait > /dev/null
@@ -68,7 +75,8 @@ wait "$sampler" 2>/dev/null || true
 
 awk -v files="$files" -v start="$start" -v end="$end" \
   'BEGIN { s = end - start; printf "indexed %d files in %.1f s: %.0f files/s\n", files, s, files / s }'
-printf 'peak memory of all processes together (sampled RSS): %d MiB\n' $(( $(cat "$SCRATCH/memory_peak") / 1024 ))
+printf 'peak memory of all processes together (sampled RSS): %d MiB; (sampled PSS, shared pages counted once): %d MiB\n' \
+  $(( $(cat "$SCRATCH/memory_peak") / 1024 )) $(( $(cat "$SCRATCH/memory_peak_pss") / 1024 ))
 printf 'own peaks (VmHWM): corvelasticd %d MiB, corvnotifyd %d MiB, fileindexd %d MiB, corvspotlightd %d MiB, extraction worker %d MiB\n' \
   $(( $(peak_kib corvelasticd) / 1024 )) $(( $(peak_kib corvnotifyd) / 1024 )) $(( $(peak_kib fileindexd) / 1024 )) \
   $(( $(peak_kib corvspotlightd) / 1024 )) $(( $(cat "$SCRATCH/worker_peak" 2>/dev/null || echo 0) / 1024 ))
