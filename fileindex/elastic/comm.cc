@@ -70,16 +70,6 @@ pid_t LastSearchDaemonPid() { return last_daemon_pid.load(); }
 
 std::string ElasticSocketPath() { return SysPath("/var/run/corvelasticd.sock"); }
 
-bool WaitForFrame(int fd) {
-  char first = 0;
-  for (;;) {
-    const ssize_t n = recv(fd, &first, 1, MSG_PEEK);
-    if (n > 0) return true;
-    if (n == 0) return false;
-    if (errno != EINTR) return false;
-  }
-}
-
 void SendRequestImpl(Json::Value& res, const Json::Value& req) {
   const std::string path = ElasticSocketPath();
   WaitForSocketFile(path);

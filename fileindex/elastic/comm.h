@@ -24,10 +24,6 @@ std::string ElasticSocketPath();
 // knows that some of them were lost and does them again.
 pid_t LastSearchDaemonPid();
 
-// Waits until a frame starts to arrive on `fd`. False when the peer hung up
-// first (or the socket failed): the frame reader keeps asking on end of file,
-// so callers must not start reading a frame that will never come.
-bool WaitForFrame(int fd);
 
 }  // namespace corvlumex
 

@@ -12,6 +12,7 @@
 
 #include "common/error.h"
 #include "common/frame.h"
+#include "common/frame_reader.h"
 #include "common/json_util.h"
 #include "fileindex/elastic/comm.h"
 
@@ -165,13 +166,8 @@ void FakeSearchDaemon::HandleConnection(int fd) {
       return;
     }
   }
-  if (!WaitForFrame(fd)) return;
   std::string text;
-  try {
-    text = ReadFrame(fd);
-  } catch (const Error&) {
-    return;
-  }
+  if (ReadFrameBounded(fd, size_t{1} << 30, -1, 10000, &text) != FrameStatus::kOk) return;
   Json::Value request;
   if (!JsonFromString(request, text)) request = Json::Value();
   {
