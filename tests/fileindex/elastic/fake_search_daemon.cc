@@ -3,7 +3,6 @@
 #include <fcntl.h>
 #include <poll.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 #include <cstring>
@@ -15,6 +14,7 @@
 #include "common/frame_reader.h"
 #include "common/json_util.h"
 #include "fileindex/elastic/comm.h"
+#include "tests/support/frame_client.h"
 
 namespace corvlumex {
 namespace testing_support {
@@ -81,15 +81,8 @@ FakeSearchDaemon::FakeSearchDaemon(const std::string& socket_path)
     : socket_path_(socket_path.empty() ? ElasticSocketPath() : socket_path), handler_(AnswerSuccess) {
   std::filesystem::create_directories(std::filesystem::path(socket_path_).parent_path());
   unlink(socket_path_.c_str());
-
-  struct sockaddr_un address;
-  memset(&address, 0, sizeof(address));
-  address.sun_family = AF_UNIX;
-  if (socket_path_.size() >= sizeof(address.sun_path)) throw std::runtime_error("socket path too long");
-  memcpy(address.sun_path, socket_path_.c_str(), socket_path_.size());
-  listen_fd_ = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  if (listen_fd_ < 0 || bind(listen_fd_, reinterpret_cast<struct sockaddr*>(&address), sizeof(address)) != 0 ||
-      listen(listen_fd_, 16) != 0 || pipe2(wake_pipe_, O_CLOEXEC) != 0) {
+  listen_fd_ = BindSocket(socket_path_, true);
+  if (listen_fd_ < 0 || pipe2(wake_pipe_, O_CLOEXEC) != 0) {
     const std::string why = strerror(errno);
     if (listen_fd_ >= 0) close(listen_fd_);
     throw std::runtime_error("fake search daemon cannot listen on " + socket_path_ + ": " + why);

@@ -12,6 +12,7 @@
 #include "common/frame.h"
 #include "common/frame_reader.h"
 #include "common/json_util.h"
+#include "fileindex/elastic/schema.h"
 
 namespace corvlumex {
 namespace elasticd_test {
@@ -29,30 +30,7 @@ Json::Value Data(const std::string& text) {
   return value;
 }
 
-Json::Value LibraryMappings() {
-  return Data(R"({
-    "property_id": "CORVMDPath",
-    "default": {"type": "string", "analyzer": "corvstandard", "required": false, "stored": true, "_all": true},
-    "properties": {
-      "CORVMDPath": {"analyzer": "keyword", "required": true, "_all": false},
-      "CORVMDFSName": {"analyzer": "keyword", "_all": false},
-      "CORVMDIsDir": {"type": "bool", "_all": false},
-      "CORVMDOwnerUserID": {"analyzer": "keyword", "_all": false},
-      "CORVMDFSSize": {"type": "int"},
-      "CORVMDFSContentChangeDate": {"type": "int"},
-      "CORVMDAuthors": {"type": "text", "analyzer": "white space"},
-      "CORVMDTitle": {"type": "text"},
-      "CORVMDDurationSecond": {"type": "double"},
-      "CORVMDParent": {"analyzer": "keyword", "_all": false},
-      "CORVMDExtension": {"analyzer": "keyword", "_all": false},
-      "CORVMDKind": {"analyzer": "keyword", "_all": false},
-      "CORVMDDisplayName": {"analyzer": "keyword", "_all": false},
-      "CORVMDTextContent": {"type": "text"},
-      "CORVMDKeywords": {},
-      "CORVMDSearchFileName": {"type": "text", "analyzer": "white space", "preprocess": ["tolower", "ngram"]},
-      "_CORVMDUserTags": {"type": "text"}
-    }})");
-}
+Json::Value LibraryMappings() { return fileindex::elastic::GetFileIndexMappings(); }
 
 Json::Value FileDocument(const std::string& path, const std::string& text, long long size) {
   const std::string name = path.substr(path.rfind('/') + 1);
@@ -78,18 +56,9 @@ void Daemon::Start() {
   args.insert(args.end(), extra_args_.begin(), extra_args_.end());
   process_ = std::make_unique<testing_support::ChildProcess>(DaemonBinary(), args, log_,
                                                              std::map<std::string, std::string>{{"CORVLUMEX_ROOT", root_}});
-  bool exited = false;
-  // Ready when the socket answers.
-  const bool ready = testing_support::PollUntil(
-      [&] {
-        const int fd = ConnectTo(socket_);
-        if (fd >= 0) close(fd);
-        exited = fd < 0 && !process_->Running();
-        return fd >= 0 || exited;
-      },
-      std::chrono::seconds(10));
-  if (exited) throw std::runtime_error("corvelasticd exited at start: " + LogText());
-  if (!ready) throw std::runtime_error("corvelasticd did not start: " + LogText());
+  if (!testing_support::WaitUntilListening(socket_, std::chrono::seconds(10))) {
+    throw std::runtime_error("corvelasticd did not start: " + LogText());
+  }
 }
 
 int Daemon::Terminate() {

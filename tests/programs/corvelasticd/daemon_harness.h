@@ -18,7 +18,7 @@ namespace elasticd_test {
 
 constexpr const char* kIndex = "fileindex_share";
 
-// The mappings the library sends at index creation (the fields the tests use).
+// The mappings the library sends at index creation.
 Json::Value LibraryMappings();
 
 // A document as the library's extraction would give it.

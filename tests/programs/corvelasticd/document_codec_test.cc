@@ -70,14 +70,14 @@ TEST_F(DocumentCodecTest, EveryJsonTypeComesBackExactly) {
 TEST_F(DocumentCodecTest, RepeatedNamesAndTheKeysOwnParentFolderAreStoredOnce) {
   const Json::Value document = elasticd_test::Data(R"({"CORVMDPath": "/v/share/Reports/Quarterly Report.pdf",
       "CORVMDParent": "/v/share/Reports", "CORVMDFSName": "Quarterly Report.pdf",
-      "CORVMDSearchFileName": "Quarterly Report.pdf", "CORVMDDisplayName": "Quarterly Report.pdf"})");
+      "CORVMDSearchFileName": "Quarterly Report.pdf"})");
   const std::string record = EncodeDocument(schema_, kKey, document);
   // Each text at most once, and never the key itself.
   EXPECT_EQ(record.find("/v/share"), std::string::npos);
   EXPECT_EQ(record.find("Quarterly Report.pdf"), record.rfind("Quarterly Report.pdf"));
   EXPECT_EQ(DecodeDocument(schema_, kKey, record), document);
   EXPECT_EQ(SqlField(record, "CORVMDParent"), "text:'/v/share/Reports'");
-  EXPECT_EQ(SqlField(record, "CORVMDDisplayName"), "text:'Quarterly Report.pdf'");
+  EXPECT_EQ(SqlField(record, "CORVMDSearchFileName"), "text:'Quarterly Report.pdf'");
   // The parent of a key without a folder, and a parent not the key's own.
   const Json::Value plain = elasticd_test::Data(R"({"CORVMDPath": "plain-key", "CORVMDParent": ""})");
   EXPECT_EQ(RoundTrip(plain, "plain-key"), plain);

@@ -170,19 +170,30 @@ TEST_F(IndexStoreTest, HitsAreSortedPagedFilteredAndCounted) {
   EXPECT_EQ(Find(all, {}, 1, 2).total, 103);
 }
 
+// Words found in the name rank first (the whole name before a name that
+// merely holds the words), then words of the content; a phrase ranks the
+// same way, and a filter beside the words changes nothing.
 TEST_F(IndexStoreTest, WordSearchesRankExactNamesThenNamesThenContent) {
-  Put("/s/notes.txt", R"({"body": "the cat sat"})");
+  Put("/s/notes.txt", R"({"body": "we buy cat food"})");
   Put("/s/cat food.txt");
+  Put("/s/b/food cat");  // the same words, first by key, but not the name searched for
   Put("/s/Cat");
   Put("/s/dog");
   store_->Commit();
   SortSpec by_score;
   by_score.by = SortSpec::By::kScore;
-  EXPECT_EQ(HitKeys(Find(R"({"match": {"_all": "cat"}})", by_score)), (Keys{"/s/Cat", "/s/cat food.txt", "/s/notes.txt"}));
-  // Beside a filter the same tiers hold.
-  EXPECT_EQ(HitKeys(Find(R"({"bool": {"must": [{"match": {"_all": "cat"}}, {"prefix": {"path": "/s/"}}]}})", by_score)),
-            (Keys{"/s/Cat", "/s/cat food.txt", "/s/notes.txt"}));
-  EXPECT_EQ(HitKeys(Find(R"({"match": {"name": "at fo"}})")), Keys{"/s/cat food.txt"});
+  const Keys cat = {"/s/Cat", "/s/b/food cat", "/s/cat food.txt", "/s/notes.txt"};
+  const struct {
+    const char* qsl;
+    Keys expected;
+  } cases[] = {
+      {R"({"match": {"_all": "cat"}})", cat},
+      {R"({"bool": {"must": [{"match": {"_all": "cat"}}, {"prefix": {"path": "/s/"}}]}})", cat},
+      {R"({"match": {"_all": "cat food"}})", {"/s/cat food.txt", "/s/b/food cat", "/s/notes.txt"}},
+      {R"({"match_phrase": {"_all": "cat food"}})", {"/s/cat food.txt", "/s/notes.txt"}},
+      {R"({"match": {"name": "at fo"}})", {"/s/cat food.txt"}},
+  };
+  for (const auto& c : cases) EXPECT_EQ(HitKeys(Find(c.qsl, by_score)), c.expected) << c.qsl;
 }
 
 TEST_F(IndexStoreTest, SuggestionsAreFoldedPrefixesByFrequency) {

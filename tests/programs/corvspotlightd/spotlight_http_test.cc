@@ -16,11 +16,7 @@
 #include <string>
 
 #include "common/json_util.h"
-#include "fileindex/elastic/comm.h"
-#include "fileindex/elastic/elastic_control.h"
-#include "tests/support/child_process.h"
-#include "tests/support/frame_client.h"
-#include "tests/support/sandbox.h"
+#include "tests/system/system_harness.h"
 
 namespace corvlumex {
 namespace testing_support {
@@ -113,31 +109,19 @@ void ExpectSambaCanRead(const HttpReply& reply, const std::string& what) {
   EXPECT_TRUE(JsonFromString(body, reply.body)) << what << ": " << reply.body;
 }
 
+// The real system indexes five files named "Report <n>.txt"; corvspotlightd
+// answers from that index on a free port.
 class SpotlightHttpTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    share_ = root_.MakeDir("volume1/share");
-    root_.MakeDir("var/run");
-    root_.registry().Add("share", share_);
-    search_daemon_ = std::make_unique<ChildProcess>(ProgramPath("corvelasticd"), std::vector<std::string>{"--log-stderr"},
-                                                    root_.path() + "/corvelasticd.log");
-    ASSERT_TRUE(testing_support::WaitUntilListening(ElasticSocketPath()));
-    fileindex::elastic::ShareIndexCreate("share");
-    for (int i = 0; i < 5; ++i) {
-      Json::Value request(Json::objectValue);
-      request["command"] = "document_upsert_by_id";
-      request["data"]["id"] = "fileindex_share";
-      const std::string name = "Report " + std::to_string(i) + ".txt";
-      request["data"]["doc_id"] = share_ + "/" + name;
-      request["data"]["data"]["CORVMDPath"] = share_ + "/" + name;
-      request["data"]["data"]["CORVMDFSName"] = name;
-      request["data"]["data"]["CORVMDSearchFileName"] = name;
-      fileindex::elastic::SendRequestNoResult(request);
-    }
-    fileindex::elastic::IndexCommit("share");
+    for (int i = 0; i < 5; ++i) WriteText(system_.Path("Report " + std::to_string(i) + ".txt"), "x");
+    system_.StartAll();
+    system_.AddFolder("");
+    ASSERT_EQ(system_.Converge(system_.DiskPaths("")), "") << system_.Logs();
+    share_ = system_.share_dir();
     responder_ = std::make_unique<ChildProcess>(ProgramPath("corvspotlightd"),
                                                 std::vector<std::string>{"--port", "0", "--log-stderr"},
-                                                root_.path() + "/corvspotlightd.log");
+                                                system_.root() + "/corvspotlightd.log");
     std::smatch port;
     ASSERT_TRUE(PollUntil(
         [&] {
@@ -149,20 +133,22 @@ class SpotlightHttpTest : public ::testing::Test {
     port_ = std::stoi(port[1]);
   }
 
-  Sandbox root_;
+  SystemSandbox system_;
   std::string share_;
-  std::unique_ptr<ChildProcess> search_daemon_;
   std::unique_ptr<ChildProcess> responder_;
   int port_ = 0;
 };
 
-TEST_F(SpotlightHttpTest, PagesOfOneKeptAliveConnectionAddUpToTheTotal) {
+// One scenario on one responder: pages of a kept-alive connection, every
+// other request a readable 4xx with the daemon still up, and (as root) a
+// local user's connection refused while root itself is let in.
+TEST_F(SpotlightHttpTest, AnswersSambaCanReadToRootOnly) {
   SambaLikeClient client(port_);
   ASSERT_TRUE(client.connected());
   std::set<std::string> paths;
+  const std::string scoped = "(port*) AND path.real.fulltext:\"" + share_ + "\"";
   for (int from = 0; from < 5; from += 2) {
-    const HttpReply reply =
-        client.Send("POST", "/fileindex_share/_search", Search("(port*) AND path.real.fulltext:\"" + share_ + "\"", from, 2));
+    const HttpReply reply = client.Send("POST", "/fileindex_share/_search", Search(scoped, from, 2));
     ExpectSambaCanRead(reply, "page from " + std::to_string(from));
     EXPECT_EQ(reply.status_line, "HTTP/1.1 200 OK");
     Json::Value answer;
@@ -172,9 +158,9 @@ TEST_F(SpotlightHttpTest, PagesOfOneKeptAliveConnectionAddUpToTheTotal) {
     for (const Json::Value& hit : answer["hits"]["hits"]) paths.insert(hit["_source"]["path"]["real"].asString());
   }
   EXPECT_EQ(paths.size(), 5u);
-}
+  // "/_all" searches every share the scope names.
+  EXPECT_EQ(client.Send("POST", "/_all/_search", Search(scoped, 0, 50)).status_line, "HTTP/1.1 200 OK");
 
-TEST_F(SpotlightHttpTest, EveryOtherRequestIsAReadable4xxAndTheDaemonStaysUp) {
   const std::string good = Search("port*", 0, 50);
   const struct {
     std::string method, uri, body;
@@ -192,37 +178,27 @@ TEST_F(SpotlightHttpTest, EveryOtherRequestIsAReadable4xxAndTheDaemonStaysUp) {
       {"POST", "/fileindex_share/_search", Search("port* AND path.real.fulltext:\"/elsewhere\"", 0, 50), 400},
   };
   for (const auto& test : cases) {
-    SambaLikeClient client(port_);
-    const HttpReply reply = client.Send(test.method, test.uri, test.body);
+    const HttpReply reply = SambaLikeClient(port_).Send(test.method, test.uri, test.body);
     const std::string what = test.method + " " + test.uri + " " + test.body.substr(0, 40);
     ExpectSambaCanRead(reply, what);
     EXPECT_EQ(reply.status_line.substr(9, 3), std::to_string(test.status)) << what << ": " << reply.body;
   }
   EXPECT_TRUE(responder_->Running());
-  SambaLikeClient client(port_);
-  EXPECT_EQ(client.Send("POST", "/_all/_search", Search("port* AND path.real.fulltext:\"" + share_ + "\"", 0, 50))
-                .status_line,
-            "HTTP/1.1 200 OK");
-}
 
-TEST_F(SpotlightHttpTest, ALocalUserIsRefused) {
   if (geteuid() != 0) GTEST_SKIP() << "needs root to connect as the user nobody";
   const passwd* nobody = getpwnam("nobody");
   ASSERT_NE(nobody, nullptr);
   const pid_t child = fork();
   if (child == 0) {
     if (setgid(nobody->pw_gid) != 0 || setuid(nobody->pw_uid) != 0) _exit(2);
-    SambaLikeClient client(port_);
-    const HttpReply reply = client.Send("POST", "/fileindex_share/_search", Search("port*", 0, 50));
+    const HttpReply reply = SambaLikeClient(port_).Send("POST", "/fileindex_share/_search", good);
     _exit(reply.status_line == "HTTP/1.1 403 Forbidden" && reply.body.find("Report") == std::string::npos ? 0 : 1);
   }
   int status = 0;
   ASSERT_EQ(waitpid(child, &status, 0), child);
   EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << responder_->Log();
   EXPECT_NE(responder_->Log().find("refused a search"), std::string::npos);
-  // Root itself is let in.
-  SambaLikeClient client(port_);
-  EXPECT_EQ(client.Send("POST", "/fileindex_share/_search", Search("port*", 0, 50)).status_line, "HTTP/1.1 200 OK");
+  EXPECT_EQ(SambaLikeClient(port_).Send("POST", "/fileindex_share/_search", good).status_line, "HTTP/1.1 200 OK");
 }
 
 }  // namespace

@@ -211,7 +211,12 @@ class WebApiTest : public ::testing::Test {
   std::unique_ptr<WebSandbox> sandbox_;
 };
 
-TEST_F(WebApiTest, WithoutALiveSessionNothingAnswersAndNothingChanges) {
+// One administrator's visit: nothing without a live session, a sign-in
+// link that works once, changes that need the session's own CSRF token,
+// bad requests answered with a JSON error, then what the command line does
+// and downloads inside shares. The details of each refusal are
+// web_unit_test's; here, that the daemon wires each in.
+TEST_F(WebApiTest, AnAdministratorsVisit) {
   WebClient signed_out = Admin();
   const std::string old_cookie = signed_out.cookie;
   ASSERT_EQ(signed_out.Post("/api/sign-out", "{}").status, 200);
@@ -236,57 +241,50 @@ TEST_F(WebApiTest, WithoutALiveSessionNothingAnswersAndNothingChanges) {
   // The pages themselves load without a session (they show the sign-in form).
   EXPECT_EQ(none.Get("/sign-in.html").status, 200);
   EXPECT_EQ(none.Get("/").status, 200);
-}
 
-TEST_F(WebApiTest, ASignInLinkWorksOnceAndChangesNeedTheSessionsOwnCsrfToken) {
+  // A sign-in link works once; changes need the session's own CSRF token.
   const std::string link = sandbox_->SignInLink();
   WebClient admin(sandbox_->port()), reused(sandbox_->port());
   ASSERT_TRUE(admin.UseLink(link));
   EXPECT_FALSE(reused.UseLink(link));
   EXPECT_EQ(reused.Get("/api/session").status, 401);
   WebClient other = Admin();
-  const std::string before = ManagedState();
   const std::string token = admin.csrf_token;
   const struct {
     const char* what;
     std::string token;
     const char* content_type;
     int status;
-  } cases[] = {
+  } csrf_cases[] = {
       {"no token", "", "application/json", 403},
       {"a wrong token", std::string(64, '0'), "application/json", 403},
       {"another session's token", other.csrf_token, "application/json", 403},
       {"a form post", token, "application/x-www-form-urlencoded", 415},
   };
-  for (const auto& c : cases) {
+  for (const auto& c : csrf_cases) {
     const Reply reply = admin.PostRaw("/api/pause", R"({"hours": 1})", c.content_type, {{"X-CSRF-Token", c.token}});
     EXPECT_EQ(reply.status, c.status) << c.what << ": " << reply.body;
   }
   EXPECT_EQ(ManagedState(), before);
   EXPECT_EQ(admin.Post("/api/pause", R"({"hours": 1})").status, 200);
   EXPECT_GT(fileindex::StatusMgr().GetPauseInfo(), 0);
-}
 
-TEST_F(WebApiTest, BadRequestsGetAJsonErrorAndTheDaemonStaysUp) {
-  WebClient admin = Admin();
-  const std::string before = ManagedState();
+  // Bad requests get a JSON error and the daemon stays up.
+  const std::string unchanged = ManagedState();
   const struct {
     const char* path;
     std::string body;
     int status;
-  } cases[] = {
+  } bad_requests[] = {
       {"/api/folders/add", "{\"path\": ", 400},
-      {"/api/folders/add", R"({"path": 42})", 400},
       {"/api/folders/add", R"({"path": "/share/../etc"})", 400},
-      {"/api/folders/set", R"({"path": "/share", "document": "yes"})", 400},
       {"/api/folders/delete", R"({"paths": "/share"})", 400},
       {"/api/folders/delete", R"({"paths": []})", 400},
-      {"/api/pause", R"({"hours": -1})", 400},
       {"/api/pause", std::string(100000, ' '), 413},
       {"/api/sign-in", R"({"user": "root"})", 400},
       {"/api/nothing-here", "{}", 404},
   };
-  for (const auto& c : cases) {
+  for (const auto& c : bad_requests) {
     const Reply reply = admin.Post(c.path, c.body);
     EXPECT_EQ(reply.status, c.status) << c.path << " " << c.body.substr(0, 60) << ": " << reply.body;
     EXPECT_FALSE(reply.json["success"].asBool());
@@ -294,19 +292,16 @@ TEST_F(WebApiTest, BadRequestsGetAJsonErrorAndTheDaemonStaysUp) {
     EXPECT_FALSE(reply.json["error"]["what_to_do"].asString().empty()) << reply.body;
   }
   for (const char* read : {"/api/search?q=%22unclosed", "/api/search?size=100000",
-                           "/api/search?q=a&q=b", "/api/search?category=spreadsheet",
-                           "/api/folders?sort=colour"}) {
+                           "/api/search?category=spreadsheet", "/api/folders?sort=colour"}) {
     const Reply reply = admin.Get(read);
     EXPECT_EQ(reply.status, 400) << read << ": " << reply.body;
     EXPECT_FALSE(reply.json["error"]["reason"].asString().empty()) << read;
   }
-  EXPECT_EQ(ManagedState(), before);
+  EXPECT_EQ(ManagedState(), unchanged);
   EXPECT_TRUE(sandbox_->WebRunning());
   EXPECT_EQ(admin.Get("/api/session").status, 200);
-}
 
-TEST_F(WebApiTest, AnAdministratorCanDoWhatTheCommandLineDoesAndDownloadInsideShares) {
-  WebClient admin = Admin();
+  // What the command line does, and downloads inside shares only.
   Indexed();
   fs::create_symlink("/etc/hostname", sandbox_->Path("docs/escape.txt"));
   fs::create_symlink(sandbox_->Path("docs/public.txt"), sandbox_->Path("docs/inside.txt"));
@@ -314,7 +309,7 @@ TEST_F(WebApiTest, AnAdministratorCanDoWhatTheCommandLineDoesAndDownloadInsideSh
   const struct {
     std::string path;
     int status;
-  } cases[] = {
+  } downloads[] = {
       {share + "/docs/public.txt", 200},
       {share + "/docs/inside.txt", 200},
       {share + "/docs/escape.txt", 403},
@@ -324,7 +319,7 @@ TEST_F(WebApiTest, AnAdministratorCanDoWhatTheCommandLineDoesAndDownloadInsideSh
       {share + "/docs", 403},
       {"docs/public.txt", 400},
   };
-  for (const auto& c : cases) {
+  for (const auto& c : downloads) {
     const Reply reply = admin.Get("/api/download?path=" + Escape(c.path));
     EXPECT_EQ(reply.status, c.status) << c.path << ": " << reply.body.substr(0, 200);
     if (c.status == 200) {
@@ -439,7 +434,10 @@ class WebUsersTest : public WebApiTest {
   bool made_users_ = false;
 };
 
-TEST_F(WebUsersTest, AFileReadableByOneUserNeverReachesAnother) {
+// Each user sees only the files they can read, only administrators reach
+// management calls, and wrong passwords slow the next sign-in of that
+// account down (last: bob cannot sign in again for a while).
+TEST_F(WebUsersTest, EachUserSeesTheirOwnFilesAndOnlyAdministratorsManage) {
   WebClient alice = User(alice_);
   WebClient bob = User(bob_);
   const std::string secret = sandbox_->Path("docs/alice-only-zanzibar.txt");
@@ -465,11 +463,7 @@ TEST_F(WebUsersTest, AFileReadableByOneUserNeverReachesAnother) {
     EXPECT_EQ(reply.status, c.download_status) << reply.body.substr(0, 200);
     EXPECT_EQ(reply.body.find("secret") != std::string::npos && c.download_status == 200, c.download_status == 200);
   }
-}
 
-TEST_F(WebUsersTest, OnlyAdministratorsReachManagementCalls) {
-  WebClient alice = User(alice_);
-  WebClient bob = User(bob_);
   EXPECT_TRUE(alice.Get("/api/session").json["data"]["admin"].asBool());
   EXPECT_FALSE(bob.Get("/api/session").json["data"]["admin"].asBool());
   const std::string before = ManagedState();
@@ -481,9 +475,7 @@ TEST_F(WebUsersTest, OnlyAdministratorsReachManagementCalls) {
   EXPECT_EQ(alice.Get("/api/status").status, 200);
   EXPECT_EQ(alice.Post("/api/pause", R"({"hours": 1})").status, 200);
   EXPECT_EQ(bob.Get("/api/search?q=marmalade").status, 200);
-}
 
-TEST_F(WebUsersTest, WrongPasswordsSlowTheNextSignInDown) {
   WebClient client(sandbox_->port());
   for (int i = 0; i < 3; ++i) EXPECT_EQ(client.SignIn(bob_, "wrong").status, 401);
   const Reply slowed = client.SignIn(bob_, kPassword);
