@@ -18,7 +18,6 @@ namespace corvlumex {
 namespace elasticd_test {
 namespace {
 
-using testing_support::Sandbox;
 using Ids = std::vector<std::string>;
 
 // Repeats `ask` while the index answers 1401 (still opening), for at most
@@ -210,33 +209,26 @@ TEST_F(BacklogDaemonTest, WritesOverTheBacklogBoundAnswer1400) {
   EXPECT_NE(answer["error"]["msg"].asString().find("too many writes"), std::string::npos);
 }
 
-TEST(EventHandlerTest, ThePluginIsLoadedAndToldOfEachCommit) {
-  Sandbox root;
-  const std::string out = root.path() + "/events.txt";
-  setenv("CORVELASTICD_TEST_HANDLER_OUT", out.c_str(), 1);
-  Daemon daemon(root.path());
-  daemon.Start();
-  const auto run = [&](const std::string& command, const std::string& data) {
-    Json::Value value = Data(data);
-    value["id"] = kIndex;
-    return Command(daemon.socket_path(), command, value)["success"].asBool();
-  };
-  Json::Value create;
-  create["path"] = root.path() + "/index";
-  create["mappings"] = LibraryMappings();
-  create["event_handler"]["lib_path"] = CORVELASTICD_TEST_HANDLER;
-  ASSERT_TRUE(run("index_create", JsonToString(create)));
-  Json::Value doc;
-  doc["doc_id"] = "/v/s/a.txt";
-  doc["data"] = FileDocument("/v/s/a.txt", "", 1);
-  ASSERT_TRUE(run("document_upsert_by_id", JsonToString(doc)));
-  ASSERT_TRUE(run("commit", "{}"));
-  ASSERT_TRUE(run("document_del_by_id", R"({"doc_id": "/v/s/a.txt"})"));
-  ASSERT_TRUE(run("commit", "{}"));
-  ASSERT_TRUE(run("commit", "{}"));  // nothing changed: no event
-  daemon.Terminate();
-  unsetenv("CORVELASTICD_TEST_HANDLER_OUT");
-  EXPECT_EQ(testing_support::ReadFileText(out),
+// The test plug-in writes one line per event to the file named in its environment.
+class EventHandlerTest : public DaemonTest {
+ protected:
+  void SetUp() override {
+    setenv("CORVELASTICD_TEST_HANDLER_OUT", events_.c_str(), 1);
+    DaemonTest::SetUp();
+  }
+  void TearDown() override { unsetenv("CORVELASTICD_TEST_HANDLER_OUT"); }
+  std::string HandlerPath() override { return CORVELASTICD_TEST_HANDLER; }
+  const std::string events_ = root_.path() + "/events.txt";
+};
+
+TEST_F(EventHandlerTest, ThePluginIsLoadedAndToldOfEachCommit) {
+  Upsert("/v/s/a.txt");
+  Commit();
+  ASSERT_TRUE(Run("document_del_by_id", R"({"doc_id": "/v/s/a.txt"})")["success"].asBool());
+  Commit();
+  Commit();  // nothing changed: no event
+  ASSERT_EQ(daemon_->Terminate(), 0);
+  EXPECT_EQ(testing_support::ReadFileText(events_),
             "open fileindex_share\n"
             "commit fileindex_share +1 -0 +/v/s/a.txt\n"
             "commit fileindex_share +0 -1 -/v/s/a.txt\n"

@@ -110,7 +110,7 @@ void DaemonTest::SetUp() {
   data["path"] = root_.path() + "/volume1/share/@eaDir/index";
   data["settings"] = Json::Value(Json::objectValue);
   data["mappings"] = LibraryMappings();
-  data["event_handler"]["lib_path"] = root_.path() + "/no/such/handler.so";
+  data["event_handler"]["lib_path"] = HandlerPath();
   const Json::Value answer = Run("index_create", data);
   ASSERT_TRUE(answer["success"].asBool()) << JsonToString(answer);
 }

@@ -64,11 +64,13 @@ Json::Value Command(const std::string& socket, const std::string& command, const
 std::vector<std::string> HitIds(const Json::Value& answer);
 
 // A started daemon with the index kIndex created at
-// <root>/volume1/share/@eaDir/index; its event handler is not installed.
+// <root>/volume1/share/@eaDir/index, naming HandlerPath() as its event handler.
 class DaemonTest : public ::testing::Test {
  protected:
   void SetUp() override;
   virtual std::vector<std::string> ExtraArgs() { return {}; }
+  // The event handler the index names (none installed by default).
+  virtual std::string HandlerPath() { return root_.path() + "/no/such/handler.so"; }
 
   // The command with "id": kIndex added to `data` (unless a search names its own).
   Json::Value Run(const std::string& command, Json::Value data = Json::Value(Json::objectValue));

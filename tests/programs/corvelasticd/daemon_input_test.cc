@@ -54,14 +54,11 @@ std::string Repeat(const std::string& piece, int times) {
 
 // Every request that is malformed, names what does not exist, or is built to
 // stop or tie up the daemon gets an answer with its code and the part at
-// fault, and the daemon serves on. What each refusal says in detail is
-// checked in-process (query_test, search_test, index_store_test); here, that
-// the daemon gives it back over the socket.
+// fault, and the daemon serves on. What each refusal says in detail, and
+// every limit of a query or a search, is checked in-process (query_test,
+// search_test, index_store_test); here, that the daemon gives one of each
+// kind back over the socket.
 TEST_F(DaemonInputTest, EveryBadOrHostileRequestIsAnsweredWithItsCodeAndTheDaemonServesOn) {
-  std::string deep = R"({"match_all": {}})";
-  for (int i = 0; i < 40; ++i) deep = R"({"bool": {"must": [)" + deep + "]}}";
-  std::string words;
-  for (int i = 0; i < 100000; ++i) words += "w" + std::to_string(i) + " ";
   const std::string upsert = R"({"command": "document_upsert_by_id", "data": {"id": "fileindex_share", )";
   const std::string search = R"({"command": "search", "data": {"query": {"qsl": )";
   const std::string create = R"({"command": "index_create", "data": {"id": "x", )";
@@ -86,7 +83,6 @@ TEST_F(DaemonInputTest, EveryBadOrHostileRequestIsAnsweredWithItsCodeAndTheDaemo
       {search + Repeat("[", 1200) + Repeat("]", 1200) + "}}}", elasticd::kCodeBadRequest, "JSON"},
       // Arguments of the wrong type or meaning.
       {upsert + R"("doc_id": 7, "data": {}}})", elasticd::kCodeBadArgument, "doc_id"},
-      {upsert + R"("doc_id": "/a", "data": []}})", elasticd::kCodeBadArgument, ""},
       {upsert + R"("doc_id": "/a", "data": {"CORVMDFSSize": "big"}}})", elasticd::kCodeBadDocument,
        "CORVMDFSSize"},
       {R"({"command": "commit", "data": {"id": "nope"}})", elasticd::kCodeIndexNotFound, ""},
@@ -95,11 +91,8 @@ TEST_F(DaemonInputTest, EveryBadOrHostileRequestIsAnsweredWithItsCodeAndTheDaemo
       {create + R"("path": "relative",
           "mappings": {"property_id": "P", "properties": {"P": {"analyzer": "keyword"}}}}})",
        elasticd::kCodeIndexPath, ""},
-      {R"({"command": "search", "data": {"size": -1}})", elasticd::kCodeBadArgument, "size"},
       // Queries.
       {search + R"({"match": {"NoSuchField": "x"}}}}})", elasticd::kCodeBadQuery, "NoSuchField"},
-      {search + deep + "}}}", elasticd::kCodeBadQuery, "deeper"},
-      {search + R"({"match": {"_all": ")" + words + R"("}}}}})", elasticd::kCodeBadQuery, "words"},
   };
   for (const auto& c : cases) {
     SCOPED_TRACE(c.request.substr(0, 120));
