@@ -109,8 +109,9 @@ TEST_F(SendRequestTest, DaemonThatClosesBeforeReadingFailsTheSend) {
 // message without a log line, or is a bad argument when it lacks them.
 TEST_F(SendRequestTest, EachAnswerGivesItsErrorAndOnlyUnusableOnesALogLine) {
   FakeSearchDaemon daemon;
-  const std::string bad_answer = "Failed [!conn.Recv(resp_raw) || !res.fromString(resp_raw) || "
-                                 "!res.isMember(\"success\") || !res[\"success\"].isBool()], reason: ";
+  const std::string bad_answer =
+      "Failed [!conn.Recv(resp_raw) || !res.fromString(resp_raw) || "
+      "!res.isMember(\"success\") || !res[\"success\"].isBool()], reason: ";
   const struct {
     FakeAnswer answer;
     int code;
@@ -118,9 +119,10 @@ TEST_F(SendRequestTest, EachAnswerGivesItsErrorAndOnlyUnusableOnesALogLine) {
     std::string logged;  // the one log line's part; "" for none
   } cases[] = {
       {FakeAnswer::Raw("not json"), kErrorSearchRequest, "Recv failed, res=not json", bad_answer},
-      {FakeAnswer::Raw(R"({"data": {}})"), kErrorSearchRequest, R"(Recv failed, res={"data": {}})", bad_answer},
-      {FakeAnswer::Raw(R"({"success": "true"})"), kErrorSearchRequest, R"(Recv failed, res={"success": "true"})",
+      {FakeAnswer::Raw(R"({"data": {}})"), kErrorSearchRequest, R"(Recv failed, res={"data": {}})",
        bad_answer},
+      {FakeAnswer::Raw(R"({"success": "true"})"), kErrorSearchRequest,
+       R"(Recv failed, res={"success": "true"})", bad_answer},
       {FakeAnswer::Raw("[true]"), kErrorSearchRequest, "Recv failed, res=[true]", bad_answer},
       {FakeAnswer::HangUp(), kErrorSearchRequest, "Recv failed, res=", bad_answer},
       {FakeAnswer::Failure(1300, "no such index"), 1300, "Request failed, msg=no such index", ""},
@@ -138,7 +140,8 @@ TEST_F(SendRequestTest, EachAnswerGivesItsErrorAndOnlyUnusableOnesALogLine) {
     log_.Clear();
     const Error error = ExchangeError(req_);
     EXPECT_EQ(error.code, c.code);
-    EXPECT_EQ(c.code == kErrorBadArgument ? error.reason.substr(0, c.reason.size()) : error.reason, c.reason);
+    const bool start_only = c.code == kErrorBadArgument;
+    EXPECT_EQ(start_only ? error.reason.substr(0, c.reason.size()) : error.reason, c.reason);
     if (c.logged == "?") continue;  // what a bad argument logs is the JSON reader's
     EXPECT_EQ(c.logged.empty() ? log_.Lines().size() : log_.Matching(c.logged + c.reason).size(),
               c.logged.empty() ? 0u : 1u);

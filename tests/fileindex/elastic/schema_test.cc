@@ -18,8 +18,8 @@ namespace {
 // order so that two builds send the same text. data/file_index_mappings.json
 // is that text; a change to it is a change of the index format.
 TEST(SchemaTest, MappingsAreTheAgreedTextSettingsAreEmptyAndTheHandlerFollowsTheRoot) {
-  const std::string golden =
-      testing_support::ReadFileText(FILEINDEX_SOURCE_DIR "/tests/fileindex/elastic/data/file_index_mappings.json");
+  const std::string golden = testing_support::ReadFileText(
+      FILEINDEX_SOURCE_DIR "/tests/fileindex/elastic/data/file_index_mappings.json");
   EXPECT_EQ(std::string(kFileIndexMappingsText) + "\n", golden);
   Json::Value parsed;
   ASSERT_TRUE(JsonFromString(parsed, golden));
@@ -31,8 +31,9 @@ TEST(SchemaTest, MappingsAreTheAgreedTextSettingsAreEmptyAndTheHandlerFollowsThe
   EXPECT_TRUE(GetFileIndexMappings()["properties"].isMember("CORVMDPath"));
   // The event handler's path follows the system root.
   testing_support::Sandbox root;
-  EXPECT_EQ(GetFileIndexEventHandler(), testing_support::JsonOf(R"({"lib_path": ")" + root.path() +
-                                                  R"(/var/packages/CorvLumex/target/handler/fileindex_event_handler.so"})"));
+  const std::string handler = "/var/packages/CorvLumex/target/handler/fileindex_event_handler.so";
+  EXPECT_EQ(GetFileIndexEventHandler(),
+            testing_support::JsonOf(R"({"lib_path": ")" + root.path() + handler + R"("})"));
 }
 
 }  // namespace

@@ -97,7 +97,8 @@ TEST_F(CommandsTest, KillNineKeepsCommittedDataAndAPauseOutlivesARestart) {
   EXPECT_EQ(Search(R"({"match": {"_all": "durable"}})")["data"]["total"].asInt(), 1);
   ASSERT_EQ(daemon_->Terminate(), 0);
   daemon_->Start();
-  EXPECT_EQ(WhileOpening([&] { return Run("document_upsert_by_id", data); })["error"]["code"].asInt(), elasticd::kCodeBusy);
+  const Json::Value reopened = WhileOpening([&] { return Run("document_upsert_by_id", data); });
+  EXPECT_EQ(reopened["error"]["code"].asInt(), elasticd::kCodeBusy);
   ASSERT_TRUE(Run("index_resume")["success"].asBool());
   EXPECT_TRUE(Run("document_upsert_by_id", data)["success"].asBool());
   Commit();

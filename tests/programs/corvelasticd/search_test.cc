@@ -53,7 +53,8 @@ TEST_F(SearchTest, HitsOfSeveralIndexesMergeIntoOneOrderAndPage) {
   EXPECT_EQ(HitIds("{" + both + R"(, "sort": "size", "from": 1, "size": 2})"), (Ids{"/two/2", "/one/3"}));
   EXPECT_EQ(HitIds(R"({"sort": ["_key"], "size": 3})"), (Ids{"/one/1", "/one/3", "/one/5"}));
   // Equal scores (texts of one length) come in key order, on every page.
-  EXPECT_EQ(HitIds(R"({"id": "one", "query": {"qsl": {"match": {"_all": "text"}}}, "from": 1, "size": 2})"),
+  EXPECT_EQ(HitIds(R"({"id": "one", "query": {"qsl": {"match": {"_all": "text"}}},
+                       "from": 1, "size": 2})"),
             (Ids{"/one/3", "/one/5"}));
   // An index named 100,000 times is searched once.
   std::string many_ids = R"({"ids": [)";

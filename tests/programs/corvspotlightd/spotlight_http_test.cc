@@ -114,7 +114,9 @@ void ExpectSambaCanRead(const HttpReply& reply, const std::string& what) {
 class SpotlightHttpTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    for (int i = 0; i < 5; ++i) WriteText(system_.Path("Report " + std::to_string(i) + ".txt"), "x");
+    for (int i = 0; i < 5; ++i) {
+      WriteText(system_.Path("Report " + std::to_string(i) + ".txt"), "x");
+    }
     system_.StartAll();
     system_.AddFolder("");
     ASSERT_EQ(system_.Converge(system_.DiskPaths("")), "") << system_.Logs();
@@ -148,7 +150,8 @@ TEST_F(SpotlightHttpTest, AnswersSambaCanReadToRootOnly) {
   std::set<std::string> paths;
   const std::string scoped = "(port*) AND path.real.fulltext:\"" + share_ + "\"";
   for (int from = 0; from < 5; from += 2) {
-    const HttpReply reply = client.Send("POST", "/fileindex_share/_search", Search(scoped, from, 2));
+    const HttpReply reply =
+        client.Send("POST", "/fileindex_share/_search", Search(scoped, from, 2));
     ExpectSambaCanRead(reply, "page from " + std::to_string(from));
     EXPECT_EQ(reply.status_line, "HTTP/1.1 200 OK");
     Json::Value answer;
@@ -159,7 +162,8 @@ TEST_F(SpotlightHttpTest, AnswersSambaCanReadToRootOnly) {
   }
   EXPECT_EQ(paths.size(), 5u);
   // "/_all" searches every share the scope names.
-  EXPECT_EQ(client.Send("POST", "/_all/_search", Search(scoped, 0, 50)).status_line, "HTTP/1.1 200 OK");
+  EXPECT_EQ(client.Send("POST", "/_all/_search", Search(scoped, 0, 50)).status_line,
+            "HTTP/1.1 200 OK");
 
   const std::string good = Search("port*", 0, 50);
   const struct {
@@ -198,7 +202,8 @@ TEST_F(SpotlightHttpTest, AnswersSambaCanReadToRootOnly) {
   ASSERT_EQ(waitpid(child, &status, 0), child);
   EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << responder_->Log();
   EXPECT_NE(responder_->Log().find("refused a search"), std::string::npos);
-  EXPECT_EQ(SambaLikeClient(port_).Send("POST", "/fileindex_share/_search", good).status_line, "HTTP/1.1 200 OK");
+  EXPECT_EQ(SambaLikeClient(port_).Send("POST", "/fileindex_share/_search", good).status_line,
+            "HTTP/1.1 200 OK");
 }
 
 }  // namespace

@@ -213,7 +213,8 @@ TEST_F(SpotlightSambaTest, MdsearchFindsWhatAScanOfTheTreeFinds) {
   // real Samba reaches the real daemons and prints exactly these paths.
   using Paths = std::set<std::string>;
   const Paths reports = {"Report 2023.pdf.txt", "reports"};
-  const Paths port = {"Report 2023.pdf.txt", "reports", "reports/annual report.txt", "photos/Port Louis.txt"};
+  const Paths port = {"Report 2023.pdf.txt", "reports", "reports/annual report.txt",
+                      "photos/Port Louis.txt"};
   const struct {
     const char* query;
     Paths expected;
@@ -227,8 +228,9 @@ TEST_F(SpotlightSambaTest, MdsearchFindsWhatAScanOfTheTreeFinds) {
       {"kMDItemFSContentChangeDate<$time.iso(2020-01-01T00:00:00Z)",
        {"reports/annual report.txt", "music/ferry song.txt"}},
       {"kMDItemContentType==\"public.plain-text\"",
-       {"Report 2023.pdf.txt", "reports/annual report.txt", "reports/notes.md", "music/ferry song.txt",
-        "photos/large.txt", "photos/Port Louis.txt", "empty folder/readme"}},
+       {"Report 2023.pdf.txt", "reports/annual report.txt", "reports/notes.md",
+        "music/ferry song.txt", "photos/large.txt", "photos/Port Louis.txt",
+        "empty folder/readme"}},
       {"kMDItemTextContent==\"harbour lights\"", {"reports/annual report.txt"}},
       {"kMDItemTextContent==\"lighthouse\"&&kMDItemFSContentChangeDate<$time.iso(2020-01-01T00:00:00Z)",
        {"music/ferry song.txt"}},

@@ -207,8 +207,9 @@ class WebApiTest : public ::testing::Test {
   virtual std::vector<std::string> WebArgs() {
     const std::string dir = testing::TempDir() + "/web-tls-" + std::to_string(getpid());
     fs::create_directories(dir);
-    const std::string make = "openssl req -x509 -newkey rsa:2048 -nodes -subj /CN=127.0.0.1 -days 1 -keyout " +
-                             dir + "/key.pem -out " + dir + "/cert.pem 2>/dev/null";
+    const std::string make =
+        "openssl req -x509 -newkey rsa:2048 -nodes -subj /CN=127.0.0.1 -days 1 -keyout " + dir +
+        "/key.pem -out " + dir + "/cert.pem 2>/dev/null";
     EXPECT_EQ(std::system(make.c_str()), 0);
     return {"--certificate", dir + "/cert.pem", "--key", dir + "/key.pem"};
   }
@@ -264,7 +265,8 @@ TEST_F(WebApiTest, AnAdministratorsVisit) {
   WebClient admin = Client(), reused = Client();
   const Reply redirect = admin.Get(link.substr(link.find("/sign-in")));
   EXPECT_EQ(redirect.status, 303);
-  EXPECT_NE(redirect.header("Set-Cookie").find("; Secure"), std::string::npos) << redirect.header("Set-Cookie");
+  EXPECT_NE(redirect.header("Set-Cookie").find("; Secure"), std::string::npos)
+      << redirect.header("Set-Cookie");
   EXPECT_NE(redirect.header("Set-Cookie").find("HttpOnly; SameSite=Strict"), std::string::npos);
   ASSERT_EQ(admin.Get("/api/session").status, 200);
   EXPECT_FALSE(reused.UseLink(link));
@@ -360,9 +362,11 @@ TEST_F(WebApiTest, AnAdministratorsVisit) {
   } steps[] = {
       {"GET", "/api/browse?path=/share", "", 200, {"\"/share/more\""}},
       {"POST", "/api/folders/delete", R"({"paths": ["/share"]})", 200, {}},
-      {"POST", "/api/folders/add", R"({"path": "/share/more", "name": "More", "video": false})", 200, {}},
+      {"POST", "/api/folders/add",
+       R"({"path": "/share/more", "name": "More", "video": false})", 200, {}},
       {"POST", "/api/folders/add", R"({"path": "/share/more"})", 400, {"\"code\":901"}},
-      {"GET", "/api/folder?path=/share/more", "", 200, {"\"name\":\"More\"", "\"video\":false", "\"document\":true"}},
+      {"GET", "/api/folder?path=/share/more", "", 200,
+       {"\"name\":\"More\"", "\"video\":false", "\"document\":true"}},
       {"POST", "/api/folders/set", R"({"path": "/share/more", "photo": false})", 200, {}},
       {"GET", "/api/folder?path=/share/more", "", 200, {"\"photo\":false"}},
       {"POST", "/api/folders/reindex", R"({"paths": ["/share/more"]})", 200, {}},
@@ -379,7 +383,9 @@ TEST_F(WebApiTest, AnAdministratorsVisit) {
     const Reply reply = Call(admin, step.method, step.path, step.body);
     EXPECT_EQ(reply.status, step.status) << reply.body;
     const std::string data = JsonToString(reply.json[reply.status == 200 ? "data" : "error"]);
-    for (const std::string& part : step.holds) EXPECT_NE(data.find(part), std::string::npos) << data;
+    for (const std::string& part : step.holds) {
+      EXPECT_NE(data.find(part), std::string::npos) << data;
+    }
   }
   // The re-added folder is indexed and searched.
   EXPECT_TRUE(PollUntil([&] { return admin.Get("/api/search?q=lighthouse").json["data"]["total"].asInt() == 1; },
