@@ -232,14 +232,8 @@ class MonitorQueueTest : public ServicesTest {
     return root_.path() + "/etc/corvlumex/monitor.d/fileindex@%2Fvolume1%2Fphoto%2F%40eaDir%2Ffileindex.queue.json";
   }
   Json::Value Queue() const {
-    Json::Value queue;
-    queue["queue"] = "/volume1/photo/@eaDir/fileindex.queue";
-    Json::Value entry;
-    entry["path"] = "/volume1/photo/2019";
-    entry["mask"] = 65478;
-    entry["ignore"].append("@eaDir");
-    queue["config"].append(entry);
-    return queue;
+    return testing_support::JsonOf(R"({"queue":"/volume1/photo/@eaDir/fileindex.queue",)"
+                                   R"("config":[{"path":"/volume1/photo/2019","mask":65478,"ignore":["@eaDir"]}]})");
   }
 };
 
@@ -247,19 +241,17 @@ TEST_F(MonitorQueueTest, UpsertWritesOneFilePerQueueAndDeleteRemovesIt) {
   ASSERT_TRUE(platform_.MonitorQueueUpsert(Queue(), "fileindex", kMonitorQueueTypeApplication));
   Json::Value written;
   ASSERT_TRUE(JsonFromFile(written, ConfigFile()));
-  EXPECT_EQ(written["queue"], Queue()["queue"]);
-  EXPECT_EQ(written["config"], Queue()["config"]);
-  EXPECT_EQ(written["application"], "fileindex");
-  EXPECT_EQ(written["type"], 1);
+  EXPECT_EQ(JsonToString(written), R"({"application":"fileindex","config":[{"ignore":["@eaDir"],"mask":65478,)"
+                                   R"("path":"/volume1/photo/2019"}],"queue":"/volume1/photo/@eaDir/fileindex.queue",)"
+                                   R"("type":1})");
 
   // Replaced whole; a share without folders keeps its queue with a null config.
-  Json::Value empty;
-  empty["queue"] = Queue()["queue"];
+  Json::Value empty = Queue();
   empty["config"] = Json::Value();
   ASSERT_TRUE(platform_.MonitorQueueUpsert(empty, "fileindex", kMonitorQueueTypeApplication));
   ASSERT_TRUE(JsonFromFile(written, ConfigFile()));
-  EXPECT_TRUE(written.isMember("config"));
-  EXPECT_TRUE(written["config"].isNull());
+  EXPECT_EQ(JsonToString(written),
+            R"({"application":"fileindex","config":null,"queue":"/volume1/photo/@eaDir/fileindex.queue","type":1})");
 
   ASSERT_TRUE(platform_.MonitorQueueDelete(Queue()["queue"].asString(), "fileindex", kMonitorQueueTypeApplication));
   EXPECT_FALSE(IsFileExist(ConfigFile()));

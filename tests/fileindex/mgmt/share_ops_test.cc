@@ -1,6 +1,5 @@
 // Following a renamed share, a share moved to another volume, and a recycle
 // bin switched on or off, end to end in a sandbox.
-#include <filesystem>
 
 #include "common/json_util.h"
 #include "fileindex/mgmt/index_mgr.h"

@@ -1,7 +1,6 @@
 // Path and share resolution and the indexability rules, on real
 // directories of a sandbox root.
 #include <gtest/gtest.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include "common/error.h"

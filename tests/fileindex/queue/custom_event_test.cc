@@ -40,18 +40,12 @@ class CustomEventTest : public ::testing::Test {
 };
 
 TEST_F(CustomEventTest, AppendsOneOrdinaryQueueLine) {
-  Json::Value cfg;
-  cfg["document"] = true;
-  AddCustomEvent(kEventUpdateCfg, share_ + "/a", "", cfg);
+  AddCustomEvent(kEventUpdateCfg, share_ + "/a", "", testing_support::JsonOf(R"({"document":true})"));
   AddCustomEvent(kEventRename, share_ + "/b", share_ + "/a", Json::Value());
-  const auto lines = Lines(queue_);
-  ASSERT_EQ(lines.size(), 2u);
-  EXPECT_EQ(lines[0], "{\"data\":{\"document\":true},\"event\":131072,\"path\":\"" + share_ +
-                          "/a\",\"path_old\":\"\"}");
-  const Event second(lines[1]);
-  EXPECT_EQ(second.event, kEventRename);
-  EXPECT_EQ(second.path_old, share_ + "/a");
-  EXPECT_TRUE(second.data.isNull());
+  EXPECT_EQ(Lines(queue_),
+            (std::vector<std::string>{
+                R"({"data":{"document":true},"event":131072,"path":")" + share_ + R"(/a","path_old":""})",
+                R"({"data":null,"event":256,"path":")" + share_ + R"(/b","path_old":")" + share_ + R"(/a"})"}));
 }
 
 TEST_F(CustomEventTest, ACoveringReindexMakesItANoOp) {
