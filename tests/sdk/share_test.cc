@@ -136,18 +136,6 @@ TEST_F(SDKShareTest, OnlyADefiniteLackOfSpaceIsNotEnough) {
   }
 }
 
-// A full volume as the Linux platform itself sees it through statvfs.
-TEST_F(SDKShareTest, FullVolumeThroughStatvfs) {
-  sandbox_.AddShare("photo");
-  ScopedFakePlatform installed;
-  installed->VolumeFreeBytesHook = [](const std::string&, uint64_t* free_bytes) {
-    *free_bytes = 50 << 20;
-    return true;
-  };
-  EXPECT_FALSE(SDKShare("photo").IsSpaceEnough());
-  EXPECT_EQ(platform::LastError().code, platform::kPlatformErrNoSpace);
-}
-
 }  // namespace
 }  // namespace sdk
 }  // namespace corvlumex

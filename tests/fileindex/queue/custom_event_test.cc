@@ -132,22 +132,6 @@ TEST_F(NotifyTest, NoticeArgumentsAndResults) {
                                                        "app:displayname", "error:lack_of_memory"}));
 }
 
-TEST(NotifyTool, RunsWithoutAShellAndReportsItsStatus) {
-  Sandbox sandbox(true, Sandbox::kInstalled);
-  const std::string out = sandbox.root() + "/args.txt";
-  // Each argument on its own line: a shell would have mangled the markup.
-  const std::string tool = sandbox.Write("usr/corv/bin/corvvxmnotify",
-                                         "#!/bin/sh\nfor a in \"$@\"; do printf '%s\\n' \"$a\"; done > " + out +
-                                             "\nexit 4\n");
-  ASSERT_EQ(chmod(tool.c_str(), 0755), 0);
-  EXPECT_EQ(SendVXMNotify(), 4);
-  const auto args = Lines(out);
-  ASSERT_EQ(args.size(), 11u);
-  EXPECT_EQ(args[9], "<a data-corv-app=\"CORV.Lumex.Application\" data-corv-fn=\"preference\">");
-  ASSERT_EQ(unlink(tool.c_str()), 0);
-  EXPECT_LT(NotifyLackOfMemory(), 0) << "a missing tool is a result, not an exception";
-}
-
 }  // namespace
 }  // namespace fileindex
 }  // namespace corvlumex

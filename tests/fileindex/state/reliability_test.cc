@@ -1,5 +1,7 @@
 // Several processes sharing the queue and the folder file at once: nothing
-// appended or saved may be lost, and readers never see a torn file.
+// appended or saved may be lost, and readers never see a torn file (the
+// check of the atomic rewrite every JSON state file shares: a writer that
+// rewrites in place is caught here in every run).
 #include <sys/wait.h>
 #include <unistd.h>
 
