@@ -96,6 +96,8 @@ TEST_F(BuildTest, CrashMarkerStopsReadingAndAsksForFullReindex) {
   EXPECT_EQ(Print(handed[0]), "[07] ");
   EXPECT_EQ(log_.Matching("Queue crashed: " + tree->QueuePath()).size(), 1u);
   EXPECT_EQ(tree->Ops().size(), 1u);  // the create before the marker is still in the tree
+  tree.reset();  // the full reindex outlives its tree
+  EXPECT_EQ(handed[0]->node_->GetPath(), "");
   // A marker with other bits is folded first.
   tree = Build({Line(kEventQueueCrash | kEventCreate, "/v/s/a"), Line(kEventCreate, "/v/s/b")});
   EXPECT_TRUE(tree->IsCrashed());

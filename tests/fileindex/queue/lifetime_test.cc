@@ -38,15 +38,6 @@ TEST_F(LifetimeTest, HeldOPKeepsItsNodeChainOnlyAndReleasingFreesAll) {
   EXPECT_TRUE(root.expired());
 }
 
-TEST_F(LifetimeTest, FullReindexOPOutlivesACrashedTree) {
-  auto tree = Build({Line(kEventQueueCrash, "/v/s")});
-  std::shared_ptr<OP> held;
-  tree->ProcessOP([&](std::shared_ptr<OP> op) { held = op; });
-  tree.reset();
-  EXPECT_EQ(held->op_, kOPFullReindex);
-  EXPECT_EQ(held->node_->GetPath(), "");
-}
-
 TEST_F(LifetimeTest, VeryDeepPathsBuildAndReleaseWithoutRecursion) {
   std::string deep = "/v";
   for (int i = 0; i < 100000; ++i) deep += "/d";
