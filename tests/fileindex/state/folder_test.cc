@@ -151,16 +151,6 @@ TEST_F(FolderStatus, RulesApplyInTheirOrder) {
   EXPECT_EQ(Status(Folder("/locked", "n", true, true, true, true, false, false)), "error/invalid_path");
 }
 
-TEST_F(FolderStatus, EventsOutsideTheFolderDoNotCount) {
-  const Folder folder("/photo/2019", "n", true, true, true, true, false, false);
-  sandbox_.Write("volume1/photo/2019/.keep", "");
-  Queue("{\"event\":64,\"path\":\"" + share_dir_ + "/20190/a.jpg\"}\n");
-  EXPECT_EQ(Status(folder), "finished");
-  EXPECT_FALSE(folder.IsIndexing());
-  Queue("{\"event\":256,\"path\":\"" + share_dir_ + "/other\",\"path_old\":\"" + share_dir_ + "/2019/x\"}\n");
-  EXPECT_TRUE(folder.IsIndexing()) << "a rename out of the folder is pending work";
-}
-
 TEST_F(FolderStatus, StatusIsComputedBeforeAnUnknownAdditional) {
   sandbox_.Write("volume1/photo/2019/.keep", "");
   const Folder folder("/photo/2019", "n", true, true, true, true, false, false);
