@@ -94,10 +94,7 @@ TEST_F(FileUtilTest, RealPathUnlinkCopyAndMove) {
 
   ASSERT_TRUE(CPFile(Path("d/f"), Path("copy")));
   EXPECT_TRUE(IsFileExist(Path("d/f")));
-  std::ifstream copy(Path("copy"));
-  std::string text;
-  copy >> text;
-  EXPECT_EQ(text, "content");
+  EXPECT_EQ(testing_support::ReadFileText(Path("copy")), "content");
 
   ASSERT_TRUE(MVFile(Path("copy"), Path("moved")));
   EXPECT_FALSE(IsFileExist(Path("copy")));

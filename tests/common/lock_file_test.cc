@@ -1,10 +1,5 @@
 #include <gtest/gtest.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
-#include <unistd.h>
-
-#include <chrono>
-#include <thread>
 
 #include "common/error.h"
 #include "common/lock_file.h"
@@ -78,40 +73,6 @@ TEST(LockFileTest, OpenFailureIsLoggedAndThrown) {
             std::string::npos)
       << lines[0];
   EXPECT_NE(lines[0].find(" [err: No such file or directory]"), std::string::npos);
-}
-
-// Two processes: the second waits (really sleeping, the back-off scaled down
-// tenfold) until the first lets go.
-TEST(LockFileTest, SecondProcessGetsTheLockOnceTheFirstReleasesIt) {
-  Sandbox root(false);
-  const std::string path = root.path() + "/cfg.lock";
-  const std::string marker = root.path() + "/marker";
-  int ready[2];
-  ASSERT_EQ(pipe(ready), 0);
-  const pid_t holder = fork();
-  ASSERT_GE(holder, 0);
-  if (holder == 0) {
-    LockFile lock(path, true);
-    if (write(ready[1], "x", 1) != 1) _exit(2);
-    std::this_thread::sleep_for(std::chrono::milliseconds(100));
-    FILE* file = fopen(marker.c_str(), "w");
-    if (file) fclose(file);
-    _exit(0);
-  }
-  char byte;
-  ASSERT_EQ(read(ready[0], &byte, 1), 1);
-  SetSleepHook([](std::chrono::microseconds duration) { std::this_thread::sleep_for(duration / 10); });
-  {
-    LockFile lock(path, true);
-    SetSleepHook(nullptr);
-    // The holder wrote the marker before releasing: we cannot be earlier.
-    EXPECT_EQ(access(marker.c_str(), F_OK), 0);
-  }
-  int status = 0;
-  waitpid(holder, &status, 0);
-  EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
-  close(ready[0]);
-  close(ready[1]);
 }
 
 }  // namespace

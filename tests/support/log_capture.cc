@@ -1,13 +1,5 @@
 #include "tests/support/log_capture.h"
 
-#include <stdlib.h>
-#include <sys/stat.h>
-
-#include <cstdlib>
-#include <filesystem>
-#include <fstream>
-#include <stdexcept>
-
 #include "common/log.h"
 #include "common/sys.h"
 

@@ -120,10 +120,7 @@ TEST_F(FolderDeleteTest, RefusalsChangeNothing) {
   ExpectRefused([] { FolderDelete(JsonList({"/photo/a", "/photo/zzz"})); }, kErrorFolderNotFound, "");
   ExpectRefused([] { FolderReindex(JsonList({"/music", "/photo/zzz"})); }, kErrorFolderNotFound, "");
   ExpectRefused([] { FolderReindex(Json::Value(Json::objectValue)); }, kErrorBadArgument, "");
-}
-
-TEST_F(FolderDeleteTest, MonitorFailureRestoresTheFolderFile) {
-  Add({FolderJson("/photo/a"), FolderJson("/music")});
+  // A monitor failure restores the folder file.
   ScopedFakePlatform platform;
   platform->RefuseMonitorQueues();
   ExpectRefused([] { FolderDelete(JsonList({"/photo/a", "/music"})); }, kErrorSystem, "");

@@ -1,6 +1,5 @@
 // Following a renamed share, a share moved to another volume, and a recycle
 // bin switched on or off, end to end in a sandbox.
-#include <filesystem>
 
 #include "common/json_util.h"
 #include "fileindex/mgmt/index_mgr.h"
@@ -95,8 +94,21 @@ TEST_F(ShareOpsTest, MigrateFollowsTheShareToItsNewVolume) {
   ExpectRefused([&] { ShareMigrate("photo", moved, photo_); }, kErrorBadArgument, "share.GetPath() != path_to");
 }
 
-TEST_F(ShareOpsTest, RecycleBinLeavesTheIndexWhenItIsABin) {
+// "#recycle" is a bin only while the share's switch is on: then its
+// documents leave the index; off, it is an ordinary folder and is indexed.
+TEST_F(ShareOpsTest, RecycleBinLeavesOrEntersTheIndexWithTheSharesSwitch) {
   sandbox_.MakeDir("volume1/photo/#recycle/old");
+  ScopedFakePlatform platform;
+  platform->ShareIsShareRecycleHook = [&](const std::string& path) {
+    const int in_bin = platform->RealShareIsShareRecycle(path);
+    return in_bin <= 0 ? in_bin : sandbox_.registry().Entry("photo")["recycle_bin"].asBool() ? 1 : 0;
+  };
+  ShareCheckRecycle("photo");
+  EXPECT_TRUE(NewSearchCommands().empty());
+  EXPECT_THAT(QueueSummaries("photo"), ElementsAre("65536 " + photo_ + "/#recycle"));
+
+  sandbox_.registry().Set("photo", "recycle_bin", true);
+  Mark({"photo"});
   ShareCheckRecycle("photo");
   EXPECT_THAT(NewSearchCommands(),
               ElementsAre("document_del_by_query fileindex_photo prefix=" + photo_ + "/#recycle/",
@@ -104,23 +116,6 @@ TEST_F(ShareOpsTest, RecycleBinLeavesTheIndexWhenItIsABin) {
   EXPECT_TRUE(sandbox_.QueueEvents("photo").empty());
   ExpectRefused([] { ShareCheckRecycle(""); }, kErrorBadArgument, "share_name.empty()");
   ShareCheckRecycle("music");  // nothing indexed there
-  EXPECT_EQ(NewSearchCommands().size(), 2u);
-}
-
-TEST_F(ShareOpsTest, RecycleBinEntersTheIndexWhenSwitchedOff) {
-  sandbox_.MakeDir("volume1/photo/#recycle/old");
-  ScopedFakePlatform platform;
-  // "#recycle" is a bin only while the share's switch is on.
-  platform->ShareIsShareRecycleHook = [&](const std::string& path) {
-    const int in_bin = platform->RealShareIsShareRecycle(path);
-    return in_bin <= 0 ? in_bin : sandbox_.registry().Entry("photo")["recycle_bin"].asBool() ? 1 : 0;
-  };
-  ShareCheckRecycle("photo");  // the share's bin is off: its folder is an ordinary one
-  EXPECT_TRUE(NewSearchCommands().empty());
-  EXPECT_THAT(QueueSummaries("photo"), ElementsAre("65536 " + photo_ + "/#recycle"));
-
-  sandbox_.registry().Set("photo", "recycle_bin", true);
-  ShareCheckRecycle("photo");
   EXPECT_EQ(NewSearchCommands().size(), 2u);
 }
 

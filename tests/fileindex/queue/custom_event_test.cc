@@ -40,18 +40,12 @@ class CustomEventTest : public ::testing::Test {
 };
 
 TEST_F(CustomEventTest, AppendsOneOrdinaryQueueLine) {
-  Json::Value cfg;
-  cfg["document"] = true;
-  AddCustomEvent(kEventUpdateCfg, share_ + "/a", "", cfg);
+  AddCustomEvent(kEventUpdateCfg, share_ + "/a", "", testing_support::JsonOf(R"({"document":true})"));
   AddCustomEvent(kEventRename, share_ + "/b", share_ + "/a", Json::Value());
-  const auto lines = Lines(queue_);
-  ASSERT_EQ(lines.size(), 2u);
-  EXPECT_EQ(lines[0], "{\"data\":{\"document\":true},\"event\":131072,\"path\":\"" + share_ +
-                          "/a\",\"path_old\":\"\"}");
-  const Event second(lines[1]);
-  EXPECT_EQ(second.event, kEventRename);
-  EXPECT_EQ(second.path_old, share_ + "/a");
-  EXPECT_TRUE(second.data.isNull());
+  EXPECT_EQ(Lines(queue_),
+            (std::vector<std::string>{
+                R"({"data":{"document":true},"event":131072,"path":")" + share_ + R"(/a","path_old":""})",
+                R"({"data":null,"event":256,"path":")" + share_ + R"(/b","path_old":")" + share_ + R"(/a"})"}));
 }
 
 TEST_F(CustomEventTest, ACoveringReindexMakesItANoOp) {
@@ -136,22 +130,6 @@ TEST_F(NotifyTest, NoticeArgumentsAndResults) {
   EXPECT_EQ(flags_, 187);
   EXPECT_EQ(args_, (std::vector<std::string>{"-c", "CORV.Lumex.Application", "@administrators",
                                                        "app:displayname", "error:lack_of_memory"}));
-}
-
-TEST(NotifyTool, RunsWithoutAShellAndReportsItsStatus) {
-  Sandbox sandbox(true, Sandbox::kInstalled);
-  const std::string out = sandbox.root() + "/args.txt";
-  // Each argument on its own line: a shell would have mangled the markup.
-  const std::string tool = sandbox.Write("usr/corv/bin/corvvxmnotify",
-                                         "#!/bin/sh\nfor a in \"$@\"; do printf '%s\\n' \"$a\"; done > " + out +
-                                             "\nexit 4\n");
-  ASSERT_EQ(chmod(tool.c_str(), 0755), 0);
-  EXPECT_EQ(SendVXMNotify(), 4);
-  const auto args = Lines(out);
-  ASSERT_EQ(args.size(), 11u);
-  EXPECT_EQ(args[9], "<a data-corv-app=\"CORV.Lumex.Application\" data-corv-fn=\"preference\">");
-  ASSERT_EQ(unlink(tool.c_str()), 0);
-  EXPECT_LT(NotifyLackOfMemory(), 0) << "a missing tool is a result, not an exception";
 }
 
 }  // namespace

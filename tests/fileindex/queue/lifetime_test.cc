@@ -15,42 +15,27 @@ namespace {
 
 using LifetimeTest = QueueTest;
 
-TEST_F(LifetimeTest, ReleasingTheTreeFreesNodesAndOPs) {
-  auto tree = Build({Line(kEventCreate, "/v/s/a/x"), Line(kEventRename, "/v/s/b", true, "/v/s/a"),
-                     Line(kEventReindex, "/v/s/b"), Line(kEventCreate, "/v/s/c")});
-  std::weak_ptr<OPNode> root = tree->Root();
-  std::weak_ptr<OPNode> leaf = tree->GetNodeByPath("/v/s/b/x");
-  std::weak_ptr<OP> op = tree->Ops().front();
-  tree.reset();
-  EXPECT_TRUE(root.expired());
-  EXPECT_TRUE(leaf.expired());
-  EXPECT_TRUE(op.expired());
-}
-
-TEST_F(LifetimeTest, HeldOPKeepsItsNodeChainOnly) {
-  auto tree = Build({Line(kEventCreate, "/v/s/a/x"), Line(kEventCreate, "/v/s/a/y"), Line(kEventCreate, "/v/t")});
+// An OP held past its tree keeps its node chain only; letting it go frees
+// the rest, renamed nodes included.
+TEST_F(LifetimeTest, HeldOPKeepsItsNodeChainOnlyAndReleasingFreesAll) {
+  auto tree = Build({Line(kEventCreate, "/v/s/a/x"), Line(kEventCreate, "/v/s/a/y"), Line(kEventCreate, "/v/t"),
+                     Line(kEventRename, "/v/s/b", true, "/v/s/a")});
   std::shared_ptr<OP> held;
   tree->ProcessOP([&](std::shared_ptr<OP> op) {
     if (!held) held = op;
   });
-  std::weak_ptr<OPNode> sibling = tree->GetNodeByPath("/v/s/a/y");
+  std::weak_ptr<OPNode> root = tree->Root();
+  std::weak_ptr<OPNode> sibling = tree->GetNodeByPath("/v/s/b/y");
   std::weak_ptr<OPNode> other = tree->GetNodeByPath("/v/t");
   std::weak_ptr<OP> other_op = tree->Ops().back();
   tree.reset();
   EXPECT_TRUE(sibling.expired());
   EXPECT_TRUE(other.expired());
   EXPECT_TRUE(other_op.expired());
-  EXPECT_EQ(held->node_->GetPath(), "/v/s/a/x");
-  EXPECT_EQ(Print(held), "[02] /v/s/a/x");
-}
-
-TEST_F(LifetimeTest, FullReindexOPOutlivesACrashedTree) {
-  auto tree = Build({Line(kEventQueueCrash, "/v/s")});
-  std::shared_ptr<OP> held;
-  tree->ProcessOP([&](std::shared_ptr<OP> op) { held = op; });
-  tree.reset();
-  EXPECT_EQ(held->op_, kOPFullReindex);
-  EXPECT_EQ(held->node_->GetPath(), "");
+  EXPECT_EQ(held->node_->GetPath(), "/v/s/b/x");
+  EXPECT_EQ(Print(held), "[02] /v/s/b/x");
+  held.reset();
+  EXPECT_TRUE(root.expired());
 }
 
 TEST_F(LifetimeTest, VeryDeepPathsBuildAndReleaseWithoutRecursion) {

@@ -25,6 +25,7 @@ namespace fileindex {
 namespace {
 
 using testing_support::FakeDaemon;
+using testing_support::JsonOf;
 using testing_support::OpenDescriptors;
 using testing_support::ScopedSyscallScript;
 using testing_support::SyscallScript;
@@ -71,29 +72,6 @@ class Pipe {
 
 // --- BufferRead / BufferWrite ---
 
-TEST(BufferTransfer, ChunksOfAtMost1024BytesAndNoCallForNothing) {
-  Pipe pipe;
-  const std::vector<unsigned char> data(3000, 'x');
-  SyscallScript script;
-  {
-    ScopedSyscallScript scope(&script);
-    BufferRead(-1, 0, nullptr);
-    BufferWrite(-1, 0, nullptr);
-    EXPECT_TRUE(script.read_sizes.empty());
-    EXPECT_TRUE(script.write_sizes.empty());
-    BufferWrite(pipe.write_end, data.size(), data.data());
-  }
-  EXPECT_EQ(script.write_sizes, (std::vector<unsigned long>{1024, 1024, 952}));
-  std::vector<unsigned char> back(3000);
-  {
-    ScopedSyscallScript scope(&script);
-    BufferRead(pipe.read_end, back.size(), back.data());
-  }
-  EXPECT_EQ(back, data);
-  ASSERT_GE(script.read_sizes.size(), 3u);
-  for (unsigned long size : script.read_sizes) EXPECT_LE(size, 1024u);
-}
-
 // Ten interruptions in one transfer are retried, spread over its chunks or
 // not (progress does not reset the budget); the eleventh fails. A zero result
 // is retried; any other error fails at once. The functions never log.
@@ -139,21 +117,22 @@ TEST(BufferTransfer, RetriesAndFailures) {
   EXPECT_EQ(ReasonOf([&] { BufferWrite(-1, 1, nullptr); }), Failed("write", EBADF));
   EXPECT_EQ(ReasonOf([&] { BufferRead(-1, 1, nullptr); }), Failed("read", EBADF));
   EXPECT_TRUE(log.Lines().empty());
+  // Nothing to transfer makes no call. (The chunk sizes: DaemonChannel.SendsOneFrameAndReadsTheWholeReply.)
+  SyscallScript script;
+  ScopedSyscallScript scope(&script);
+  BufferRead(-1, 0, nullptr);
+  BufferWrite(-1, 0, nullptr);
+  EXPECT_TRUE(script.read_sizes.empty() && script.write_sizes.empty());
 }
 
-TEST(Frames, LengthCountsTheNulAndReaderDropsIt) {
+// The length counts the NUL (DaemonChannel checks the frames sent); the
+// reader drops the NUL, and accepts a body sent without one as it stands.
+TEST(Frames, ReaderDropsTheNul) {
   Pipe pipe;
-  WriteFrame(pipe.write_end, "{\"a\":1}");
-  uint32_t length = 0;
-  ASSERT_EQ(read(pipe.read_end, &length, 4), 4);
-  EXPECT_EQ(length, 8u);
-  char body[8];
-  ASSERT_EQ(read(pipe.read_end, body, 8), 8);
-  EXPECT_EQ(std::string(body, 8), std::string("{\"a\":1}\0", 8));
-
   WriteFrame(pipe.write_end, "");
   EXPECT_EQ(ReadFrame(pipe.read_end), "");
-  // A body sent without its NUL is accepted as it stands.
+  WriteFrame(pipe.write_end, "{\"a\":1}");
+  EXPECT_EQ(ReadFrame(pipe.read_end), "{\"a\":1}");
   const uint32_t bare = 2;
   ASSERT_EQ(write(pipe.write_end, &bare, 4), 4);
   ASSERT_EQ(write(pipe.write_end, "{}", 2), 2);
@@ -168,62 +147,49 @@ class DaemonChannel : public ::testing::Test {
   SleepRecorder sleeps_;
 };
 
-TEST_F(DaemonChannel, SendsOneFrameAndWaitsForTheReplyNullDataIncluded) {
-  FakeDaemon daemon(DaemonSocket());
-  Json::Value data;
-  data["resume_time"] = 0;
-  SendCommandToDaemon("pause", data);
-  SendCommandToDaemon("resume", Json::Value());
-  SendCommandToDaemon("worker_create", Json::Value(Json::objectValue));
-  const auto frames = daemon.Frames();
-  ASSERT_EQ(frames.size(), 3u);
-  const std::vector<std::string> texts = {"{\"data\":{\"resume_time\":0},\"type\":\"pause\"}",
-                                          "{\"data\":null,\"type\":\"resume\"}",
-                                          "{\"data\":{},\"type\":\"worker_create\"}"};
-  for (size_t i = 0; i < texts.size(); ++i) {
-    EXPECT_EQ(frames[i].length, texts[i].size() + 1);
-    EXPECT_EQ(frames[i].body, texts[i] + std::string(1, '\0'));
+// Null data included, one frame out and the whole reply read back; a body
+// over 1024 bytes goes out in chunks; the send timeout is the only option.
+TEST_F(DaemonChannel, SendsOneFrameAndReadsTheWholeReply) {
+  // A body (text + NUL) of exactly 3000 bytes.
+  const std::string padding(3000 - 1 - std::string(R"({"data":"","type":"x"})").size(), 'p');
+  const struct {
+    std::string command;
+    Json::Value data;
+    std::string reply;
+    std::string sent;
+    std::vector<unsigned long> writes, reads;  // reads: empty when the reply is long
+  } rows[] = {
+      {"pause", JsonOf(R"({"resume_time":0})"), "{}", R"({"data":{"resume_time":0},"type":"pause"})", {4, 42}, {4, 2}},
+      {"resume", Json::Value(), "{}", R"({"data":null,"type":"resume"})", {4, 30}, {4, 2}},
+      {"worker_create", JsonOf("{}"), "", R"({"data":{},"type":"worker_create"})", {4, 35}, {4}},
+      {"x", padding, std::string(5000, 'r'), R"({"data":")" + padding + R"(","type":"x"})", {4, 1024, 1024, 952}, {}},
+  };
+  for (const auto& row : rows) {
+    SCOPED_TRACE(row.command);
+    FakeDaemon daemon(DaemonSocket(), row.reply);
+    SyscallScript script;
+    {
+      ScopedSyscallScript scope(&script);
+      SendCommandToDaemon(row.command, row.data);
+    }
+    ASSERT_EQ(daemon.Frames().size(), 1u);
+    EXPECT_EQ(daemon.Frames()[0].length, row.sent.size() + 1);
+    EXPECT_EQ(daemon.Frames()[0].body, row.sent + std::string(1, '\0'));
+    EXPECT_EQ(script.write_sizes, row.writes);
+    ASSERT_EQ(script.options.size(), 1u);
+    const SyscallScript::Option& timeout = script.options[0];
+    EXPECT_EQ(std::vector<long>({timeout.level, timeout.name, timeout.seconds, timeout.microseconds}),
+              std::vector<long>({SOL_SOCKET, SO_SNDTIMEO, 1, 0}));
+    if (!row.reads.empty()) {
+      EXPECT_EQ(script.read_sizes, row.reads);
+    }
+    // The 5000-byte reply was read whole, in chunks.
+    unsigned long read_total = 0;
+    for (unsigned long size : script.read_sizes) EXPECT_LE(size, 1024u);
+    for (unsigned long size : script.read_sizes) read_total += size;
+    EXPECT_GE(read_total, 4 + row.reply.size());
   }
   EXPECT_TRUE(sleeps_.Sleeps().empty());
-}
-
-TEST_F(DaemonChannel, LongRequestGoesOutInChunksAndSendTimeoutIsTheOnlyOption) {
-  FakeDaemon daemon(DaemonSocket(), std::string(5000, 'r'));
-  // A body (text + NUL) of exactly 3000 bytes.
-  Json::Value probe(Json::objectValue);
-  probe["data"] = "";
-  probe["type"] = "x";
-  const std::string padding(3000 - 1 - JsonToString(probe).size(), 'p');
-  SyscallScript script;
-  {
-    ScopedSyscallScript scope(&script);
-    SendCommandToDaemon("x", padding);
-  }
-  EXPECT_EQ(script.write_sizes, (std::vector<unsigned long>{4, 1024, 1024, 952}));
-  ASSERT_EQ(script.options.size(), 1u);
-  EXPECT_EQ(script.options[0].level, SOL_SOCKET);
-  EXPECT_EQ(script.options[0].name, SO_SNDTIMEO);
-  EXPECT_EQ(script.options[0].seconds, 1);
-  EXPECT_EQ(script.options[0].microseconds, 0);
-  // The 5000-byte reply was read whole, in chunks.
-  unsigned long read_total = 0;
-  for (unsigned long size : script.read_sizes) EXPECT_LE(size, 1024u);
-  for (unsigned long size : script.read_sizes) read_total += size;
-  EXPECT_GE(read_total, 5004u);
-  ASSERT_EQ(daemon.Frames().size(), 1u);
-  EXPECT_EQ(daemon.Frames()[0].length, 3000u);
-}
-
-TEST_F(DaemonChannel, EmptyReplyIsAccepted) {
-  FakeDaemon daemon(DaemonSocket(), "");
-  SyscallScript script;
-  {
-    ScopedSyscallScript scope(&script);
-    SendCommandToDaemon("notify_setting_changed", "share1");
-  }
-  // Only the 4-byte length is read.
-  EXPECT_EQ(script.read_sizes, (std::vector<unsigned long>{4}));
-  EXPECT_EQ(daemon.Frames().size(), 1u);
 }
 
 // Only a missing socket is retried (five attempts, a second apart); a
@@ -274,48 +240,40 @@ TEST_F(DaemonChannel, DaemonThatStartsDuringTheRetriesGetsTheCommand) {
   EXPECT_EQ(daemon->Frames().size(), 1u);
 }
 
-TEST_F(DaemonChannel, SocketFailureIsLoggedAndThrown) {
-  LogCapture log;
-  SyscallScript script;
-  script.fail_socket = true;
-  ScopedSyscallScript scope(&script);
-  EXPECT_EQ(ReasonOf([] { SendCommandToDaemon("pause", Json::Value()); }), Failed("socket", EMFILE));
-  ASSERT_EQ(log.Lines().size(), 1u);
-  EXPECT_NE(log.Lines()[0].find("(SendCommandToDaemon) Failed [0 > (fd_socket = socket(PF_UNIX, SOCK_STREAM, 0))], "
-                                "reason: socket failed, reason="),
-            std::string::npos)
-      << log.Lines()[0];
-}
-
-TEST_F(DaemonChannel, EveryFailureAfterTheSocketClosesIt) {
+// A failed socket() is logged; every failure after it closes the socket.
+TEST_F(DaemonChannel, EveryFailureIsThrownAndClosesTheSocket) {
   FakeDaemon daemon(DaemonSocket());
   const int before = OpenDescriptors();
-  struct Case {
-    bool fail_setsockopt;
+  const struct {
+    bool fail_socket, fail_setsockopt;
     std::deque<int> writes, reads;
     std::string reason;
+    std::string logged;  // the condition logged, or empty
+  } cases[] = {
+      {true, false, {}, {}, Failed("socket", EMFILE), "0 > (fd_socket = socket(PF_UNIX, SOCK_STREAM, 0))"},
+      {false, true, {}, {}, Failed("setsockopt", ENOPROTOOPT),
+       "0 > setsockopt(fd_socket, SOL_SOCKET, SO_SNDTIMEO, (char *)&timeout, sizeof(timeout))"},
+      {false, false, {-EIO}, {}, Failed("write", EIO), ""},
+      {false, false, {}, {-ECONNRESET}, Failed("read", ECONNRESET), ""},
   };
-  const std::vector<Case> cases = {{true, {}, {}, Failed("setsockopt", ENOPROTOOPT)},
-                                   {false, {-EIO}, {}, Failed("write", EIO)},
-                                   {false, {}, {-ECONNRESET}, Failed("read", ECONNRESET)}};
-  for (size_t i = 0; i < cases.size(); ++i) {
-    SCOPED_TRACE(cases[i].reason);
+  size_t connections = 0;
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.reason);
     LogCapture log;
     SyscallScript script;
-    script.fail_setsockopt = cases[i].fail_setsockopt;
-    script.writes = cases[i].writes;
-    script.reads = cases[i].reads;
+    script.fail_socket = c.fail_socket;
+    script.fail_setsockopt = c.fail_setsockopt;
+    script.writes = c.writes;
+    script.reads = c.reads;
     {
       ScopedSyscallScript scope(&script);
-      EXPECT_EQ(ReasonOf([] { SendCommandToDaemon("pause", Json::Value()); }), cases[i].reason);
+      EXPECT_EQ(ReasonOf([] { SendCommandToDaemon("pause", Json::Value()); }), c.reason);
     }
-    if (cases[i].fail_setsockopt) {
-      EXPECT_EQ(log.Matching("(SendCommandToDaemon) Failed [0 > setsockopt(fd_socket, SOL_SOCKET, SO_SNDTIMEO, "
-                             "(char *)&timeout, sizeof(timeout))]")
-                    .size(),
-                1u);
-    }
-    ASSERT_TRUE(daemon.WaitForClosedConnections(i + 1));
+    const std::string needle = "(SendCommandToDaemon) Failed [" + c.logged + "], reason: " + c.reason;
+    EXPECT_EQ(log.Matching(needle).size(), c.logged.empty() ? 0u : 1u) << needle;
+    EXPECT_EQ(log.Lines().size(), c.logged.empty() ? 0u : 1u);
+    connections += c.fail_socket ? 0 : 1;
+    ASSERT_TRUE(daemon.WaitForClosedConnections(connections));
     EXPECT_EQ(OpenDescriptors(), before);
   }
 }

@@ -79,31 +79,22 @@ TEST_F(FolderMgrTest, BadFilesAreRefused) {
   EXPECT_NE(lines[0].find("], reason: " + malformed.reason), std::string::npos) << lines[0];
 }
 
-TEST_F(FolderMgrTest, GoverningFolderIsTheLongestAncestorOnSlashBoundaries) {
-  const FolderMgr mgr = With({"/s/a", "/s/a/b"});
-  EXPECT_EQ(mgr.GetMostSuitableCfg(s_ + "/a/b/c")->GetPath(), "/s/a/b");
-  EXPECT_EQ(mgr.GetMostSuitableCfg(s_ + "/a/b")->GetPath(), "/s/a/b");
-  EXPECT_EQ(mgr.GetMostSuitableCfg(s_ + "/a/bc")->GetPath(), "/s/a");
-  EXPECT_FALSE(mgr.GetMostSuitableCfg(s_ + "/ab"));
-  EXPECT_FALSE(mgr.GetMostSuitableCfg(s_));
-  // The order of the list does not matter for the longest match.
-  EXPECT_EQ(With({"/s/a/b", "/s/a"}).GetMostSuitableCfg(s_ + "/a/b/c")->GetPath(), "/s/a/b");
-}
-
-TEST_F(FolderMgrTest, EqualFullPathsKeepTheEarlierFolder) {
-  WriteFolders("[" + MakeFolder("/s/a", true, false, false, false, "first")->GetStoredText() + "," +
-               MakeFolder("/s/a", false, true, false, false, "second")->GetStoredText() + "]");
-  EXPECT_EQ(FolderMgr().GetMostSuitableCfg(s_ + "/a/x")->GetName(), "first");
-}
-
-// Indexed: the folder or below it; own settings: the folder itself.
-TEST_F(FolderMgrTest, PathPredicates) {
-  const FolderMgr mgr = With({"/s/a"});
-  for (const auto& [path, indexed, own] : std::vector<std::tuple<std::string, bool, bool>>{
-           {s_ + "/a", true, true}, {s_ + "/a/x", true, false}, {s_ + "/ab", false, false},
-           {s_, false, false}, {s_ + "/a/", true, false}}) {
-    EXPECT_EQ(mgr.IsFullPathIndexed(path), indexed) << path;
-    EXPECT_EQ(mgr.IsFullPathHasOwnCfg(path), own) << path;
+// The governing folder is the longest ancestor on slash boundaries, whatever
+// the list order; of two equal paths the earlier. Indexed: the folder or
+// below it; own settings: the folder itself.
+TEST_F(FolderMgrTest, GoverningFolderAndPathPredicates) {
+  WriteFolders("[" + MakeFolder("/s/a", true, true, true, true, "first")->GetStoredText() + "," +
+               MakeFolder("/s/a", true, true, true, true, "second")->GetStoredText() + "," +
+               MakeFolder("/s/a/b", true, true, true, true, "b")->GetStoredText() + "]");
+  const FolderMgr mgr;
+  for (const auto& [path, governing, indexed, own] : std::vector<std::tuple<std::string, std::string, bool, bool>>{
+           {"/a/b/c", "b", true, false}, {"/a/b", "b", true, true}, {"/a/bc", "first", true, false},
+           {"/a", "first", true, true}, {"/a/x", "first", true, false}, {"/a/", "first", true, false},
+           {"/ab", "", false, false}, {"", "", false, false}}) {
+    const auto found = mgr.GetMostSuitableCfg(s_ + path);
+    EXPECT_EQ(found ? found->GetName() : "", governing) << path;
+    EXPECT_EQ(mgr.IsFullPathIndexed(s_ + path), indexed) << path;
+    EXPECT_EQ(mgr.IsFullPathHasOwnCfg(s_ + path), own) << path;
   }
   EXPECT_TRUE(mgr.HasFolder("/s/a"));
   EXPECT_FALSE(mgr.HasFolder("/s/a/"));
@@ -197,22 +188,18 @@ TEST_F(FolderMgrTest, ListSortsPagesAndCounts) {
                MakeFolder("/s/b", true, true, true, true, "gamma")->GetStoredText() + "]");
   const FolderMgr mgr;
   std::vector<std::shared_ptr<Folder>> page;
+  // Names sort without case; ties keep the list order in both directions.
+  for (const auto& [offset, limit, by, order, paths] :
+       std::vector<std::tuple<int, int, std::string, std::string, std::vector<std::string>>>{
+           {0, 0, "", "", {"/s/c", "/s/a", "/s/b"}}, {0, 0, "name", "ASC", {"/s/a", "/s/c", "/s/b"}},
+           {1, 1, "path", "DESC", {"/s/b"}}, {0, 0, "document", "DESC", {"/s/c", "/s/b", "/s/a"}},
+           {0, 2, "document", "ASC", {"/s/a", "/s/c"}}, {7, 5, "name", "ASC", {}}}) {
+    unsigned int total = 0;
+    mgr.List(page, total, offset, limit, by, order);
+    EXPECT_EQ(Paths(page), paths) << by << " " << order;
+    EXPECT_EQ(total, 3u);
+  }
   unsigned int total = 0;
-  mgr.List(page, total, 0, 0, "", "");
-  EXPECT_EQ(Paths(page), (std::vector<std::string>{"/s/c", "/s/a", "/s/b"}));
-  EXPECT_EQ(total, 3u);
-  mgr.List(page, total, 0, 0, "name", "ASC");
-  EXPECT_EQ(Paths(page), (std::vector<std::string>{"/s/a", "/s/c", "/s/b"})) << "case is ignored";
-  mgr.List(page, total, 1, 1, "path", "DESC");
-  EXPECT_EQ(Paths(page), std::vector<std::string>{"/s/b"});
-  // Ties keep the list order in both directions.
-  mgr.List(page, total, 0, 0, "document", "DESC");
-  EXPECT_EQ(Paths(page), (std::vector<std::string>{"/s/c", "/s/b", "/s/a"}));
-  mgr.List(page, total, 0, 2, "document", "ASC");
-  EXPECT_EQ(Paths(page), (std::vector<std::string>{"/s/a", "/s/c"}));
-  mgr.List(page, total, 7, 5, "name", "ASC");
-  EXPECT_TRUE(page.empty());
-  EXPECT_EQ(total, 3u);
   EXPECT_EQ(ErrorOf([&] { mgr.List(page, total, 0, 0, "size", "ASC"); }).code, kErrorBadArgument);
   EXPECT_EQ(ErrorOf([&] { mgr.List(page, total, 0, 0, "name", "asc"); }).code, kErrorBadArgument);
 }
