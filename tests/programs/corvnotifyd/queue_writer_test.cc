@@ -11,7 +11,6 @@
 
 #include "common/lock_file.h"
 #include "programs/corvnotifyd/queue_writer.h"
-#include "tests/programs/corvnotifyd/notifyd_harness.h"
 #include "tests/support/sandbox.h"
 
 namespace corvlumex {
