@@ -26,7 +26,7 @@ class SystemChangesTest : public ::testing::Test {
     fs::create_directories(box_.Path("outside/nested"));
     WriteText(box_.Path("outside/nested/visitor.txt"), "telescope gallery");
     box_.StartAll({"--settle-ms", "300"});
-    box_.AddFolder("docs");
+    ASSERT_EQ(RunCli({"folder", "add", "/share/docs"}).status, 0);
     ASSERT_EQ(box_.Converge(Docs()), "");
     // Once a probe file comes and goes through the queue, the notifier's
     // watches are in place for the test's own changes.
@@ -152,11 +152,11 @@ TEST_F(SystemChangesTest, EveryKindOfChangeReachesTheSearch) {
   // Documents off: text files leave, other files and folders stay; on: back.
   WriteText(box_.Path("docs/code.c"), "int main(void) { return 0; }");
   ASSERT_EQ(box_.Converge(Docs()), "");
-  box_.SetFolder("docs", false, true, true, true);
+  ASSERT_EQ(RunCli({"folder", "set", "/share/docs", "--document", "off"}).status, 0);
   const auto text_file = [](const std::string& path) { return fs::path(path).extension() == ".txt"; };
   ASSERT_EQ(box_.Converge(box_.DiskPaths("docs", text_file)), "");
   EXPECT_TRUE(box_.Search("apricot").empty());
-  box_.SetFolder("docs", true, true, true, true);
+  ASSERT_EQ(RunCli({"folder", "set", "/share/docs", "--document", "on"}).status, 0);
   ASSERT_EQ(box_.Converge(Docs()), "");
   EXPECT_TRUE(Finds("apricot", {"docs/right/a.txt"}));
 

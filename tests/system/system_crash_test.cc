@@ -40,7 +40,7 @@ void StartWithFolder(SystemSandbox& box, const std::string& folder,
                      const std::map<std::string, std::string>& notifier_env = {}) {
   fs::create_directories(box.Path(folder));
   box.StartAll(indexer_args, notifier_env);
-  box.AddFolder(folder);
+  ASSERT_EQ(RunCli({"folder", "add", "/share/" + folder}).status, 0);
   ASSERT_EQ(box.Converge(box.DiskPaths(folder), std::chrono::seconds(60)), "");
 }
 
