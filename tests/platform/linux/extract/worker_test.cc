@@ -20,6 +20,7 @@
 #include "platform/linux/extract/worker_client.h"
 #include "platform/linux/extract/worker_protocol.h"
 #include "platform/linux/linux_platform.h"
+#include "tests/platform/linux/extract/expect_fields.h"
 #include "tests/support/extract_samples.h"
 #include "tests/support/child_process.h"
 #include "tests/support/expect_error.h"
@@ -115,12 +116,10 @@ TEST_F(WorkerTest, EveryFormatWholeGivesItsFieldsAndTruncatedOrGarbageFailsAlone
   }
   // The file fields come with the content fields.
   const Json::Value pdf = Parse("whole.pdf", false);
-  EXPECT_EQ(PathOf("whole.pdf"), pdf[kFieldPath].asString());
-  EXPECT_EQ(root_.path(), pdf[kFieldParent].asString());
-  EXPECT_EQ("whole.pdf", pdf[kFieldFSName].asString());
-  EXPECT_EQ("pdf", pdf[kFieldExtension].asString());
-  EXPECT_EQ("Budget", pdf[kFieldTitle].asString());
-  EXPECT_EQ("application/pdf", pdf[kFieldMediaTypes].asString());
+  testing_support::ExpectFields(pdf, {{kFieldPath, JsonToString(PathOf("whole.pdf"))},
+                                      {kFieldParent, JsonToString(root_.path())}, {kFieldFSName, R"("whole.pdf")"},
+                                      {kFieldExtension, R"("pdf")"}, {kFieldTitle, R"("Budget")"},
+                                      {kFieldMediaTypes, R"("application/pdf")"}});
 
   std::string noise;
   unsigned int state = 12345;
