@@ -29,10 +29,12 @@ class SystemChangesTest : public ::testing::Test {
     ASSERT_EQ(RunCli({"folder", "add", "/share/docs"}).status, 0);
     ASSERT_EQ(box_.Converge(Docs()), "");
     // Once a probe file comes and goes through the queue, the notifier's
-    // watches are in place for the test's own changes.
-    WriteText(box_.Path("docs/probe"), "probe");
-    ASSERT_EQ(box_.Converge(Docs()), "");
-    ASSERT_EQ(unlink(box_.Path("docs/probe").c_str()), 0);
+    // watches are in place for the test's own changes. They follow the
+    // folder's addition by a moment: the probe is written until it is seen.
+    const std::string probe = box_.Path("docs/probe");
+    ASSERT_TRUE(PollUntil([&] { WriteText(probe, "probe"); return box_.IndexedPaths().count(probe) == 1; },
+                          std::chrono::seconds(30), std::chrono::milliseconds(500)));
+    ASSERT_EQ(unlink(probe.c_str()), 0);
     ASSERT_EQ(box_.Converge(Docs()), "");
   }
 

@@ -123,7 +123,7 @@ TEST(TranslatorTest, EachRuleOnAFreshTree) {
          t.Feed("docs", IN_ATTRIB | IN_ISDIR, "d");
          t.Feed("docs", IN_CLOSE_WRITE | IN_ISDIR, "d");  // never a modify for a folder
          t.Feed("docs", IN_DELETE | IN_ISDIR, "d");
-         t.Feed("docs", IN_CREATE, "@eaDir");  // ignored name
+         t.Feed("docs", IN_CREATE | IN_ISDIR, "@eaDir");  // an ignored name: no line, never entered
        },
        {{"Q", {{kEventCreate, "docs/f"}, {kEventModify, "docs/f"}, {kEventAttr, "docs/f"}, {kEventDelete, "docs/f"},
                {kEventAttr, "docs/d", true}, {kEventDelete, "docs/d", true}}}},
