@@ -229,8 +229,8 @@ TEST(TranslatorTest, EachRuleOnAFreshTree) {
          EXPECT_EQ(t.lost[0].kind, LossKind::kKernelOverflow);
          EXPECT_EQ(t.config_changes, 1);
        }},
-      {"a configured folder reports its own changes (its subfolders' by their parent), its loss and return", {"docs/sub"},
-       {kDocs},
+      {"a configured folder reports its own changes (its subfolders' by their parent), its loss and return",
+       {"docs/sub"}, {kDocs},
        [](Translation& t) {
          t.Feed("docs", IN_ATTRIB | IN_ISDIR);
          t.Feed("docs/sub", IN_ATTRIB | IN_ISDIR);  // told by its parent instead

@@ -117,7 +117,9 @@ class NotifydTest : public ::testing::Test {
   bool WaitForLog(const std::string& needle) const {
     return WaitUntil([&] { return ReadFileText(log_).find(needle) != npos; });
   }
-  std::vector<std::string> Queue(const std::string& queue = "") const { return TextLines(queue.empty() ? queue_ : queue); }
+  std::vector<std::string> Queue(const std::string& queue = "") const {
+    return TextLines(queue.empty() ? queue_ : queue);
+  }
   // Makes the folder `path` and waits until its create line is in `queue`:
   // every event before it has then been written too (a folder's create is
   // the only line it makes, so nothing of it trails behind).

@@ -304,13 +304,16 @@ TEST_F(CommandSocketTest, AnswersCarryTheCodeAndRefuseChangesFromOtherUsers) {
        R"({"success": true, "data": {"echo": {"resume_time": 0}}})"},
       {R"({"type": "noshare"})", 0, R"({"success": false, "error": {"code": 800, "msg": "no share"}})"},
       {"not json", 0,
-       R"({"success": false, "error": {"code": 120, "msg": "The request must be a JSON object with a string \"type\""}})"},
+       R"({"success": false, "error": {"code": 120,
+           "msg": "The request must be a JSON object with a string \"type\""}})"},
       {R"({"type": "resume"})", 4242,
-       R"({"success": false, "error": {"code": 120, "msg": "\"resume\" is allowed to root and the daemon's user only"}})"},
+       R"({"success": false, "error": {"code": 120,
+           "msg": "\"resume\" is allowed to root and the daemon's user only"}})"},
       {R"({"type": "status"})", 4242, R"({"success": true, "data": {"echo": null}})"},
   };
   for (const auto& c : cases) {
-    EXPECT_EQ(testing_support::JsonOf(server_->Answer(c.request, c.uid)), testing_support::JsonOf(c.answer)) << c.request;
+    EXPECT_EQ(testing_support::JsonOf(server_->Answer(c.request, c.uid)), testing_support::JsonOf(c.answer))
+        << c.request;
   }
   EXPECT_EQ(std::count(seen_.begin(), seen_.end(), "resume"), 0);
 }

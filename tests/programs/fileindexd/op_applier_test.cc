@@ -266,7 +266,8 @@ TEST_F(OpApplierTest, AReindexStoresWhatChangedAndDeletesWhatIsGone) {
   ASSERT_EQ(commands.size(), 4u);
   std::sort(commands.begin() + 1, commands.begin() + 3);  // the walk's upserts run on two threads
   EXPECT_EQ(commands, (Lines{"document_get_by_query " + Docs("sub") + "/", "document_upsert_by_id " + Docs("sub"),
-                             "document_upsert_by_id " + Docs("sub/new.c"), "document_del_by_id " + Docs("sub/stale.c")}));
+                             "document_upsert_by_id " + Docs("sub/new.c"),
+                             "document_del_by_id " + Docs("sub/stale.c")}));
 }
 
 TEST_F(OpApplierTest, OneFileFailsAloneButAnIndexFailureStopsTheBatch) {
