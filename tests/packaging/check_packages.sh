@@ -24,40 +24,9 @@ deb() {  # package name -> its .deb
   echo "${found[0]}"
 }
 
-# package | path in the package (a shell pattern matched against dpkg-deb -c's names)
-expected_files='
-libfileindex1     ./usr/lib/*/libfileindex.so.1 -> libfileindex.so.1.*
-libfileindex1     ./usr/lib/*/libfileindex.so.1.*.*
-libfileindex1     ./usr/share/doc/libfileindex1/copyright
-libfileindex-dev  ./usr/lib/*/libfileindex.so -> libfileindex.so.1
-libfileindex-dev  ./usr/include/corvlumex/fileindex/optree.h
-libfileindex-dev  ./usr/include/corvlumex/common/error.h
-libfileindex-dev  ./usr/include/corvlumex/corvelasticd/corvelasticd_event_handler.h
-libfileindex-dev  ./usr/lib/*/pkgconfig/fileindex.pc
-libfileindex-dev  ./usr/lib/*/cmake/fileindex/fileindexConfig.cmake
-libfileindex-dev  ./usr/lib/*/cmake/fileindex/fileindexTargets.cmake
-corvlumex         ./usr/bin/fileindex
-corvlumex         ./usr/bin/corvelasticd
-corvlumex         ./usr/bin/corvnotifyd
-corvlumex         ./usr/bin/fileindexd
-corvlumex         ./usr/bin/corvcontentextractd
-corvlumex         ./usr/bin/corvvxmnotify
-corvlumex         ./usr/corv/bin/corvvxmnotify -> ../../bin/corvvxmnotify
-corvlumex         ./lib/systemd/system/corvelasticd.service
-corvlumex         ./lib/systemd/system/corvnotifyd.service
-corvlumex         ./lib/systemd/system/pkg-CorvLumex-fileindexd.service
-corvlumex         ./lib/systemd/system/corvcontentextractd.service
-corvlumex         ./usr/share/man/man1/fileindex.1.gz
-corvlumex         ./usr/share/man/man8/corvelasticd.8.gz
-corvlumex         ./usr/share/man/man8/corvnotifyd.8.gz
-corvlumex         ./usr/share/man/man8/fileindexd.8.gz
-corvlumex         ./usr/share/man/man8/corvcontentextractd.8.gz
-corvlumex         ./usr/share/man/man8/corvvxmnotify.8.gz
-corvlumex         ./usr/share/bash-completion/completions/fileindex
-corvlumex         ./usr/share/doc/corvlumex/copyright
-'
+# package | path in the package, from data/expected_files.txt
 while read -r package pattern; do
-  [ -n "$package" ] || continue
+  [[ -n "$package" && $package != "#"* ]] || continue
   names="$(dpkg-deb -c "$(deb "$package")" | awk '{ $1 = $2 = $3 = $4 = $5 = ""; sub(/^ +/, ""); print }')"
   found=0
   while IFS= read -r name; do
@@ -65,7 +34,7 @@ while read -r package pattern; do
     case "$name" in $pattern) found=1; break ;; esac
   done <<< "$names"
   [ "$found" -eq 1 ] || fail "$package has no $pattern"
-done <<< "$expected_files"
+done < "$root/tests/packaging/data/expected_files.txt"
 
 # The library's SONAME is the one its package is named after.
 extract="$work/extract"

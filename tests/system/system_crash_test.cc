@@ -40,7 +40,7 @@ void StartWithFolder(SystemSandbox& box, const std::string& folder,
                      const std::map<std::string, std::string>& notifier_env = {}) {
   fs::create_directories(box.Path(folder));
   box.StartAll(indexer_args, notifier_env);
-  box.AddFolder(folder);
+  ASSERT_EQ(RunCli({"folder", "add", "/share/" + folder}).status, 0);
   ASSERT_EQ(box.Converge(box.DiskPaths(folder), std::chrono::seconds(60)), "");
 }
 
@@ -88,27 +88,6 @@ void StartABulkBatch(SystemSandbox& box, const std::string& relative, int files)
   });
 }
 
-TEST(SystemCrashTest, KillDuringALargeBatchThenRestartConverges) {
-  SystemSandbox box;
-  ASSERT_NO_FATAL_FAILURE(StartWithFolder(box, "bulk"));
-  ASSERT_NO_FATAL_FAILURE(StartABulkBatch(box, [&] {
-    for (int dir = 0; dir < 10; ++dir) {
-      fs::create_directories(box.Path("bulk/d" + std::to_string(dir)));
-      for (int i = 0; i < 150; ++i) {
-        WriteText(box.Path("bulk/d" + std::to_string(dir) + "/f" + std::to_string(i) + ".txt"),
-                  "bulk file " + std::to_string(dir * 1000 + i));
-      }
-    }
-    return std::string("/bulk/d9/f149.txt");
-  }));
-  box.StopIndexer(SIGKILL);
-  // Changes while the indexer is down wait in the queue.
-  ASSERT_EQ(unlink(box.Path("bulk/d0/f0.txt").c_str()), 0);
-  ASSERT_EQ(rename(box.Path("bulk/d1").c_str(), box.Path("bulk/moved").c_str()), 0);
-  box.StartIndexer();
-  ASSERT_EQ(box.Converge(box.DiskPaths("bulk"), std::chrono::seconds(120)), "");
-}
-
 // Moves the documents at `from` to `to` the way a rename does, one request
 // per document, as far as `count` of the folder's files (the folder's own
 // first): the state a killed indexer leaves in the middle of a rename.
@@ -129,27 +108,41 @@ void MoveDocuments(const std::string& from, const std::string& to, int count) {
   fileindex::elastic::SendRequestNoResult(commit);
 }
 
-// The indexer dies while it moves the documents of a large folder, and the
-// folder moves on again before it is back: the taken-over queue holds the
-// first rename, the live one the second. Nothing may stay under a name the
-// disk no longer has.
-TEST(SystemCrashTest, AFolderRenameCutShortByACrashLeavesNoGhosts) {
+TEST(SystemCrashTest, KillsDuringALargeBatchAndDuringAFolderRenameThenRestartConverge) {
   SystemSandbox box;
-  constexpr int kFiles = 400;
-  fs::create_directories(box.Path("big/A"));
-  for (int i = 0; i < kFiles; ++i) WriteText(box.Path("big/A/f" + std::to_string(i) + ".txt"), "moved " + std::to_string(i));
-  ASSERT_NO_FATAL_FAILURE(StartWithFolder(box, "big"));
+  ASSERT_NO_FATAL_FAILURE(StartWithFolder(box, "bulk"));
+  ASSERT_NO_FATAL_FAILURE(StartABulkBatch(box, [&] {
+    for (int dir = 0; dir < 10; ++dir) {
+      fs::create_directories(box.Path("bulk/d" + std::to_string(dir)));
+      for (int i = 0; i < 150; ++i) {
+        WriteText(box.Path("bulk/d" + std::to_string(dir) + "/f" + std::to_string(i) + ".txt"),
+                  "bulk file " + std::to_string(dir * 1000 + i));
+      }
+    }
+    return std::string("/bulk/d9/f149.txt");
+  }));
+  box.StopIndexer(SIGKILL);
+  // Changes while the indexer is down wait in the queue.
+  ASSERT_EQ(unlink(box.Path("bulk/d0/f0.txt").c_str()), 0);
+  ASSERT_EQ(rename(box.Path("bulk/d1").c_str(), box.Path("bulk/moved").c_str()), 0);
+  box.StartIndexer();
+  ASSERT_EQ(box.Converge(box.DiskPaths("bulk"), std::chrono::seconds(120)), "");
+
+  // Then it dies while it moves the documents of a folder of 150 files, and
+  // the folder moves on again before it is back: the taken-over queue holds
+  // the first rename, the live one the second. Nothing may stay under a name
+  // the disk no longer has.
   box.StopIndexer(SIGKILL);
   const std::string queue = box.Path("@eaDir/fileindex.queue");
-  ASSERT_EQ(rename(box.Path("big/A").c_str(), box.Path("big/B").c_str()), 0);
-  ASSERT_TRUE(QueueHolds(box, "/big/B"));
+  ASSERT_EQ(rename(box.Path("bulk/moved").c_str(), box.Path("bulk/B").c_str()), 0);
+  ASSERT_TRUE(QueueHolds(box, "/bulk/B"));
   // What the dead indexer had done: taken the queue over, moved half.
   ASSERT_EQ(rename(queue.c_str(), (queue + ".tmp").c_str()), 0);
-  MoveDocuments(box.Path("big/A"), box.Path("big/B"), kFiles / 2);
-  ASSERT_EQ(rename(box.Path("big/B").c_str(), box.Path("big/C").c_str()), 0);
-  ASSERT_TRUE(QueueHolds(box, "/big/C"));
+  MoveDocuments(box.Path("bulk/moved"), box.Path("bulk/B"), 75);
+  ASSERT_EQ(rename(box.Path("bulk/B").c_str(), box.Path("bulk/C").c_str()), 0);
+  ASSERT_TRUE(QueueHolds(box, "/bulk/C"));
   box.StartIndexer();
-  ASSERT_EQ(box.Converge(box.DiskPaths("big"), std::chrono::seconds(60)), "");
+  ASSERT_EQ(box.Converge(box.DiskPaths("bulk"), std::chrono::seconds(60)), "");
 }
 
 size_t CountBelow(const std::set<std::string>& paths, const std::string& folder) {
@@ -172,7 +165,7 @@ TEST(SystemCrashTest, AFileWrittenDuringABulkBatchIsSearchableBeforeTheBatchEnds
 }
 
 // The search daemon dies in the middle of a large batch: what was committed
-// before is not done again, and the indexer follows the restarted daemon at
+// before is not done again; and the indexer follows a restarted daemon at
 // once instead of after its grown back-off.
 TEST(SystemCrashTest, ASearchDaemonRestartCostsOnlyTheUncommittedSlice) {
   SystemSandbox box;
@@ -201,18 +194,15 @@ TEST(SystemCrashTest, ASearchDaemonRestartCostsOnlyTheUncommittedSlice) {
   constexpr uint64_t kInFlight = 16;
   EXPECT_LE(box.Extracted(), extracted_at_kill + kBulk - committed_at_kill + kInFlight)
       << "committed before the kill: " << committed_at_kill << "\n" << box.Logs();
-}
 
-TEST(SystemCrashTest, TheIndexerFollowsARestartedSearchDaemonWithinItsBackOff) {
-  SystemSandbox box;
-  ASSERT_NO_FATAL_FAILURE(StartWithFolder(box, "docs"));
+  // Down for long: the indexer's attempts fail and its back-off grows (1, 2,
+  // 4, 8, then 16 s), yet it follows the restarted daemon at once.
   box.StopSearchDaemon(SIGKILL);
-  WriteText(box.Path("docs/late.txt"), "written while searching was down");
-  // The indexer's attempts fail and its back-off grows: 1, 2, 4, 8, then 16 s.
+  WriteText(box.Path("bulk/late.txt"), "written while searching was down");
   std::this_thread::sleep_for(std::chrono::seconds(17));
   box.StartSearchDaemon();
   // The next attempt of the back-off alone would come some 14 s from here.
-  ASSERT_EQ(box.Converge(box.DiskPaths("docs"), std::chrono::seconds(10)), "") << box.Logs();
+  ASSERT_EQ(box.Converge(box.DiskPaths("bulk"), std::chrono::seconds(10)), "") << box.Logs();
 }
 
 TEST(SystemCrashTest, LostNotificationsLeadToAFullReindexThatConverges) {

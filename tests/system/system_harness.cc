@@ -21,14 +21,11 @@ namespace fs = std::filesystem;
 
 namespace {
 
-Json::Value FolderObject(const std::string& relative, bool document, bool audio, bool video, bool photo) {
+Json::Value FolderList(const std::string& relative) {
   Json::Value folder(Json::objectValue);
   folder["path"] = relative.empty() ? "/share" : "/share/" + relative;
   folder["name"] = relative.empty() ? "share" : relative;
-  folder["document"] = document;
-  folder["audio"] = audio;
-  folder["video"] = video;
-  folder["photo"] = photo;
+  for (const char* category : {"document", "audio", "video", "photo"}) folder[category] = true;
   Json::Value list(Json::arrayValue);
   list.append(folder);
   return list;
@@ -113,13 +110,7 @@ std::string SystemSandbox::Logs() const {
   return text;
 }
 
-void SystemSandbox::AddFolder(const std::string& relative, bool document, bool audio, bool video, bool photo) {
-  fileindex::FolderAdd(FolderObject(relative, document, audio, video, photo), false);
-}
-
-void SystemSandbox::SetFolder(const std::string& relative, bool document, bool audio, bool video, bool photo) {
-  fileindex::FolderSet(FolderObject(relative, document, audio, video, photo), false);
-}
+void SystemSandbox::AddFolder(const std::string& relative) { fileindex::FolderAdd(FolderList(relative), false); }
 
 std::set<std::string> SystemSandbox::Search(const std::string& words, const std::string& field) const {
   Json::Value qsl(Json::objectValue);

@@ -51,10 +51,8 @@ class SystemSandbox {
   std::string Logs() const;
 
   // FolderAdd of /share/<relative> (relative may be empty: the whole share)
-  // with the four categories.
-  void AddFolder(const std::string& relative, bool document = true, bool audio = true, bool video = true,
-                 bool photo = true);
-  void SetFolder(const std::string& relative, bool document, bool audio, bool video, bool photo);
+  // with every category, in-process as the management operations run it.
+  void AddFolder(const std::string& relative);
 
   // Every document path of the share's index, as a search shows it.
   std::set<std::string> IndexedPaths() const;

@@ -1,5 +1,6 @@
 // Translation of inotify records into queue lines, fed record by record
-// against a real watch tree, so each rule is checked without timing.
+// against a real watch tree, so each rule is checked without timing: one row
+// per rule, each on a fresh tree.
 #include <fcntl.h>
 #include <sys/inotify.h>
 #include <unistd.h>
@@ -8,13 +9,16 @@
 
 #include <cstring>
 #include <filesystem>
+#include <functional>
 #include <map>
+#include <set>
+#include <sstream>
 #include <string>
 #include <vector>
 
 #include "programs/corvnotifyd/event_line.h"
 #include "programs/corvnotifyd/event_translator.h"
-#include "tests/programs/corvnotifyd/notifyd_harness.h"
+#include "tests/support/queue_line.h"
 #include "tests/support/sandbox.h"
 
 namespace corvlumex {
@@ -22,9 +26,6 @@ namespace notifyd {
 namespace {
 
 using testing_support::LogCapture;
-using testing_support::ParseQueueText;
-using testing_support::Line;
-using testing_support::QueueLine;
 using testing_support::Sandbox;
 namespace fs = std::filesystem;
 
@@ -34,31 +35,23 @@ struct Loss {
   std::string detail;
 };
 
-class TranslatorTest : public ::testing::Test {
- protected:
-  TranslatorTest() : fd_(inotify_init1(IN_NONBLOCK | IN_CLOEXEC)), tree_(fd_), translator_(&tree_, Callbacks()) {
-    docs_ = root_.MakeDir("share/docs");
-    music_ = root_.MakeDir("share/music");
-    outside_ = root_.MakeDir("share/outside");
+// A watch tree and its translator over a sandbox "share" with the folders
+// docs, music and outside. Paths are relative to the share.
+class Translation {
+ public:
+  Translation() : tree(fd_), translator(&tree, Callbacks()) {
+    for (const char* dir : {"docs", "music", "outside"}) fs::create_directories(P(dir));
   }
-  ~TranslatorTest() override { close(fd_); }
+  ~Translation() { close(fd_); }
 
-  EventTranslator::Callbacks Callbacks() {
-    return {[this](const std::string& queue) -> std::string& { return buffers_[queue]; },
-            [this](const std::string& queue, LossKind kind, const std::string& detail) {
-              lost_.push_back({queue, kind, detail});
-            },
-            [this](bool) { ++config_changes_; }};
+  std::string P(const std::string& relative) const { return share + "/" + relative; }
+  WatchRoot Root(const std::string& dir, const std::string& queue, uint32_t mask = 65478) const {
+    return WatchRoot{P(dir), queue, mask, {"@eaDir"}};
   }
-
-  WatchRoot Root(const std::string& path, const std::string& queue, uint32_t mask = 65478) {
-    return WatchRoot{path, queue, mask, {"@eaDir"}};
-  }
-  void Watch(std::vector<WatchRoot> roots) { translator_.ApplyRoots(std::move(roots)); }
-  int Wd(const std::string& dir) {
-    const WatchedDir* watched = tree_.FindPath(dir);
-    EXPECT_NE(watched, nullptr) << dir << " is not watched";
-    return watched ? watched->wd : -100;
+  const WatchedDir* Find(const std::string& dir) const { return tree.FindPath(P(dir)); }
+  int Wd(const std::string& dir) const {
+    EXPECT_NE(Find(dir), nullptr) << dir << " is not watched";
+    return Find(dir) ? Find(dir)->wd : -100;
   }
   void Feed(const std::string& dir, uint32_t mask, const std::string& name = "", uint32_t cookie = 0) {
     struct inotify_event event;
@@ -67,228 +60,230 @@ class TranslatorTest : public ::testing::Test {
     event.mask = mask;
     event.cookie = cookie;
     event.len = static_cast<uint32_t>(name.size());
-    translator_.Process(event, name);
+    translator.Process(event, name);
   }
-  std::vector<QueueLine> Lines(const std::string& queue = "Q") { return ParseQueueText(buffers_[queue]); }
+  void Make(const std::string& dir) const { fs::create_directories(P(dir)); }
+  void Touch(const std::string& file) const { close(open(P(file).c_str(), O_WRONLY | O_CREAT, 0644)); }
+  void Move(const std::string& from, const std::string& to) const { fs::rename(P(from), P(to)); }
 
-  Sandbox root_{false};
-  std::string docs_, music_, outside_;
-  int fd_;
-  WatchTree tree_;
-  EventTranslator translator_;
-  std::map<std::string, std::string> buffers_;
-  std::vector<Loss> lost_;
-  int config_changes_ = 0;
+  Sandbox root{false};
+  const std::string share = root.path() + "/share";
+  std::map<std::string, std::string> buffers;  // queue -> its lines
+  std::vector<Loss> lost;
+  int config_changes = 0;
+
+ private:
+  EventTranslator::Callbacks Callbacks() {
+    return {[this](const std::string& queue) -> std::string& { return buffers[queue]; },
+            [this](const std::string& queue, LossKind kind, const std::string& detail) {
+              lost.push_back({queue, kind, detail});
+            },
+            [this](bool) { ++config_changes; }};
+  }
+  int fd_ = inotify_init1(IN_NONBLOCK | IN_CLOEXEC);
+
+ public:
+  WatchTree tree;
+  EventTranslator translator;
 };
 
-TEST_F(TranslatorTest, EachKernelEventBecomesItsLine) {
-  // The folder of the queue itself: never entered, so the queue's own
-  // appends make no lines.
-  root_.MakeDir("share/docs/@eaDir");
-  Watch({Root(docs_, "Q")});
-  EXPECT_EQ(tree_.FindPath(docs_ + "/@eaDir"), nullptr);
-  Feed(docs_, IN_CREATE, "f");
-  Feed(docs_, IN_CLOSE_WRITE, "f");
-  Feed(docs_, IN_ATTRIB, "f");
-  Feed(docs_, IN_DELETE, "f");
-  Feed(docs_, IN_ATTRIB | IN_ISDIR, "d");
-  Feed(docs_, IN_CLOSE_WRITE | IN_ISDIR, "d");  // never a modify for a folder
-  Feed(docs_, IN_DELETE | IN_ISDIR, "d");
-  Feed(docs_, IN_CREATE, "@eaDir");  // ignored name
-  const std::string f = docs_ + "/f";
-  EXPECT_EQ(Lines(), (std::vector<QueueLine>{Line(kEventCreate, f), Line(kEventModify, f), Line(kEventAttr, f),
-                                             Line(kEventDelete, f),
-                                             Line(kEventAttr, docs_ + "/d", true),
-                                             Line(kEventDelete, docs_ + "/d", true)}));
+// One expected queue line, paths relative to the share.
+struct Expect {
+  uint32_t event;
+  const char* path;
+  bool is_dir = false;
+  const char* old = nullptr;
+};
+
+struct Case {
+  const char* rule;
+  std::vector<const char*> made;  // folders made before the watch starts
+  std::vector<std::pair<const char*, const char*>> roots;  // folder, queue
+  std::function<void(Translation&)> act;
+  std::map<std::string, std::vector<Expect>> lines = {};  // queue -> its lines
+  std::vector<const char*> watched = {}, unwatched = {};   // after the act
+  uint32_t mask = 65478;
+};
+
+const std::pair<const char*, const char*> kDocs{"docs", "Q"};
+
+std::vector<std::string> Split(const std::string& text) {
+  std::vector<std::string> lines;
+  std::istringstream in(text);
+  for (std::string line; std::getline(in, line);) lines.push_back(line);
+  return lines;
 }
 
-TEST_F(TranslatorTest, RenameHalvesArePairedByCookie) {
-  Watch({Root(docs_, "Q")});
-  Feed(docs_, IN_MOVED_FROM, "a", 7);
-  Feed(docs_, IN_MOVED_TO, "b", 7);
-  // A first half whose second never comes: moved out of the tree.
-  Feed(docs_, IN_MOVED_FROM, "c", 8);
-  Feed(docs_, IN_MOVED_TO, "d", 9);  // and a second half without first: moved in
-  // A folder moved in with its contents: all of it is new here, and watched.
-  fs::create_directories(outside_ + "/in/sub");
-  close(open((outside_ + "/in/sub/old").c_str(), O_WRONLY | O_CREAT, 0644));
-  fs::rename(outside_ + "/in", docs_ + "/in");
-  Feed(docs_, IN_MOVED_TO | IN_ISDIR, "in", 10);
-  EXPECT_EQ(Lines(), (std::vector<QueueLine>{Line(kEventRename, docs_ + "/b", false, docs_ + "/a"),
-                                             Line(kEventDelete, docs_ + "/c"),
-                                             Line(kEventCreate, docs_ + "/d"),
-                                             Line(kEventCreate, docs_ + "/in", true),
-                                             Line(kEventCreate, docs_ + "/in/sub", true),
-                                             Line(kEventCreate, docs_ + "/in/sub/old")}));
-  EXPECT_NE(tree_.FindPath(docs_ + "/in/sub"), nullptr);
-}
-
-TEST_F(TranslatorTest, AFolderMovedOutLosesItsWatches) {
-  fs::create_directories(docs_ + "/out/deep");
-  Watch({Root(docs_, "Q")});
-  ASSERT_NE(tree_.FindPath(docs_ + "/out/deep"), nullptr);
-  Feed(docs_, IN_MOVED_FROM | IN_ISDIR, "out", 3);
-  EXPECT_TRUE(translator_.HasPendingMove());
-  translator_.ResolvePendingMove();
-  EXPECT_EQ(Lines(), (std::vector<QueueLine>{Line(kEventDelete, docs_ + "/out", true)}));
-  EXPECT_EQ(tree_.FindPath(docs_ + "/out"), nullptr);
-  EXPECT_EQ(tree_.FindPath(docs_ + "/out/deep"), nullptr);
-}
-
-TEST_F(TranslatorTest, ARenamedFolderKeepsItsWatchesUnderTheNewName) {
-  fs::create_directories(docs_ + "/old/sub");
-  Watch({Root(docs_, "Q")});
-  const int sub_wd = Wd(docs_ + "/old/sub");
-  fs::rename(docs_ + "/old", docs_ + "/new");
-  Feed(docs_, IN_MOVED_FROM | IN_ISDIR, "old", 4);
-  Feed(docs_, IN_MOVED_TO | IN_ISDIR, "new", 4);
-  EXPECT_EQ(Lines(), (std::vector<QueueLine>{Line(kEventRename, docs_ + "/new", true, docs_ + "/old")}));
-  ASSERT_NE(tree_.FindPath(docs_ + "/new/sub"), nullptr);
-  EXPECT_EQ(tree_.FindPath(docs_ + "/new/sub")->wd, sub_wd);
-  EXPECT_EQ(tree_.FindPath(docs_ + "/old/sub"), nullptr);
-  Feed(docs_ + "/new/sub", IN_CREATE, "x");
-  EXPECT_EQ(Lines().back(), Line(kEventCreate, docs_ + "/new/sub/x"));
-}
-
-TEST_F(TranslatorTest, ANewFolderIsReadAfterItsWatchIsSet) {
-  Watch({Root(docs_, "Q")});
-  // Made, with contents, before the event is handled.
-  fs::create_directories(docs_ + "/n/a/b");
-  close(open((docs_ + "/n/a/b/f").c_str(), O_WRONLY | O_CREAT, 0644));
-  fs::create_directories(docs_ + "/n/@eaDir/hidden");
-  Feed(docs_, IN_CREATE | IN_ISDIR, "n");
-  const auto lines = Lines();
-  const std::vector<QueueLine> expected = {Line(kEventCreate, docs_ + "/n", true), Line(kEventCreate, docs_ + "/n/a", true),
-                                           Line(kEventCreate, docs_ + "/n/a/b", true),
-                                           Line(kEventCreate, docs_ + "/n/a/b/f")};
-  EXPECT_EQ(lines, expected);
-  EXPECT_NE(tree_.FindPath(docs_ + "/n/a/b"), nullptr);
-  EXPECT_EQ(tree_.FindPath(docs_ + "/n/@eaDir"), nullptr) << "ignored folders are never entered";
-}
-
-TEST_F(TranslatorTest, RenamesIntoAndOutOfAnIgnoredName) {
-  fs::create_directories(docs_ + "/d/inner");
-  Watch({Root(docs_, "Q")});
-  fs::rename(docs_ + "/d", docs_ + "/@eaDir");
-  Feed(docs_, IN_MOVED_FROM | IN_ISDIR, "d", 5);
-  Feed(docs_, IN_MOVED_TO | IN_ISDIR, "@eaDir", 5);
-  EXPECT_EQ(tree_.FindPath(docs_ + "/@eaDir"), nullptr);
-  EXPECT_EQ(tree_.FindPath(docs_ + "/@eaDir/inner"), nullptr);
-  fs::rename(docs_ + "/@eaDir", docs_ + "/back");
-  Feed(docs_, IN_MOVED_FROM | IN_ISDIR, "@eaDir", 6);
-  Feed(docs_, IN_MOVED_TO | IN_ISDIR, "back", 6);
-  EXPECT_EQ(Lines(), (std::vector<QueueLine>{Line(kEventDelete, docs_ + "/d", true), Line(kEventCreate, docs_ + "/back", true),
-                                             Line(kEventCreate, docs_ + "/back/inner", true)}));
-  EXPECT_NE(tree_.FindPath(docs_ + "/back/inner"), nullptr);
-}
-
-TEST_F(TranslatorTest, ARenameBetweenQueuesIsADeleteForOneAndACreateForTheOther) {
-  fs::create_directories(docs_ + "/d");
-  close(open((docs_ + "/d/f").c_str(), O_WRONLY | O_CREAT, 0644));
-  Watch({Root(docs_, "A"), Root(music_, "B")});
-  fs::rename(docs_ + "/d", music_ + "/d");
-  Feed(docs_, IN_MOVED_FROM | IN_ISDIR, "d", 9);
-  Feed(music_, IN_MOVED_TO | IN_ISDIR, "d", 9);
-  EXPECT_EQ(Lines("A"), (std::vector<QueueLine>{Line(kEventDelete, docs_ + "/d", true)}));
-  EXPECT_EQ(Lines("B"), (std::vector<QueueLine>{Line(kEventCreate, music_ + "/d", true), Line(kEventCreate, music_ + "/d/f")}));
-  ASSERT_NE(tree_.FindPath(music_ + "/d"), nullptr);
-  EXPECT_EQ(tree_.FindPath(music_ + "/d")->roots, std::vector<int>{1});
-}
-
-TEST_F(TranslatorTest, TheMaskChoosesWhatIsWritten) {
-  Watch({Root(docs_, "Q", kEventCreate | kEventDelete)});
-  Feed(docs_, IN_ATTRIB, "f");
-  Feed(docs_, IN_CLOSE_WRITE, "f");
-  Feed(docs_, IN_MOVED_FROM, "a", 1);
-  Feed(docs_, IN_MOVED_TO, "b", 1);  // no rename asked: both names are still told
-  EXPECT_EQ(Lines(), (std::vector<QueueLine>{Line(kEventDelete, docs_ + "/a"), Line(kEventCreate, docs_ + "/b")}));
-}
-
-TEST_F(TranslatorTest, NestedFoldersOfOneQueueWriteEachLineOnce) {
-  fs::create_directories(docs_ + "/inner");
-  Watch({Root(docs_, "Q"), Root(docs_ + "/inner", "Q")});
-  Feed(docs_ + "/inner", IN_CREATE, "f");
-  EXPECT_EQ(Lines(), (std::vector<QueueLine>{Line(kEventCreate, docs_ + "/inner/f")}));
-}
-
-TEST_F(TranslatorTest, AConfiguredFolderReportsItsOwnChangesAndItsDisappearance) {
-  fs::create_directories(docs_ + "/sub");
-  Watch({Root(docs_, "Q")});
-  Feed(docs_, IN_ATTRIB | IN_ISDIR);
-  Feed(docs_ + "/sub", IN_ATTRIB | IN_ISDIR);  // told by its parent instead
-  EXPECT_EQ(Lines(), (std::vector<QueueLine>{Line(kEventAttr, docs_, true)}));
-  EXPECT_FALSE(translator_.AnyRootMissing());
-
-  LogCapture log;
-  fs::rename(docs_, root_.path() + "/elsewhere");
-  Feed(docs_, IN_MOVE_SELF);
-  translator_.CheckRoots(false);
-  EXPECT_TRUE(translator_.AnyRootMissing());
-  EXPECT_EQ(Lines().back(), Line(kEventDelete, docs_, true));
-  EXPECT_EQ(tree_.size(), 0u);
-
-  fs::create_directories(docs_ + "/again");
-  translator_.CheckRoots(true);
-  EXPECT_FALSE(translator_.AnyRootMissing());
-  EXPECT_EQ(Lines().back(), Line(kEventCreate, docs_, true));
-  EXPECT_NE(tree_.FindPath(docs_ + "/again"), nullptr);
-  EXPECT_EQ(log.Matching("watched folder " + docs_ + " appeared").size(), 1u);
-}
-
-TEST_F(TranslatorTest, OverflowLosesEveryQueueAndRereadsTheConfiguration) {
-  Watch({Root(docs_, "A"), Root(music_, "B"), Root(outside_, "A")});
-  struct inotify_event overflow;
-  memset(&overflow, 0, sizeof(overflow));
-  overflow.wd = -1;
-  overflow.mask = IN_Q_OVERFLOW;
-  translator_.Process(overflow, "");
-  ASSERT_EQ(lost_.size(), 2u);
-  EXPECT_EQ(lost_[0].queue, "A");
-  EXPECT_EQ(lost_[1].queue, "B");
-  EXPECT_EQ(lost_[0].kind, LossKind::kKernelOverflow);
-  EXPECT_EQ(config_changes_, 1);
-}
-
-TEST_F(TranslatorTest, RunningOutOfWatchesIsALossNamingTheFolder) {
-  fs::create_directories(docs_ + "/a/b");
-  tree_.set_watch_limit(2);
-  Watch({Root(docs_, "Q")});
-  ASSERT_EQ(lost_.size(), 1u);
-  EXPECT_EQ(lost_[0].kind, LossKind::kNoWatches);
-  EXPECT_EQ(lost_[0].detail, docs_ + "/a/b");
-  EXPECT_FALSE(translator_.Rewatch("Q"));
-  tree_.set_watch_limit(0);
-  EXPECT_TRUE(translator_.Rewatch("Q"));
-  EXPECT_NE(tree_.FindPath(docs_ + "/a/b"), nullptr);
-}
-
-TEST_F(TranslatorTest, ChunksAreSplitIntoTheirRecords) {
-  Watch({Root(docs_, "Q")});
-  std::string chunk;
-  for (const char* name : {"first", "second-longer-name"}) {
-    struct inotify_event event;
-    memset(&event, 0, sizeof(event));
-    event.wd = Wd(docs_);
-    event.mask = IN_CREATE;
-    event.len = 32;  // the kernel pads names with NULs
-    chunk.append(reinterpret_cast<const char*>(&event), sizeof(event));
-    std::string padded(name);
-    padded.resize(32, '\0');
-    chunk += padded;
+TEST(TranslatorTest, EachRuleOnAFreshTree) {
+  const Case cases[] = {
+      {"each kernel event becomes its line; the queue's own folder is never entered, so its appends make none",
+       {"docs/@eaDir"}, {kDocs},
+       [](Translation& t) {
+         for (uint32_t mask : {IN_CREATE, IN_CLOSE_WRITE, IN_ATTRIB, IN_DELETE}) t.Feed("docs", mask, "f");
+         t.Feed("docs", IN_ATTRIB | IN_ISDIR, "d");
+         t.Feed("docs", IN_CLOSE_WRITE | IN_ISDIR, "d");  // never a modify for a folder
+         t.Feed("docs", IN_DELETE | IN_ISDIR, "d");
+         t.Feed("docs", IN_CREATE | IN_ISDIR, "@eaDir");  // an ignored name: no line, never entered
+       },
+       {{"Q", {{kEventCreate, "docs/f"}, {kEventModify, "docs/f"}, {kEventAttr, "docs/f"}, {kEventDelete, "docs/f"},
+               {kEventAttr, "docs/d", true}, {kEventDelete, "docs/d", true}}}},
+       {}, {"docs/@eaDir"}},
+      {"rename halves are paired by cookie; a folder moved in is new here, contents and all, and watched",
+       {"outside/in/sub"}, {kDocs},
+       [](Translation& t) {
+         t.Feed("docs", IN_MOVED_FROM, "a", 7);
+         t.Feed("docs", IN_MOVED_TO, "b", 7);
+         t.Feed("docs", IN_MOVED_FROM, "c", 8);  // a first half whose second never comes: moved out
+         t.Feed("docs", IN_MOVED_TO, "d", 9);    // and a second half without first: moved in
+         t.Touch("outside/in/sub/old");
+         t.Move("outside/in", "docs/in");
+         t.Feed("docs", IN_MOVED_TO | IN_ISDIR, "in", 10);
+       },
+       {{"Q", {{kEventRename, "docs/b", false, "docs/a"}, {kEventDelete, "docs/c"}, {kEventCreate, "docs/d"},
+               {kEventCreate, "docs/in", true}, {kEventCreate, "docs/in/sub", true},
+               {kEventCreate, "docs/in/sub/old"}}}},
+       {"docs/in/sub"}},
+      {"a folder moved out loses its watches", {"docs/out/deep"}, {kDocs},
+       [](Translation& t) {
+         ASSERT_NE(t.Find("docs/out/deep"), nullptr);
+         t.Feed("docs", IN_MOVED_FROM | IN_ISDIR, "out", 3);
+         EXPECT_TRUE(t.translator.HasPendingMove());
+         t.translator.ResolvePendingMove();
+       },
+       {{"Q", {{kEventDelete, "docs/out", true}}}}, {}, {"docs/out", "docs/out/deep"}},
+      {"a renamed folder keeps its watches under the new name", {"docs/old/sub"}, {kDocs},
+       [](Translation& t) {
+         const int sub_wd = t.Wd("docs/old/sub");
+         t.Move("docs/old", "docs/new");
+         t.Feed("docs", IN_MOVED_FROM | IN_ISDIR, "old", 4);
+         t.Feed("docs", IN_MOVED_TO | IN_ISDIR, "new", 4);
+         EXPECT_EQ(t.Wd("docs/new/sub"), sub_wd);
+         t.Feed("docs/new/sub", IN_CREATE, "x");
+       },
+       {{"Q", {{kEventRename, "docs/new", true, "docs/old"}, {kEventCreate, "docs/new/sub/x"}}}},
+       {"docs/new/sub"}, {"docs/old/sub"}},
+      {"a new folder is read, contents made before its event included, after its watch is set", {}, {kDocs},
+       [](Translation& t) {
+         t.Make("docs/n/a/b");
+         t.Touch("docs/n/a/b/f");
+         t.Make("docs/n/@eaDir/hidden");
+         t.Feed("docs", IN_CREATE | IN_ISDIR, "n");
+       },
+       {{"Q", {{kEventCreate, "docs/n", true}, {kEventCreate, "docs/n/a", true}, {kEventCreate, "docs/n/a/b", true},
+               {kEventCreate, "docs/n/a/b/f"}}}},
+       {"docs/n/a/b"}, {"docs/n/@eaDir"}},
+      {"a rename into an ignored name is a delete, out of it a create", {"docs/d/inner"}, {kDocs},
+       [](Translation& t) {
+         t.Move("docs/d", "docs/@eaDir");
+         t.Feed("docs", IN_MOVED_FROM | IN_ISDIR, "d", 5);
+         t.Feed("docs", IN_MOVED_TO | IN_ISDIR, "@eaDir", 5);
+         EXPECT_EQ(t.Find("docs/@eaDir"), nullptr);
+         EXPECT_EQ(t.Find("docs/@eaDir/inner"), nullptr);
+         t.Move("docs/@eaDir", "docs/back");
+         t.Feed("docs", IN_MOVED_FROM | IN_ISDIR, "@eaDir", 6);
+         t.Feed("docs", IN_MOVED_TO | IN_ISDIR, "back", 6);
+       },
+       {{"Q", {{kEventDelete, "docs/d", true}, {kEventCreate, "docs/back", true},
+               {kEventCreate, "docs/back/inner", true}}}},
+       {"docs/back/inner"}},
+      {"a rename between queues is a delete for one and a create for the other", {"docs/d"},
+       {{"docs", "A"}, {"music", "B"}},
+       [](Translation& t) {
+         t.Touch("docs/d/f");
+         t.Move("docs/d", "music/d");
+         t.Feed("docs", IN_MOVED_FROM | IN_ISDIR, "d", 9);
+         t.Feed("music", IN_MOVED_TO | IN_ISDIR, "d", 9);
+         ASSERT_NE(t.Find("music/d"), nullptr);
+         EXPECT_EQ(t.Find("music/d")->roots, std::vector<int>{1});
+       },
+       {{"A", {{kEventDelete, "docs/d", true}}},
+        {"B", {{kEventCreate, "music/d", true}, {kEventCreate, "music/d/f"}}}}},
+      {"the mask chooses what is written; without renames both names are still told", {}, {kDocs},
+       [](Translation& t) {
+         t.Feed("docs", IN_ATTRIB, "f");
+         t.Feed("docs", IN_CLOSE_WRITE, "f");
+         t.Feed("docs", IN_MOVED_FROM, "a", 1);
+         t.Feed("docs", IN_MOVED_TO, "b", 1);
+       },
+       {{"Q", {{kEventDelete, "docs/a"}, {kEventCreate, "docs/b"}}}}, {}, {}, kEventCreate | kEventDelete},
+      {"nested folders of one queue write each line once", {"docs/inner"}, {kDocs, {"docs/inner", "Q"}},
+       [](Translation& t) { t.Feed("docs/inner", IN_CREATE, "f"); },
+       {{"Q", {{kEventCreate, "docs/inner/f"}}}}},
+      {"folders removed from the configuration lose their watches", {"music/x"}, {kDocs, {"music", "Q"}},
+       [](Translation& t) {
+         ASSERT_NE(t.Find("music/x"), nullptr);
+         t.translator.ApplyRoots({t.Root("docs", "Q")});
+       },
+       {}, {"docs"}, {"music", "music/x"}},
+      {"an overflow loses every queue once and has the configuration read again", {},
+       {{"docs", "A"}, {"music", "B"}, {"outside", "A"}},
+       [](Translation& t) {
+         struct inotify_event overflow;
+         memset(&overflow, 0, sizeof(overflow));
+         overflow.wd = -1;
+         overflow.mask = IN_Q_OVERFLOW;
+         t.translator.Process(overflow, "");
+         ASSERT_EQ(t.lost.size(), 2u);
+         EXPECT_EQ(t.lost[0].queue, "A");
+         EXPECT_EQ(t.lost[1].queue, "B");
+         EXPECT_EQ(t.lost[0].kind, LossKind::kKernelOverflow);
+         EXPECT_EQ(t.config_changes, 1);
+       }},
+      {"a configured folder reports its own changes (its subfolders' by their parent), its loss and return",
+       {"docs/sub"}, {kDocs},
+       [](Translation& t) {
+         t.Feed("docs", IN_ATTRIB | IN_ISDIR);
+         t.Feed("docs/sub", IN_ATTRIB | IN_ISDIR);  // told by its parent instead
+         EXPECT_FALSE(t.translator.AnyRootMissing());
+         LogCapture log;
+         fs::rename(t.P("docs"), t.root.path() + "/elsewhere");
+         t.Feed("docs", IN_MOVE_SELF);
+         t.translator.CheckRoots(false);
+         EXPECT_TRUE(t.translator.AnyRootMissing());
+         EXPECT_EQ(t.tree.size(), 0u);
+         t.Make("docs/again");
+         t.translator.CheckRoots(true);
+         EXPECT_FALSE(t.translator.AnyRootMissing());
+         EXPECT_EQ(log.Matching("watched folder " + t.P("docs") + " appeared").size(), 1u);
+       },
+       {{"Q", {{kEventAttr, "docs", true}, {kEventDelete, "docs", true}, {kEventCreate, "docs", true}}}},
+       {"docs/again"}},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.rule);
+    Translation t;
+    for (const char* dir : c.made) t.Make(dir);
+    std::vector<WatchRoot> roots;
+    for (const auto& [dir, queue] : c.roots) roots.push_back(t.Root(dir, queue, c.mask));
+    t.translator.ApplyRoots(std::move(roots));
+    c.act(t);
+    std::set<std::string> queues;
+    for (const auto& entry : t.buffers) queues.insert(entry.first);
+    for (const auto& entry : c.lines) queues.insert(entry.first);
+    for (const std::string& queue : queues) {
+      std::vector<std::string> expected;
+      for (const Expect& e : c.lines.count(queue) ? c.lines.at(queue) : std::vector<Expect>{}) {
+        expected.push_back(fileindex::queue_testing::Line(e.event, t.P(e.path), e.is_dir, e.old ? t.P(e.old) : ""));
+      }
+      EXPECT_EQ(Split(t.buffers[queue]), expected) << queue;
+    }
+    for (const char* dir : c.watched) EXPECT_NE(t.Find(dir), nullptr) << dir;
+    for (const char* dir : c.unwatched) EXPECT_EQ(t.Find(dir), nullptr) << dir;
   }
-  translator_.ProcessChunk(chunk);
-  EXPECT_EQ(Lines(), (std::vector<QueueLine>{Line(kEventCreate, docs_ + "/first"),
-                                             Line(kEventCreate, docs_ + "/second-longer-name")}));
 }
 
-TEST_F(TranslatorTest, RemovedFoldersLoseTheirWatchesOnANewConfiguration) {
-  fs::create_directories(music_ + "/x");
-  Watch({Root(docs_, "Q"), Root(music_, "Q")});
-  EXPECT_NE(tree_.FindPath(music_ + "/x"), nullptr);
-  Watch({Root(docs_, "Q")});
-  EXPECT_EQ(tree_.FindPath(music_), nullptr);
-  EXPECT_EQ(tree_.FindPath(music_ + "/x"), nullptr);
-  EXPECT_NE(tree_.FindPath(docs_), nullptr);
+TEST(TranslatorTest, RunningOutOfWatchesIsALossNamingTheFolder) {
+  Translation t;
+  t.Make("docs/a/b");
+  t.tree.set_watch_limit(2);
+  t.translator.ApplyRoots({t.Root("docs", "Q")});
+  ASSERT_EQ(t.lost.size(), 1u);
+  EXPECT_EQ(t.lost[0].kind, LossKind::kNoWatches);
+  EXPECT_EQ(t.lost[0].detail, t.P("docs/a/b"));
+  EXPECT_FALSE(t.translator.Rewatch("Q"));
+  t.tree.set_watch_limit(0);
+  EXPECT_TRUE(t.translator.Rewatch("Q"));
+  EXPECT_NE(t.Find("docs/a/b"), nullptr);
 }
 
 }  // namespace

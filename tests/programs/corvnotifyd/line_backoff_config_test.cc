@@ -4,6 +4,7 @@
 
 #include <chrono>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include "common/json_util.h"
@@ -23,37 +24,33 @@ using testing_support::Sandbox;
 
 // ---- queue lines ----
 
-TEST(QueueLineTest, LinesAreExactJsonThatTheIndexerParses) {
-  std::string out;
-  FormatQueueLine(out, kEventCreate, false, "/v/s/a.txt");
-  EXPECT_EQ(out, "{\"event\":64,\"is_dir\":false,\"path\":\"/v/s/a.txt\"}\n");
-  out.clear();
-  FormatQueueLine(out, kEventRename, true, "/v/s/new", "/v/s/old");
-  EXPECT_EQ(out, "{\"event\":256,\"is_dir\":true,\"path\":\"/v/s/new\",\"path_old\":\"/v/s/old\"}\n");
-  out.pop_back();
-  const fileindex::Event event(out);
-  EXPECT_EQ(event.event, static_cast<uint32_t>(kEventRename));
-  EXPECT_TRUE(event.is_dir);
-  EXPECT_EQ(event.path, "/v/s/new");
-  EXPECT_EQ(event.path_old, "/v/s/old");
-  EXPECT_TRUE(event.data.isNull());
-}
-
-TEST(QueueLineTest, AwkwardNamesSurviveTheJsonReaderByteForByte) {
-  // Quotes, backslashes, a newline, a control byte, and bytes that are not UTF-8.
+// Exact JSON on one line, read back byte for byte by the indexer's own line
+// parser, awkward names too: quotes, backslashes, a newline, a control byte,
+// and bytes that are not UTF-8.
+TEST(QueueLineTest, LinesAreExactJsonThatTheIndexerReadsBack) {
   static const char kName[] = "/v/s/q\"b\\n\nt\tc\x01z\xff\xfe\xc3\xa9";
-  const std::string name(kName, sizeof(kName) - 1);
-  std::string out;
-  FormatQueueLine(out, kEventDelete, false, name, "/v/s/\x80old");
-  ASSERT_EQ(out.back(), '\n');
-  EXPECT_EQ(out.find('\n'), out.size() - 1) << "one line only";
-  // Read back by the indexer's own line parser.
-  out.pop_back();
-  const fileindex::Event event(out);
-  EXPECT_EQ(event.path, name);
-  EXPECT_EQ(event.path_old, "/v/s/\x80old");
-  EXPECT_EQ(event.event, 128u);
-  EXPECT_FALSE(event.is_dir);
+  const struct {
+    uint32_t event;
+    bool is_dir;
+    std::string path, old;
+    std::string line;
+  } cases[] = {
+      {kEventCreate, false, "/v/s/a.txt", "", R"({"event":64,"is_dir":false,"path":"/v/s/a.txt"})"},
+      {kEventRename, true, "/v/s/new", "/v/s/old",
+       R"({"event":256,"is_dir":true,"path":"/v/s/new","path_old":"/v/s/old"})"},
+      {kEventDelete, false, std::string(kName, sizeof(kName) - 1), "/v/s/\x80old",
+       "{\"event\":128,\"is_dir\":false,\"path\":\"/v/s/q\\\"b\\\\n\\nt\\tc\\u0001z\xff\xfe\xc3\xa9\","
+       "\"path_old\":\"/v/s/\x80old\"}"},
+  };
+  for (const auto& c : cases) {
+    std::string out;
+    FormatQueueLine(out, c.event, c.is_dir, c.path, c.old);
+    EXPECT_EQ(out, c.line + "\n");
+    const fileindex::Event event(c.line);
+    EXPECT_EQ(std::tie(event.event, event.is_dir, event.path, event.path_old),
+              std::tie(c.event, c.is_dir, c.path, c.old));
+    EXPECT_TRUE(event.data.isNull());
+  }
 }
 
 // ---- back-off of crash markers ----
@@ -67,7 +64,9 @@ class CrashBackoffTest : public ::testing::Test {
   Clock::time_point At(int seconds) const { return t0_ + std::chrono::seconds(seconds); }
 };
 
-TEST_F(CrashBackoffTest, FirstLossIsDueAtOnceAndNothingIsOwedAfter) {
+// The first loss is due at once; losses inside a window wait for its end,
+// and each marker doubles the next window, up to the ceiling.
+TEST_F(CrashBackoffTest, LossesInsideAWindowWaitForItsEndAndDoubleTheNext) {
   EXPECT_FALSE(backoff_.Pending());
   EXPECT_FALSE(backoff_.NextDue().has_value());
   backoff_.OnLoss(At(0));
@@ -75,11 +74,6 @@ TEST_F(CrashBackoffTest, FirstLossIsDueAtOnceAndNothingIsOwedAfter) {
   backoff_.MarkerWritten(At(0));
   EXPECT_FALSE(backoff_.Pending());
   EXPECT_EQ(backoff_.interval(), kBase);
-}
-
-TEST_F(CrashBackoffTest, LossesInsideAWindowWaitForItsEndAndDoubleTheNext) {
-  backoff_.OnLoss(At(0));
-  backoff_.MarkerWritten(At(0));
   backoff_.OnLoss(At(1));
   backoff_.OnLoss(At(2));
   EXPECT_FALSE(backoff_.Due(At(9)));

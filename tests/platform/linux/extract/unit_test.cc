@@ -82,31 +82,26 @@ TEST(FileFields, FolderAndLinkAreDescribedThemselves) {
   EXPECT_FALSE(ReadFileStatus(root.path() + "/missing", &status));
 }
 
-TEST(TextSink, CutsAtTheCapOnACharacterBoundary) {
-  TextSink sink(10);
-  sink.Append("abcdefgh");
-  sink.Append("\xC3\xA9\xC3\xA9");  // two 2-byte characters: only one fits
-  EXPECT_TRUE(sink.full());
-  EXPECT_EQ("abcdefgh\xC3\xA9", sink.text());
-  sink.Append("more");
-  EXPECT_EQ("abcdefgh\xC3\xA9", sink.text());
-}
-
-TEST(TextSink, RepairsInvalidUtf8AndControlCharacters) {
+// The sink cuts at the cap on a character boundary, repairs invalid UTF-8
+// and control characters, collapses breaks and drops trailing blanks.
+TEST(TextSink, CutsRepairsAndTrims) {
+  TextSink capped(10);
+  capped.Append("abcdefgh");
+  capped.Append("\xC3\xA9\xC3\xA9");  // two 2-byte characters: only one fits
+  EXPECT_TRUE(capped.full());
+  capped.Append("more");
+  EXPECT_EQ("abcdefgh\xC3\xA9", capped.text());
   TextSink sink;
   sink.Append(std::string("a\xFF" "b\xC3" "c\x01" "d\x00" "e\xED\xA0\x80" "f\tg\n", 16));
   EXPECT_EQ("a\xEF\xBF\xBD" "b\xEF\xBF\xBD" "c d e\xEF\xBF\xBD\xEF\xBF\xBD\xEF\xBF\xBD" "f\tg\n", sink.text());
   EXPECT_EQ("x y", CleanUtf8("  x y \n"));
-}
-
-TEST(TextSink, BreaksCollapseAndTrailingBlanksGo) {
-  TextSink sink;
-  sink.Break();
-  sink.Append("one  ");
-  sink.Break();
-  sink.Break();
-  sink.Append("two");
-  EXPECT_EQ("one\ntwo", sink.Trimmed());
+  TextSink lines;
+  lines.Break();
+  lines.Append("one  ");
+  lines.Break();
+  lines.Break();
+  lines.Append("two");
+  EXPECT_EQ("one\ntwo", lines.Trimmed());
 }
 
 TEST(Encoding, ConvertsCommonEncodingsToUtf8) {

@@ -9,6 +9,7 @@
 
 #include <chrono>
 #include <cstdlib>
+#include <map>
 #include <thread>
 #include <vector>
 
@@ -19,8 +20,10 @@
 #include "platform/linux/extract/worker_client.h"
 #include "platform/linux/extract/worker_protocol.h"
 #include "platform/linux/linux_platform.h"
+#include "tests/platform/linux/extract/expect_fields.h"
 #include "tests/support/extract_samples.h"
 #include "tests/support/child_process.h"
+#include "tests/support/expect_error.h"
 #include "tests/support/frame_client.h"
 #include "tests/support/sandbox.h"
 
@@ -88,12 +91,6 @@ class WorkerTest : public ::testing::Test {
     return document[kFieldExtractionError].asString();
   }
 
-  // Switches the worker's behaviour for the workers started from now on.
-  void UseHook(const char* hook) {
-    setenv("CORVLUMEX_EXTRACT_TEST_HOOK", hook, 1);
-    StopIdleExtractWorkers();
-  }
-
   Sandbox root_{false};
   LinuxPlatform platform_;
   testing_support::LogCapture log_;
@@ -119,16 +116,15 @@ TEST_F(WorkerTest, EveryFormatWholeGivesItsFieldsAndTruncatedOrGarbageFailsAlone
   }
   // The file fields come with the content fields.
   const Json::Value pdf = Parse("whole.pdf", false);
-  EXPECT_EQ(PathOf("whole.pdf"), pdf[kFieldPath].asString());
-  EXPECT_EQ(root_.path(), pdf[kFieldParent].asString());
-  EXPECT_EQ("whole.pdf", pdf[kFieldFSName].asString());
-  EXPECT_EQ("pdf", pdf[kFieldExtension].asString());
-  EXPECT_EQ("Budget", pdf[kFieldTitle].asString());
-  EXPECT_EQ("application/pdf", pdf[kFieldMediaTypes].asString());
+  testing_support::ExpectFields(pdf, {{kFieldPath, JsonToString(PathOf("whole.pdf"))},
+                                      {kFieldParent, JsonToString(root_.path())}, {kFieldFSName, R"("whole.pdf")"},
+                                      {kFieldExtension, R"("pdf")"}, {kFieldTitle, R"("Budget")"},
+                                      {kFieldMediaTypes, R"("application/pdf")"}});
 
   std::string noise;
   unsigned int state = 12345;
   for (int i = 0; i < 40000; ++i) noise += static_cast<char>((state = state * 1103515245 + 12345) >> 16);
+  // Each format whole (with one of its fields), cut short, and as garbage.
   const struct {
     const char* ext;
     const char* field;
@@ -140,22 +136,19 @@ TEST_F(WorkerTest, EveryFormatWholeGivesItsFieldsAndTruncatedOrGarbageFailsAlone
       {"mp3", kFieldTitle, "Tune"}, {"ogg", kFieldTitle, "Tune"}, {"mp4", kFieldCodecs, "mpeg4"},
       {"mkv", kFieldCodecs, "mpeg4"}, {"jpg", kFieldMake, "Nikon"}, {"tif", kFieldMake, "Nikon"},
   };
-  for (const auto& format : formats) {
-    SCOPED_TRACE(format.ext);
-    const std::string whole = std::string("whole.") + format.ext;
-    std::string value = Parse(whole)[format.field].asString();
-    if (std::string(format.ext) == "epub") value = value.substr(0, value.find("\xC2\xA0"));  // the markup's blank
-    EXPECT_EQ(format.value, value);
+  for (const auto& [ext, field, value] : formats) {
+    SCOPED_TRACE(ext);
+    const std::string whole = std::string("whole.") + ext;
+    const std::string got = Parse(whole)[field].asString();
+    EXPECT_EQ(value, got.substr(0, got.find("\xC2\xA0")));  // the e-book markup's blank
     const size_t size = testing_support::ReadBytes(PathOf(whole)).size();
     for (size_t cut : {size / 2, size / 5, static_cast<size_t>(3)}) {
-      const std::string name = "cut" + std::to_string(cut) + "." + format.ext;
+      const std::string name = "cut" + std::to_string(cut) + "." + ext;
       Truncate(PathOf(whole), PathOf(name), cut);
       const Json::Value document = ParsedOrFailed(name);
-      if (!document.isNull()) {
-        EXPECT_EQ(PathOf(name), document[kFieldPath].asString());
-      }
+      if (!document.isNull()) { EXPECT_EQ(PathOf(name), document[kFieldPath].asString()); }
     }
-    const std::string garbage = std::string("garbage.") + format.ext;
+    const std::string garbage = std::string("garbage.") + ext;
     WriteBytes(PathOf(garbage), noise);
     ParsedOrFailed(garbage);
     // Whatever happened, the next file is served.
@@ -166,12 +159,16 @@ TEST_F(WorkerTest, EveryFormatWholeGivesItsFieldsAndTruncatedOrGarbageFailsAlone
 // Text gets the same media type and words whichever process reads it: the
 // indexer itself (a plain-text extension) or the worker (any other name, by
 // its content); Samba's "public.plain-text" searches find files by that
-// type. Run as a program started by hand from the build tree (no ctest
-// variables), whose worker is not beside it.
+// type. Run from ctest, the worker is found in the build folder it names;
+// run as a program started by hand from the build tree (no ctest
+// variables), whose worker is not beside it, the text is still read.
 TEST_F(WorkerTest, TextFilesGetTheirTypeAndWordsWhereverTheyAreRead) {
   const std::string build = std::getenv("FILEINDEX_BUILD_DIR");
+  WriteBytes(PathOf("a.dat"), "alpha");
+  unsetenv("CORVLUMEX_EXTRACT_WORKER");  // FILEINDEX_BUILD_DIR alone, as ctest sets it
+  EXPECT_EQ(build + "/programs/corvcontentextractd/corvcontentextractd", FindWorkerProgram());
+  EXPECT_EQ("alpha", Parse("a.dat")[kFieldTextContent].asString());
   unsetenv("FILEINDEX_BUILD_DIR");
-  unsetenv("CORVLUMEX_EXTRACT_WORKER");
   StopIdleExtractWorkers();
   mkdir(PathOf("empty folder").c_str(), 0755);
   for (const char* name : {"notes.txt", "notes.md", "empty folder/readme", "README", "notes.dat"}) {
@@ -222,40 +219,49 @@ TEST_F(WorkerTest, ThreadsExtractAtTheSameTime) {
   EXPECT_EQ(std::vector<int>(4, 0), wrong);
 }
 
-TEST_F(WorkerTest, TestRunsFindTheirBuildsWorkerWithoutSetUp) {
-  WriteBytes(PathOf("a.dat"), "alpha");
-  unsetenv("CORVLUMEX_EXTRACT_WORKER");  // FILEINDEX_BUILD_DIR alone, as ctest sets it
-  EXPECT_EQ(std::string(std::getenv("FILEINDEX_BUILD_DIR")) + "/programs/corvcontentextractd/corvcontentextractd",
-            FindWorkerProgram());
-  EXPECT_EQ("alpha", Parse("a.dat")[kFieldTextContent].asString());
-}
-
-TEST_F(WorkerTest, ALoopingParserIsStoppedAtTheTimeLimitAndACrashingOneFailsOnlyThatFile) {
-  WriteBytes(PathOf("loop.dat"), "words");
-  setenv("CORVLUMEX_EXTRACT_TIMEOUT_MS", "300", 1);
-  UseHook("spin");
-  const auto start = std::chrono::steady_clock::now();
-  const std::string reason = FailureOf("loop.dat");
-  EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(5));
-  EXPECT_NE(std::string::npos, reason.find("longer than 300 ms")) << reason;
-  EXPECT_EQ(1u, log_.Matching("loop.dat failed: extraction took longer").size());
-  unsetenv("CORVLUMEX_EXTRACT_TIMEOUT_MS");
-  UseHook("crash");
-  EXPECT_NE(std::string::npos, FailureOf("loop.dat").find("signal 11"));
-  UseHook("");
-  EXPECT_EQ("words", Parse("loop.dat")[kFieldTextContent].asString());
-}
-
-TEST_F(WorkerTest, AMemoryHungryParserHitsTheLimit) {
 #if defined(__SANITIZE_ADDRESS__)
-  GTEST_SKIP() << "the sanitizer build runs the worker without an address-space limit";
+constexpr bool kSanitized = true;  // the worker runs without an address-space limit then
+#else
+constexpr bool kSanitized = false;
 #endif
+
+// A parser that loops, crashes, eats memory or tries what the confinement
+// forbids (no network, no new process, no program run, no large file
+// written, root's rights dropped), or no worker at all: the file fails alone,
+// soon, with the reason, and the next file is served.
+TEST_F(WorkerTest, AFileTheWorkerCannotReadFailsAloneWithItsReason) {
   WriteBytes(PathOf("a.dat"), "alpha");
-  setenv("CORVLUMEX_EXTRACT_MEMORY_MB", "256", 1);
-  UseHook("hog");
-  const std::string reason = FailureOf("a.dat");
-  unsetenv("CORVLUMEX_EXTRACT_MEMORY_MB");
-  EXPECT_NE(std::string::npos, reason.find("out of memory (the worker may use 256 MiB)")) << reason;
+  const std::string hook = "CORVLUMEX_EXTRACT_TEST_HOOK";
+  const struct {
+    const char* what;
+    std::map<std::string, std::string> env;
+    std::vector<std::string> reasons;
+    bool needs_memory_limit = false;
+  } cases[] = {
+      {"a looping parser", {{hook, "spin"}, {"CORVLUMEX_EXTRACT_TIMEOUT_MS", "300"}}, {"longer than 300 ms"}},
+      {"a crashing parser", {{hook, "crash"}}, {"signal 11"}},
+      {"a memory-hungry parser", {{hook, "hog"}, {"CORVLUMEX_EXTRACT_MEMORY_MB", "256"}},
+       {"out of memory (the worker may use 256 MiB)"}, true},
+      {"a parser trying what it may not", {{hook, "probe"}},
+       {"socket: Operation not permitted", "fork: Operation not permitted", "exec: Operation not permitted",
+        "write file: File too large", getuid() == 0 ? "uid 65534" : "Operation not permitted"}},
+      {"no worker program", {{"CORVLUMEX_EXTRACT_WORKER", PathOf("no-such-worker")}},
+       {"corvcontentextractd was not found"}},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.what);
+    if (kSanitized && c.needs_memory_limit) continue;
+    for (const auto& [name, value] : c.env) setenv(name.c_str(), value.c_str(), 1);
+    StopIdleExtractWorkers();  // the settings count for the workers started from now on
+    const auto start = std::chrono::steady_clock::now();
+    const std::string reason = FailureOf("a.dat");
+    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(5));
+    for (const std::string& words : c.reasons) EXPECT_NE(std::string::npos, reason.find(words)) << reason;
+    for (const auto& entry : c.env) unsetenv(entry.first.c_str());
+    SetUp();
+    EXPECT_EQ("alpha", Parse("a.dat")[kFieldTextContent].asString());
+  }
+  EXPECT_EQ(1u, log_.Matching("a.dat failed: extraction took longer").size());
 }
 
 // The worker's own reading of requests, spoken to directly as the library
@@ -315,9 +321,7 @@ TEST_F(WorkerTest, BadRequestsAreAnsweredAndACutOneEndsTheWorkerCleanly) {
 }
 
 TEST_F(WorkerTest, ACompressionBombIsCutNotFollowed) {
-#if defined(__SANITIZE_ADDRESS__)
-  GTEST_SKIP() << "the sanitizer build runs the worker without an address-space limit";
-#endif
+  if (kSanitized) GTEST_SKIP() << "the sanitizer build runs the worker without an address-space limit";
   // 512 MiB of text in a worker that may use 256 MiB: unpacking it whole
   // would kill the worker; cut at the text limit, the text comes through.
   WriteCompressed(PathOf("bomb.txt.zst"), "zst", std::string(512u << 20, 'x'));
@@ -331,41 +335,20 @@ TEST_F(WorkerTest, ACompressionBombIsCutNotFollowed) {
   EXPECT_EQ(1u << 20, document[kFieldTextContent].asString().size());
 }
 
-TEST_F(WorkerTest, TheWorkerIsConfined) {
-  WriteBytes(PathOf("a.dat"), "alpha");
-  UseHook("probe");
-  const std::string reason = FailureOf("a.dat");
-  EXPECT_NE(std::string::npos, reason.find("socket: Operation not permitted")) << reason;
-  EXPECT_NE(std::string::npos, reason.find("fork: Operation not permitted")) << reason;
-  EXPECT_NE(std::string::npos, reason.find("exec: Operation not permitted")) << reason;
-  EXPECT_NE(std::string::npos, reason.find("write file: File too large")) << reason;
-  if (getuid() == 0) {
-    EXPECT_NE(std::string::npos, reason.find("uid 65534")) << reason;
-  }
-}
-
 TEST_F(WorkerTest, UnreadableFileIsAnErrorNamingTheCause) {
   WriteBytes(PathOf("secret.txt"), "hidden");
   ASSERT_EQ(0, chmod(PathOf("secret.txt").c_str(), 0));
   ASSERT_EQ(0, chmod(root_.path().c_str(), 0755));
   // Root reads everything: look at the file as an ordinary user would.
   const bool as_root = geteuid() == 0;
-  if (as_root) {
-    ASSERT_EQ(0, seteuid(65534));
-  }
+  if (as_root) { ASSERT_EQ(0, seteuid(65534)); }
   const std::string reason = FailureOf("secret.txt");
-  if (as_root) {
-    ASSERT_EQ(0, seteuid(0));
-  }
+  if (as_root) { ASSERT_EQ(0, seteuid(0)); }
   EXPECT_NE(std::string::npos, reason.find("cannot open " + PathOf("secret.txt") + ": Permission denied")) << reason;
   // A file that is gone has no document at all.
-  try {
-    Parse("missing.txt");
-    ADD_FAILURE() << "missing.txt gave a document";
-  } catch (const Error& error) {
-    EXPECT_EQ(kErrorParseDocument, error.code);
-    EXPECT_NE(std::string::npos, error.reason.find("No such file or directory")) << error.reason;
-  }
+  const Error gone = testing_support::ErrorOf([&] { Parse("missing.txt"); });
+  EXPECT_EQ(kErrorParseDocument, gone.code);
+  EXPECT_NE(std::string::npos, gone.reason.find("No such file or directory")) << gone.reason;
 }
 
 TEST_F(WorkerTest, LinksPipesAndFoldersAreNotOpened) {
@@ -377,12 +360,6 @@ TEST_F(WorkerTest, LinksPipesAndFoldersAreNotOpened) {
   EXPECT_EQ('l', link[kFieldPrivilege].asString()[0]);
   EXPECT_FALSE(Parse("pipe.txt").isMember(kFieldTextContent));
   EXPECT_TRUE(Parse("folder")[kFieldIsDir].asBool());
-}
-
-TEST_F(WorkerTest, AMissingWorkerIsAClearError) {
-  WriteBytes(PathOf("a.dat"), "alpha");
-  setenv("CORVLUMEX_EXTRACT_WORKER", PathOf("no-such-worker").c_str(), 1);
-  EXPECT_NE(std::string::npos, FailureOf("a.dat").find("corvcontentextractd was not found"));
 }
 
 TEST_F(WorkerTest, PrintShowsTheDocumentAsJson) {
