@@ -201,13 +201,12 @@ bool ShareWorker::RunOnce() {
     return false;  // the daemon stops this worker when told; nothing to do meanwhile
   }
   WaitUntilIndexReady();
-  const IndexRules rules(folders, sdk::SDKShare(share_).GetPath());
-  OpApplier applier(share_, rules, progress_, *settle_);
-  applier.SetInterruptCheck([this] { CheckInterrupt(); });
-  applier.SetWalkThreads(options_.walk_threads);
   bool worked = false;
 
   if (status & fileindex::kShareStatusNeedReindex) {
+    const IndexRules rules(folders, sdk::SDKShare(share_).GetPath());
+    OpApplier applier(share_, rules, progress_, *settle_);
+    PrepareApplier(applier);
     progress_.StartBatch(share_, 1);
     const pid_t daemon = LastSearchDaemonPid();
     applier.FullReindex();
@@ -226,6 +225,15 @@ bool ShareWorker::RunOnce() {
   std::vector<std::string> due = settle_->DueNow(now);
   if (!taken_over && due.empty()) return worked;
 
+  // The batch is judged by the folder settings read after the queue was
+  // taken over: a settings change saves the folder file before it queues its
+  // event, so an event in this batch never meets the settings it replaced
+  // (the ones read at the top of this round may be older than the batch).
+  const fileindex::FolderMgr batch_folders;
+  const IndexRules batch_rules(batch_folders, sdk::SDKShare(share_).GetPath());
+  OpApplier batch_applier(share_, batch_rules, progress_, *settle_);
+  PrepareApplier(batch_applier);
+
   const BatchMark mark(queue.GetQueuePathTmp());
   const size_t first = taken_over ? std::min(mark.Load(), ops.size()) : 0;
   progress_.StartBatch(share_, ops.size() + due.size());
@@ -239,11 +247,11 @@ bool ShareWorker::RunOnce() {
     OpApplier lane_applier(share_, lane_rules, progress_, *settle_);
     FreshLane lane(share_, queue_path_, lane_applier, options_.fresh);
     lane.Start();
-    ApplyInSlices(applier, ops, first, mark);
+    ApplyInSlices(batch_applier, ops, first, mark);
   }
   const pid_t daemon = LastSearchDaemonPid();
   for (const std::string& path : due) {
-    applier.UpsertSettled(path);
+    batch_applier.UpsertSettled(path);
     progress_.Done(share_);
   }
   CommitSince(daemon);
@@ -267,6 +275,11 @@ bool ShareWorker::RunOnce() {
   progress_.EndBatch(share_);
   progress_.SetDeferred(share_, settle_->DeferredCount());
   return true;
+}
+
+void ShareWorker::PrepareApplier(OpApplier& applier) {
+  applier.SetInterruptCheck([this] { CheckInterrupt(); });
+  applier.SetWalkThreads(options_.walk_threads);
 }
 
 void ShareWorker::ApplyInSlices(OpApplier& applier, const std::vector<std::shared_ptr<fileindex::OP>>& ops,

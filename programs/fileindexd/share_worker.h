@@ -72,6 +72,8 @@ class ShareWorker {
   // Waits while the search daemon is down or still opening the share's index
   // (after its restart), so that no request of a round meets its busy answer.
   void WaitUntilIndexReady();
+  // Makes a round's applier stop at a pause and walk with the configured threads.
+  void PrepareApplier(OpApplier& applier);
   // Applies the taken-over queue's operations from `first` on, committing
   // and saving how far it got after each slice of work.
   void ApplyInSlices(OpApplier& applier, const std::vector<std::shared_ptr<fileindex::OP>>& ops, size_t first,
