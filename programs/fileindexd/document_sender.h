@@ -38,8 +38,8 @@ class DocumentSender {
     std::string request;  // the request text, as IndexUpsertRequest writes it
   };
   struct Limits {
-    size_t queue_bytes = size_t{4} << 20;
-    size_t batch_bytes = size_t{1} << 20;
+    size_t queue_bytes = size_t{2} << 20;
+    size_t batch_bytes = size_t{512} << 10;
     size_t batch_documents = 64;
   };
   // Sends one batch; throws to stop the sender.

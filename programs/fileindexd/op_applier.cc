@@ -1,5 +1,6 @@
 #include "programs/fileindexd/op_applier.h"
 
+#include <malloc.h>
 #include <sys/stat.h>
 
 #include <atomic>
@@ -38,6 +39,23 @@ long long IntField(const Json::Value& doc, const char* name) {
   const Json::Value& value = doc[name];
   return value.isIntegral() ? value.asInt64() : -1;
 }
+
+// A large document passes through several copies (its JSON value, its
+// text, the answer) on the walk's and the sender's threads; the heap would
+// keep that peak for good. Handing it back costs little beside the request.
+class TrimAfterLargeBatch {
+ public:
+  explicit TrimAfterLargeBatch(size_t bytes) : large_(bytes >= kLargeBatchBytes) {}
+  ~TrimAfterLargeBatch() {
+    if (large_) malloc_trim(0);
+  }
+  TrimAfterLargeBatch(const TrimAfterLargeBatch&) = delete;
+  TrimAfterLargeBatch& operator=(const TrimAfterLargeBatch&) = delete;
+
+ private:
+  static constexpr size_t kLargeBatchBytes = size_t{1} << 20;
+  bool large_;
+};
 
 }  // namespace
 
@@ -402,7 +420,12 @@ void OpApplier::UpsertMany(const std::vector<Pending>& work) {
 void OpApplier::StoreBatch(std::vector<DocumentSender::Document>& batch) {
   std::vector<std::string> requests;
   requests.reserve(batch.size());
-  for (DocumentSender::Document& document : batch) requests.push_back(std::move(document.request));
+  size_t bytes = 0;
+  for (DocumentSender::Document& document : batch) {
+    bytes += document.request.size();
+    requests.push_back(std::move(document.request));
+  }
+  const TrimAfterLargeBatch trim(bytes);
   Json::Value outcomes;
   try {
     outcomes = elastic::SendRequestTexts(requests);
