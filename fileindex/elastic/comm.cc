@@ -118,11 +118,15 @@ Json::Value CompoundOutcomes(const Json::Value& res, size_t count) {
     if (outcome["success"].asBool()) continue;
     const int code = SubAnswerCode(answer);
     const std::string msg = MemberText(Member(Member(answer, "error"), "msg"));
-    if (IsElasticBusyCode(code)) throw Error(static_cast<ErrorCode>(code), msg);
     outcome["error"]["code"] = code;
     outcome["error"]["msg"] = msg;
   }
   return outcomes;
+}
+
+void ThrowIfBusy(const Json::Value& outcome) {
+  const int code = outcome["error"]["code"].asInt();
+  if (IsElasticBusyCode(code)) throw Error(static_cast<ErrorCode>(code), outcome["error"]["msg"].asString());
 }
 
 void SendRequestImpl(Json::Value& res, const Json::Value& req) {
@@ -138,6 +142,7 @@ void SendRequestImpl(Json::Value& res, const Json::Value& req) {
   const Json::Value& requests = req["compound"];
   for (Json::ArrayIndex i = 0; i < outcomes.size(); ++i) {
     if (outcomes[i]["success"].asBool()) continue;
+    ThrowIfBusy(outcomes[i]);
     const Json::Value& sub_request = requests.isArray() && i < requests.size() ? requests[i] : Json::Value::nullSingleton();
     CORV_LOG_FN("Compound failed: %s (%d) %s", JsonToString(sub_request).c_str(), outcomes[i]["error"]["code"].asInt(),
                 outcomes[i]["error"]["msg"].asCString());

@@ -87,10 +87,12 @@ void SendRequestImpl(Json::Value& res, const Json::Value& req);
 void SendRequestTextImpl(Json::Value& res, const std::vector<std::string_view>& parts);
 
 // What became of each of the `count` requests of a compound, from its answer
-// `res`: {"success": true}, or {"success": false, "error": {"code", "msg"}}.
-// Throws the busy error of a busy sub-request (the whole compound is then
-// sent again, as SendRequestImpl does).
+// `res`: {"success": true}, or {"success": false, "error": {"code", "msg"}}
+// (code 0 and an empty message where the answer does not say).
 Json::Value CompoundOutcomes(const Json::Value& res, size_t count);
+// Throws Error(code, msg) when the failed `outcome` is a busy answer: the
+// whole compound is then sent again.
+void ThrowIfBusy(const Json::Value& outcome);
 
 }  // namespace corvlumex
 

@@ -235,6 +235,9 @@ Json::Value SendRequestTexts(const std::vector<std::string>& requests) {
         Json::Value res;
         SendRequestTextImpl(res, parts);
         answers = CompoundOutcomes(res, requests.size());
+        for (const Json::Value& answer : answers) {
+          if (!answer["success"].asBool()) ThrowIfBusy(answer);
+        }
       },
       "compound of " + std::to_string(requests.size()), "");
   return answers;
