@@ -9,6 +9,8 @@
 
 #include <cerrno>
 #include <string>
+#include <string_view>
+#include <vector>
 
 #include "common/export.h"
 
@@ -61,6 +63,12 @@ void BufferWrite(int fd, unsigned int size, const unsigned char* buffer);
 // One frame: 4-byte host-order length (counting a trailing NUL), then the
 // text and the NUL.
 void WriteFrame(int fd, const std::string& text);
+
+// The same frame from pieces written one after the other, as if they were
+// one text: a request made of several written-out documents is not copied
+// into one string first. Written in large system calls (not BufferWrite's
+// kilobyte): a document of megabytes would otherwise take thousands.
+void WriteFrameParts(int fd, const std::vector<std::string_view>& parts);
 
 // The answer a daemon gives to a request it refuses:
 // {"success": false, "error": {"code": code, "msg": message}}.

@@ -7,6 +7,7 @@
 #include <fstream>
 #include <memory>
 #include <sstream>
+#include <streambuf>
 
 #include "common/error.h"
 #include "common/export.h"
@@ -155,11 +156,40 @@ bool JsonToFile(const Json::Value& value, const std::string& path, mode_t mode) 
   return WriteFileAtomically(path, JsonToString(value) + "\n", mode);
 }
 
+namespace {
+
+// Appends what is written to a string: the text is built in place, not in a
+// stream's buffer that is then copied out (a document of megabytes was held
+// twice more while it was written out).
+class StringSink : public std::streambuf {
+ public:
+  explicit StringSink(std::string& out) : out_(out) {}
+
+ protected:
+  std::streamsize xsputn(const char* bytes, std::streamsize count) override {
+    out_.append(bytes, static_cast<size_t>(count));
+    return count;
+  }
+  int_type overflow(int_type c) override {
+    if (!traits_type::eq_int_type(c, traits_type::eof())) out_.push_back(traits_type::to_char_type(c));
+    return traits_type::not_eof(c);
+  }
+
+ private:
+  std::string& out_;
+};
+
+}  // namespace
+
 std::string JsonToString(const Json::Value& value) {
   Json::StreamWriterBuilder builder;
   builder["indentation"] = "";
   builder["emitUTF8"] = true;
-  return Json::writeString(builder, value);
+  std::string text;
+  StringSink sink(text);
+  std::ostream stream(&sink);
+  std::unique_ptr<Json::StreamWriter>(builder.newStreamWriter())->write(value, &stream);
+  return text;
 }
 
 }  // namespace corvlumex

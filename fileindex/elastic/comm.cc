@@ -70,14 +70,17 @@ pid_t LastSearchDaemonPid() { return last_daemon_pid.load(); }
 
 std::string ElasticSocketPath() { return SysPath("/var/run/corvelasticd.sock"); }
 
-void SendRequestImpl(Json::Value& res, const Json::Value& req) {
+namespace {
+
+// The exchange itself; named like the public function, since its log lines
+// name the function they come from.
+void SendRequestImpl(Json::Value& res, const std::vector<std::string_view>& parts) {
   const std::string path = ElasticSocketPath();
   WaitForSocketFile(path);
 
   corvdaemon::DomainSockConnection conn(path);
   CORV_CHECK_THROW(!conn.Connect(), kErrorSearchRequest, "Connect failed");
-  CORV_CHECK_THROW_TEXT(!conn.Send(JsonToString(req)), "!conn.Send(req.toString())", kErrorSearchRequest,
-                        "Send failed");
+  CORV_CHECK_THROW_TEXT(!conn.SendParts(parts), "!conn.Send(req.toString())", kErrorSearchRequest, "Send failed");
   std::string resp_raw;
   CORV_CHECK_THROW_TEXT(!conn.Recv(resp_raw) || !JsonFromString(res, resp_raw) || !res.isObject() ||
                             !res.isMember("success") || !res["success"].isBool(),
@@ -96,19 +99,53 @@ void SendRequestImpl(Json::Value& res, const Json::Value& req) {
     GetJsonValue(msg, answer["error"], "msg", true);
     throw Error(static_cast<ErrorCode>(code), "Request failed, msg=" + msg);
   }
+}
+
+}  // namespace
+
+void SendRequestTextImpl(Json::Value& res, const std::vector<std::string_view>& parts) { SendRequestImpl(res, parts); }
+
+Json::Value CompoundOutcomes(const Json::Value& res, size_t count) {
+  // A compound answer that reports no failure may leave its sub-answers out.
+  const Json::Value& has_fail = Member(res, "has_fail");
+  const bool any_failed = has_fail.isBool() && has_fail.asBool();
+  const Json::Value& answers = Member(res, "data");
+  Json::Value outcomes(Json::arrayValue);
+  for (Json::ArrayIndex i = 0; i < count; ++i) {
+    Json::Value& outcome = outcomes.append(Json::Value(Json::objectValue));
+    const Json::Value& answer = answers.isArray() && i < answers.size() ? answers[i] : Json::Value::nullSingleton();
+    outcome["success"] = !any_failed || SubAnswerSucceeded(answer);
+    if (outcome["success"].asBool()) continue;
+    const int code = SubAnswerCode(answer);
+    const std::string msg = MemberText(Member(Member(answer, "error"), "msg"));
+    outcome["error"]["code"] = code;
+    outcome["error"]["msg"] = msg;
+  }
+  return outcomes;
+}
+
+void ThrowIfBusy(const Json::Value& outcome) {
+  const int code = outcome["error"]["code"].asInt();
+  if (IsElasticBusyCode(code)) throw Error(static_cast<ErrorCode>(code), outcome["error"]["msg"].asString());
+}
+
+void SendRequestImpl(Json::Value& res, const Json::Value& req) {
+  const std::string text = JsonToString(req);
+  const std::vector<std::string_view> parts = {text};
+  SendRequestImpl(res, parts);
+  const Json::Value& answer = res;
   if (!CompoundHasFailure(req, answer)) return;
 
   // A busy sub-request fails the whole request, so that it is sent again;
   // any other failed sub-request is only logged.
-  const Json::Value& answers = answer["data"];
+  const Json::Value outcomes = CompoundOutcomes(answer, answer["data"].size());
   const Json::Value& requests = req["compound"];
-  for (Json::ArrayIndex i = 0; i < answers.size(); ++i) {
-    if (SubAnswerSucceeded(answers[i])) continue;
-    const int code = SubAnswerCode(answers[i]);
-    const std::string msg = MemberText(Member(Member(answers[i], "error"), "msg"));
-    if (IsElasticBusyCode(code)) throw Error(static_cast<ErrorCode>(code), msg);
+  for (Json::ArrayIndex i = 0; i < outcomes.size(); ++i) {
+    if (outcomes[i]["success"].asBool()) continue;
+    ThrowIfBusy(outcomes[i]);
     const Json::Value& sub_request = requests.isArray() && i < requests.size() ? requests[i] : Json::Value::nullSingleton();
-    CORV_LOG_FN("Compound failed: %s (%d) %s", JsonToString(sub_request).c_str(), code, msg.c_str());
+    CORV_LOG_FN("Compound failed: %s (%d) %s", JsonToString(sub_request).c_str(), outcomes[i]["error"]["code"].asInt(),
+                outcomes[i]["error"]["msg"].asCString());
   }
 }
 
@@ -120,11 +157,13 @@ SockConnection::~SockConnection() {
   if (fd_ >= 0) close(fd_);
 }
 
-bool SockConnection::Send(const std::string& text) {
+bool SockConnection::Send(const std::string& text) { return SendParts({text}); }
+
+bool SockConnection::SendParts(const std::vector<std::string_view>& parts) {
   if (fd_ < 0) return false;
   const corvlumex::SigpipeBlock no_sigpipe;
   try {
-    corvlumex::WriteFrame(fd_, text);
+    corvlumex::WriteFrameParts(fd_, parts);
   } catch (const corvlumex::Error&) {
     return false;
   }

@@ -7,6 +7,8 @@
 #include <sys/types.h>
 
 #include <string>
+#include <string_view>
+#include <vector>
 
 #include "common/export.h"
 #include "fileindex/elastic/daemon_codes.h"
@@ -47,6 +49,8 @@ class SockConnection {
   // must not wait for ever on an answer nobody will finish.
   static constexpr int kAnswerStallMs = 30000;
   bool Send(const std::string& text);
+  // One frame whose text is `parts` one after the other.
+  bool SendParts(const std::vector<std::string_view>& parts);
   bool Recv(std::string& text, int stall_ms = kAnswerStallMs);
 
  protected:
@@ -75,6 +79,20 @@ namespace corvlumex {
 // it reports a failure (1400/1401 when busy, also for a busy sub-request of a
 // compound request), 120 when that failure lacks its "code" or "msg".
 void SendRequestImpl(Json::Value& res, const Json::Value& req);
+
+// The exchange of SendRequestImpl for a request already written out, sent as
+// `parts` one after the other (a compound of written-out documents is not
+// copied into one text). The same errors, except that a compound answer's
+// sub-answers are left to the caller.
+void SendRequestTextImpl(Json::Value& res, const std::vector<std::string_view>& parts);
+
+// What became of each of the `count` requests of a compound, from its answer
+// `res`: {"success": true}, or {"success": false, "error": {"code", "msg"}}
+// (code 0 and an empty message where the answer does not say).
+Json::Value CompoundOutcomes(const Json::Value& res, size_t count);
+// Throws Error(code, msg) when the failed `outcome` is a busy answer: the
+// whole compound is then sent again.
+void ThrowIfBusy(const Json::Value& outcome);
 
 }  // namespace corvlumex
 

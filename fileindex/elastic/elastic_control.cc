@@ -89,12 +89,42 @@ Json::Value ExtractDocument(const std::string& path, bool need_meta) {
 }
 
 // The document is moved into the request: a large text is held once less.
-void SendDocument(const std::string& command, const std::string& share, const std::string& path,
-                  Json::Value document) {
+Json::Value DocumentRequest(const std::string& command, const std::string& share, const std::string& path,
+                            Json::Value document) {
   Json::Value req = MakeRequest(command, share);
   req["data"]["doc_id"] = path;
   req["data"]["data"] = std::move(document);
-  SendRequestNoResult(req);
+  return req;
+}
+
+void SendDocument(const std::string& command, const std::string& share, const std::string& path,
+                  Json::Value document) {
+  SendRequestNoResult(DocumentRequest(command, share, path, std::move(document)));
+}
+
+// Calls `attempt` until it does not fail with a busy code, sleeping 15 to 19
+// minutes between attempts; after the 10th retry the administrators are
+// told, once, that memory is lacking.
+template <typename Attempt>
+void RetryWhileBusy(const Attempt& attempt, const std::string& command, const std::string& db) {
+  unsigned int retry = 0;
+  bool notified = false;
+  for (;;) {
+    try {
+      attempt();
+      return;
+    } catch (const Error& error) {
+      if (!IsElasticBusyCode(error.code)) throw error;
+      CORV_LOG("Retry[%u] since corvelasticd is busy. Command: %s, db: %s", retry, command.c_str(), db.c_str());
+    }
+    ++retry;
+    if (retry > kBusyRetriesBeforeNotice && !notified) {
+      NotifyLackOfMemory();
+      notified = true;
+    }
+    // Spread the retries of several waiting callers apart.
+    SleepFor(std::chrono::seconds(900 + 60 * (rand() % 5)));
+  }
 }
 
 }  // namespace
@@ -102,25 +132,7 @@ void SendDocument(const std::string& command, const std::string& share, const st
 std::string GetFileIndexID(const std::string& share_name) { return "fileindex_" + share_name; }
 
 void SendRequestWithRetry(Json::Value& res, const Json::Value& req) {
-  unsigned int attempt = 0;
-  bool notified = false;
-  for (;;) {
-    try {
-      SendRequestImpl(res, req);
-      return;
-    } catch (const Error& error) {
-      if (!IsElasticBusyCode(error.code)) throw error;
-      CORV_LOG("Retry[%u] since corvelasticd is busy. Command: %s, db: %s", attempt,
-               req["command"].asString().c_str(), req["data"]["id"].asString().c_str());
-    }
-    ++attempt;
-    if (attempt > kBusyRetriesBeforeNotice && !notified) {
-      NotifyLackOfMemory();
-      notified = true;
-    }
-    // Spread the retries of several waiting callers apart.
-    SleepFor(std::chrono::seconds(900 + 60 * (rand() % 5)));
-  }
+  RetryWhileBusy([&] { SendRequestImpl(res, req); }, req["command"].asString(), req["data"]["id"].asString());
 }
 
 void SendRequestWithPatience(Json::Value& res, const Json::Value& req, std::chrono::milliseconds patience) {
@@ -201,6 +213,34 @@ void IndexDelDir(const std::string& share, const std::string& path) {
 
 void IndexUpsert(const std::string& share, const std::string& path, bool need_meta) {
   SendDocument("document_upsert_by_id", share, path, ExtractDocument(path, need_meta));
+}
+
+std::string IndexUpsertRequest(const std::string& share, const std::string& path, bool need_meta) {
+  return JsonToString(DocumentRequest("document_upsert_by_id", share, path, ExtractDocument(path, need_meta)));
+}
+
+Json::Value SendRequestTexts(const std::vector<std::string>& requests) {
+  Json::Value answers(Json::arrayValue);
+  if (requests.empty()) return answers;
+  std::vector<std::string_view> parts;
+  parts.reserve(2 * requests.size() + 1);
+  parts.emplace_back("{\"compound\":[");
+  for (const std::string& request : requests) {
+    if (parts.size() > 1) parts.emplace_back(",");
+    parts.emplace_back(request);
+  }
+  parts.emplace_back("]}");
+  RetryWhileBusy(
+      [&] {
+        Json::Value res;
+        SendRequestTextImpl(res, parts);
+        answers = CompoundOutcomes(res, requests.size());
+        for (const Json::Value& answer : answers) {
+          if (!answer["success"].asBool()) ThrowIfBusy(answer);
+        }
+      },
+      "compound of " + std::to_string(requests.size()), "");
+  return answers;
 }
 
 void IndexAttr(const std::string& share, const std::string& path) {

@@ -59,6 +59,16 @@ void IndexDelDir(const std::string& share, const std::string& path);
 // Extracts the file's fields (with its metadata when `need_meta`) and
 // stores them; Error 914 when the file cannot be extracted.
 void IndexUpsert(const std::string& share, const std::string& path, bool need_meta);
+// IndexUpsert's request, extracted and written out as text: the document's
+// JSON value is gone before the text waits to be sent, so a large text is
+// held once. Error 914 when the file cannot be extracted.
+std::string IndexUpsertRequest(const std::string& share, const std::string& path, bool need_meta);
+// Sends requests written out as text (IndexUpsertRequest's) in one compound
+// exchange, retrying the whole while the daemon is busy, as
+// SendRequestWithRetry does. Returns one answer per request, in order, each
+// an object with a bool "success" and, when false, "error" {"code", "msg"}.
+// A failure of the exchange itself is thrown.
+Json::Value SendRequestTexts(const std::vector<std::string>& requests);
 // Updates the file-system fields of an existing document.
 void IndexAttr(const std::string& share, const std::string& path);
 // Rewrites the path fields of the document at `path_from` and of every

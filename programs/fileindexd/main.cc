@@ -1,5 +1,6 @@
 // fileindexd: the indexing daemon. Serves the command socket and runs one
 // worker per indexed share until SIGTERM or SIGINT.
+#include <malloc.h>
 #include <signal.h>
 #include <unistd.h>
 
@@ -53,6 +54,10 @@ int main(int argc, char** argv) {
   corvlumex::fileindex::log_level = debug ? 7 : 6;
   if (log_stderr) LogToStderr("fileindexd");
   signal(SIGPIPE, SIG_IGN);
+  // A walk's threads (extraction, sending, the fresh lane) would each get a
+  // heap of their own, each keeping the peak of the largest document that
+  // passed through it; the work is bound by the search daemon, not by malloc.
+  mallopt(M_ARENA_MAX, 2);
 
   WorkerOptions options;
   options.fallback_poll = std::chrono::milliseconds(poll_ms);

@@ -1,5 +1,6 @@
 #include "programs/fileindexd/op_applier.h"
 
+#include <malloc.h>
 #include <sys/stat.h>
 
 #include <atomic>
@@ -38,6 +39,23 @@ long long IntField(const Json::Value& doc, const char* name) {
   const Json::Value& value = doc[name];
   return value.isIntegral() ? value.asInt64() : -1;
 }
+
+// A large document passes through several copies (its JSON value, its
+// text, the answer) on the walk's and the sender's threads; the heap would
+// keep that peak for good. Handing it back costs little beside the request.
+class TrimAfterLargeBatch {
+ public:
+  explicit TrimAfterLargeBatch(size_t bytes) : large_(bytes >= kLargeBatchBytes) {}
+  ~TrimAfterLargeBatch() {
+    if (large_) malloc_trim(0);
+  }
+  TrimAfterLargeBatch(const TrimAfterLargeBatch&) = delete;
+  TrimAfterLargeBatch& operator=(const TrimAfterLargeBatch&) = delete;
+
+ private:
+  static constexpr size_t kLargeBatchBytes = size_t{1} << 20;
+  bool large_;
+};
 
 }  // namespace
 
@@ -362,6 +380,7 @@ void OpApplier::UpdateCfg(const std::string& path, const Json::Value& changed) {
 }
 
 void OpApplier::UpsertMany(const std::vector<Pending>& work) {
+  DocumentSender sender([this](std::vector<DocumentSender::Document>& batch) { StoreBatch(batch); });
   std::atomic<size_t> next{0};
   std::atomic<bool> stop{false};
   std::mutex mutex;
@@ -370,8 +389,12 @@ void OpApplier::UpsertMany(const std::vector<Pending>& work) {
     try {
       for (size_t i = next++; !stop && i < work.size(); i = next++) {
         CheckInterrupt();
-        UpsertFile(work[i].path, work[i].need_meta, false);
-        progress_.Done(share_);
+        bool queued = false;
+        RunOrSkipFile("upsert", work[i].path, [&] {
+          sender.Push({work[i].path, elastic::IndexUpsertRequest(share_, work[i].path, work[i].need_meta)});
+          queued = true;
+        });
+        if (!queued) progress_.Done(share_);  // a queued one counts once it is stored
       }
     } catch (...) {
       std::lock_guard<std::mutex> lock(mutex);
@@ -384,7 +407,49 @@ void OpApplier::UpsertMany(const std::vector<Pending>& work) {
   for (size_t i = 1; i < threads; ++i) helpers.emplace_back(run);
   run();
   for (std::thread& helper : helpers) helper.join();
+  // What was extracted is stored also when the walk was interrupted: the
+  // commit before a pause then makes it visible.
+  try {
+    sender.Finish();
+  } catch (...) {
+    if (!first_failure) first_failure = std::current_exception();
+  }
   if (first_failure) std::rethrow_exception(first_failure);
+}
+
+void OpApplier::StoreBatch(std::vector<DocumentSender::Document>& batch) {
+  std::vector<std::string> requests;
+  requests.reserve(batch.size());
+  size_t bytes = 0;
+  for (DocumentSender::Document& document : batch) {
+    bytes += document.request.size();
+    requests.push_back(std::move(document.request));
+  }
+  const TrimAfterLargeBatch trim(bytes);
+  Json::Value outcomes;
+  try {
+    outcomes = elastic::SendRequestTexts(requests);
+  } catch (const Error& error) {
+    if (IsBatchError(error)) throw;
+    // The daemon refused the compound as a whole: each file of it failed so.
+    for (DocumentSender::Document& document : batch) {
+      RunOrSkipFile("upsert", document.path, [&] { throw error; });
+      progress_.Done(share_);
+    }
+    return;
+  }
+  requests.clear();
+  for (Json::ArrayIndex i = 0; i < batch.size(); ++i) {
+    RunOrSkipFile("upsert", batch[i].path, [&] {
+      const Json::Value& outcome = outcomes[i];
+      if (!outcome["success"].asBool()) {
+        throw Error(static_cast<ErrorCode>(outcome["error"]["code"].asInt()),
+                    "Request failed, msg=" + outcome["error"]["msg"].asString());
+      }
+      progress_.Extracted(share_);
+    });
+    progress_.Done(share_);
+  }
 }
 
 void OpApplier::FullReindex() {

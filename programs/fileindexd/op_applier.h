@@ -29,6 +29,7 @@
 
 #include "common/error.h"
 #include "fileindex/queue/optree.h"
+#include "programs/fileindexd/document_sender.h"
 #include "programs/fileindexd/index_rules.h"
 #include "programs/fileindexd/progress.h"
 #include "programs/fileindexd/settle_tracker.h"
@@ -95,9 +96,14 @@ class OpApplier {
     std::string path;
     bool need_meta = false;
   };
-  // Upserts the files a walk found, on walk_threads_ threads; each counts
-  // as done. The first batch error or interruption stops them all and leaves.
+  // Upserts the files a walk found: extracted on walk_threads_ threads and
+  // stored, several to a request, by a DocumentSender meanwhile; each counts
+  // as done. The first batch error or interruption stops them all and leaves
+  // (after what was extracted is stored, when it was an interruption).
   void UpsertMany(const std::vector<Pending>& work);
+  // Stores one batch of the sender; a file the daemon refuses is logged,
+  // counted and skipped, a batch error goes on up.
+  void StoreBatch(std::vector<DocumentSender::Document>& batch);
   void DeleteTree(const std::string& path);
   void DeleteDocument(const std::string& path);
   // Walks `roots` and makes the documents below `index_prefix` match them.

@@ -262,12 +262,18 @@ TEST_F(OpApplierTest, AReindexStoresWhatChangedAndDeletesWhatIsGone) {
   daemon_.Enqueue(FakeAnswer::Success(listed));
   applier_->SetWalkThreads(2);
   applier_->Reindex(Docs("sub"));
-  Lines commands = Sent();
-  ASSERT_EQ(commands.size(), 4u);
-  std::sort(commands.begin() + 1, commands.begin() + 3);  // the walk's upserts run on two threads
-  EXPECT_EQ(commands, (Lines{"document_get_by_query " + Docs("sub") + "/", "document_upsert_by_id " + Docs("sub"),
-                             "document_upsert_by_id " + Docs("sub/new.c"),
-                             "document_del_by_id " + Docs("sub/stale.c")}));
+  const Lines commands = Sent();
+  ASSERT_GE(commands.size(), 3u);
+  EXPECT_EQ(commands.front(), "document_get_by_query " + Docs("sub") + "/");
+  EXPECT_EQ(commands.back(), "document_del_by_id " + Docs("sub/stale.c"));
+  Lines upserts;  // the walk's upserts travel in compounds, from two threads
+  for (const Json::Value& request : daemon_.Requests()) {
+    for (const Json::Value& element : request["compound"]) {
+      upserts.push_back(element["command"].asString() + " " + element["data"]["doc_id"].asString());
+    }
+  }
+  std::sort(upserts.begin(), upserts.end());
+  EXPECT_EQ(upserts, Lines({"document_upsert_by_id " + Docs("sub"), "document_upsert_by_id " + Docs("sub/new.c")}));
 }
 
 TEST_F(OpApplierTest, OneFileFailsAloneButAnIndexFailureStopsTheBatch) {

@@ -1,0 +1,259 @@
+// The walk's documents go to the search daemon on a sender thread, several to
+// a request: the queue between extraction and sending is bounded, keeps
+// order, loses nothing, and a failure of the daemon stops the walk; per file,
+// a document the daemon refuses is counted failed and the others are stored.
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <atomic>
+#include <chrono>
+#include <condition_variable>
+#include <filesystem>
+#include <memory>
+#include <mutex>
+#include <stdexcept>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "common/error.h"
+#include "fileindex/elastic/daemon_codes.h"
+#include "fileindex/state/folder_mgr.h"
+#include "programs/fileindexd/document_sender.h"
+#include "programs/fileindexd/index_rules.h"
+#include "programs/fileindexd/op_applier.h"
+#include "programs/fileindexd/progress.h"
+#include "programs/fileindexd/settle_tracker.h"
+#include "tests/fileindex/elastic/fake_search_daemon.h"
+#include "tests/support/fake_platform.h"
+#include "tests/support/log_capture.h"
+#include "tests/support/sandbox.h"
+
+namespace corvlumex {
+namespace fileindexd {
+namespace {
+namespace fs = std::filesystem;
+using Document = DocumentSender::Document;
+using testing_support::FakeAnswer;
+
+// Polls `done` for up to 30 s.
+bool Eventually(const std::function<bool()>& done) {
+  const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(30);
+  while (!done()) {
+    if (std::chrono::steady_clock::now() > deadline) return false;
+    std::this_thread::sleep_for(std::chrono::milliseconds(2));
+  }
+  return true;
+}
+
+Document Doc(int number, size_t size) { return Document{"/f" + std::to_string(number), std::string(size, 'x')}; }
+
+// Records the batches handed to it; holds each one while `hold` is set.
+struct RecordingSend {
+  std::mutex mutex;
+  std::condition_variable released;
+  bool hold = false;
+  std::vector<std::vector<std::string>> batches;  // paths
+  std::vector<size_t> batch_bytes;
+
+  DocumentSender::SendBatch Callback() {
+    return [this](std::vector<Document>& batch) {
+      std::unique_lock<std::mutex> lock(mutex);
+      std::vector<std::string> paths;
+      size_t bytes = 0;
+      for (const Document& document : batch) {
+        paths.push_back(document.path);
+        bytes += document.request.size();
+      }
+      batches.push_back(paths);
+      batch_bytes.push_back(bytes);
+      released.wait(lock, [this] { return !hold; });
+    };
+  }
+  void Release() {
+    {
+      std::lock_guard<std::mutex> lock(mutex);
+      hold = false;
+    }
+    released.notify_all();
+  }
+  size_t Batches() {
+    std::lock_guard<std::mutex> lock(mutex);
+    return batches.size();
+  }
+};
+
+TEST(DocumentSenderTest, EveryDocumentIsSentInOrderInBoundedBatches) {
+  const DocumentSender::Limits limits{1000, 300, 4};
+  struct Case {
+    const char* name;
+    std::vector<size_t> sizes;
+    int pushed_while_held;  // pushes that return while the first batch is out
+    size_t batches;         // how many batches in all; 0: not fixed
+  };
+  const Case cases[] = {
+      {"small documents wait in the queue and go four at a time", std::vector<size_t>(50, 10), 50, 1 + 13},
+      {"larger ones fill the queue, then wait for room", std::vector<size_t>(30, 120), 1 + 8, 0},
+      {"one larger than the queue waits for it to empty and travels alone", {50, 2000, 50, 50, 301, 10}, 2, 0},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    RecordingSend recorder;
+    recorder.hold = true;
+    std::atomic<int> pushed{0};
+    {
+      DocumentSender sender(recorder.Callback(), limits);
+      std::thread walker([&] {
+        for (size_t i = 0; i < c.sizes.size(); ++i) {
+          sender.Push(Doc(static_cast<int>(i), c.sizes[i]));
+          ++pushed;
+          if (i == 0) Eventually([&] { return recorder.Batches() == 1; });  // the first goes out alone
+        }
+      });
+      EXPECT_TRUE(Eventually([&] { return recorder.Batches() == 1 && pushed == c.pushed_while_held; }));
+      if (pushed < static_cast<int>(c.sizes.size())) {
+        std::this_thread::sleep_for(std::chrono::milliseconds(100));
+        EXPECT_EQ(pushed, c.pushed_while_held) << "the queue took more than its bound";
+      }
+      recorder.Release();
+      walker.join();
+      sender.Finish();
+    }
+    std::vector<std::string> sent;
+    for (size_t b = 0; b < recorder.batches.size(); ++b) {
+      const auto& batch = recorder.batches[b];
+      EXPECT_LE(batch.size(), limits.batch_documents);
+      if (batch.size() > 1) {
+        EXPECT_LE(recorder.batch_bytes[b], limits.batch_bytes);
+      }
+      sent.insert(sent.end(), batch.begin(), batch.end());
+    }
+    std::vector<std::string> pushed_paths;
+    for (size_t i = 0; i < c.sizes.size(); ++i) pushed_paths.push_back("/f" + std::to_string(i));
+    EXPECT_EQ(sent, pushed_paths);
+    if (c.batches != 0) {
+      EXPECT_EQ(recorder.batches.size(), c.batches);
+    }
+  }
+}
+
+TEST(DocumentSenderTest, AFailedSendStopsThePushesAndTheFinish) {
+  std::atomic<int> calls{0};
+  DocumentSender sender(
+      [&](std::vector<Document>&) {
+        if (++calls == 2) throw Error(static_cast<ErrorCode>(elasticd::kCodeIndexNotFound), "no index");
+      },
+      DocumentSender::Limits{1000, 100, 1});
+  const auto code_of = [](const std::function<void()>& step) { return testing_support::ErrorOrNone(step).code; };
+  sender.Push(Doc(0, 10));
+  sender.Push(Doc(1, 10));
+  ASSERT_TRUE(Eventually([&] { return calls == 2; }));
+  int refused = 0;
+  EXPECT_TRUE(Eventually([&] { return (refused = code_of([&] { sender.Push(Doc(2, 10)); })) != 0; }));
+  EXPECT_EQ(refused, elasticd::kCodeIndexNotFound);
+  EXPECT_EQ(code_of([&] { sender.Finish(); }), elasticd::kCodeIndexNotFound);
+  EXPECT_EQ(calls, 2) << "nothing is sent after a failure";
+}
+
+// A folder walk against a scripted search daemon: its documents travel as
+// compounds, and the answer of each element counts.
+class WalkSendTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    platform_->ParseFileHook = [](const std::string& path, const Json::Value&, Json::Value& document) {
+      document["CORVMDPath"] = path;
+      document["CORVMDFSName"] = fs::path(path).filename().string();
+    };
+    share_ = root_.AddShare("share");
+    root_.MakeDir("volume1/share/docs/sub");
+    for (int i = 0; i < 20; ++i) root_.WriteFile("volume1/share/docs/sub/f" + std::to_string(i) + ".c", "x");
+    root_.WriteFile("var/packages/CorvLumex/etc/fileindex.folders",
+                    R"([{"path": "/share/docs", "name": "docs", "document": true, "audio": true, "video": true, "photo": true}])");
+    folders_ = std::make_unique<fileindex::FolderMgr>();
+    rules_ = std::make_unique<IndexRules>(*folders_, share_);
+    settle_ = std::make_unique<SettleTracker>(root_.path() + "/settle", SettleOptions());
+    applier_ = std::make_unique<OpApplier>("share", *rules_, progress_, *settle_);
+    applier_->SetWalkThreads(2);
+  }
+
+  // The paths of the upserts the daemon received, and how many requests carried them.
+  std::vector<std::string> Upserted(size_t* requests) const {
+    std::vector<std::string> paths;
+    *requests = 0;
+    for (const Json::Value& request : daemon_.Requests()) {
+      if (!request.isMember("compound")) continue;
+      ++*requests;
+      for (const Json::Value& element : request["compound"]) {
+        if (element["command"] == "document_upsert_by_id") paths.push_back(element["data"]["doc_id"].asString());
+      }
+    }
+    return paths;
+  }
+
+  testing_support::Sandbox root_;
+  testing_support::ScopedFakePlatform platform_;
+  testing_support::LogCapture log_;
+  testing_support::FakeSearchDaemon daemon_;
+  std::string share_;
+  std::unique_ptr<fileindex::FolderMgr> folders_;
+  std::unique_ptr<IndexRules> rules_;
+  ProgressBoard progress_;
+  std::unique_ptr<SettleTracker> settle_;
+  std::unique_ptr<OpApplier> applier_;
+};
+
+TEST_F(WalkSendTest, AWalksDocumentsTravelTogetherAndEachAnswerCounts) {
+  const std::string refused = share_ + "/docs/sub/f7.c";
+  daemon_.SetHandler([&](const Json::Value& request) {
+    if (!request.isMember("compound")) return FakeAnswer::Success(Json::Value(Json::arrayValue));
+    Json::Value answer(Json::objectValue);
+    answer["success"] = true;
+    answer["has_fail"] = false;
+    for (const Json::Value& element : request["compound"]) {
+      Json::Value sub(Json::objectValue);
+      sub["success"] = element["data"]["doc_id"] != refused;
+      if (!sub["success"].asBool()) {
+        sub["error"]["code"] = elasticd::kCodeBadArgument;
+        sub["error"]["msg"] = "field of the wrong type";
+        answer["has_fail"] = true;
+      }
+      answer["data"].append(sub);
+    }
+    return FakeAnswer::Json(answer);
+  });
+  applier_->Reindex(share_ + "/docs/sub");
+  size_t requests = 0;
+  std::vector<std::string> upserted = Upserted(&requests);
+  std::sort(upserted.begin(), upserted.end());
+  std::vector<std::string> expected = {share_ + "/docs/sub"};
+  for (int i = 0; i < 20; ++i) expected.push_back(share_ + "/docs/sub/f" + std::to_string(i) + ".c");
+  std::sort(expected.begin(), expected.end());
+  EXPECT_EQ(upserted, expected);
+  EXPECT_LE(requests, expected.size());
+  const Json::Value board = progress_.Snapshot()["share"];
+  EXPECT_EQ(board["total_failed"].asUInt64(), 1u);
+  EXPECT_EQ(log_.Matching("upsert of " + refused + " skipped: code=" + std::to_string(elasticd::kCodeBadArgument)).size(),
+            1u);
+}
+
+TEST_F(WalkSendTest, AnIndexFailureInsideACompoundStopsTheWalk) {
+  daemon_.SetHandler([](const Json::Value& request) {
+    if (!request.isMember("compound")) return FakeAnswer::Success(Json::Value(Json::arrayValue));
+    Json::Value answer(Json::objectValue);
+    answer["success"] = true;
+    answer["has_fail"] = true;
+    for (Json::ArrayIndex i = 0; i < request["compound"].size(); ++i) {
+      answer["data"][i]["success"] = false;
+      answer["data"][i]["error"]["code"] = elasticd::kCodeIndexNotFound;
+      answer["data"][i]["error"]["msg"] = "No index fileindex_share";
+    }
+    return FakeAnswer::Json(answer);
+  });
+  EXPECT_EQ(testing_support::ErrorOrNone([&] { applier_->Reindex(share_ + "/docs/sub"); }).code,
+            elasticd::kCodeIndexNotFound);
+  EXPECT_EQ(progress_.Snapshot()["share"]["total_failed"].asUInt64(), 0u) << "no file is skipped for it";
+}
+
+}  // namespace
+}  // namespace fileindexd
+}  // namespace corvlumex
