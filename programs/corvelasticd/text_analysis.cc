@@ -16,11 +16,16 @@ bool IsAscii(std::string_view text) {
   return true;
 }
 
+// `text` lowered into `out`, whose buffer is reused from word to word.
+void AsciiLowerInto(std::string_view text, std::string* out) {
+  out->resize(text.size());
+  char* to = out->data();
+  for (const char c : text) *to++ = (c >= 'A' && c <= 'Z') ? static_cast<char>(c - 'A' + 'a') : c;
+}
+
 std::string AsciiLower(std::string_view text) {
-  std::string out(text);
-  for (char& c : out) {
-    if (c >= 'A' && c <= 'Z') c = static_cast<char>(c - 'A' + 'a');
-  }
+  std::string out;
+  AsciiLowerInto(text, &out);
   return out;
 }
 
@@ -101,7 +106,18 @@ void SplitRuns(std::string_view text, Kind kind, const Visit& visit) {
   if (word_start != std::string_view::npos) visit(word_start, text.size());
 }
 
+// StandardKind of the ASCII characters, looked up rather than worked out:
+// most text is ASCII, and this runs for every character.
+struct AsciiStandardKinds {
+  unsigned char kind[0x80];
+  AsciiStandardKinds() : kind() {
+    for (int32_t cp = 0; cp < 0x80; ++cp) kind[cp] = IsWordCharacter(cp) ? 1 : 0;
+  }
+};
+
 int StandardKind(int32_t cp) {
+  static const AsciiStandardKinds ascii;
+  if (cp < 0x80) return ascii.kind[cp];
   if (IsCjkCharacter(cp)) return 2;
   return IsWordCharacter(cp) ? 1 : 0;
 }
@@ -111,7 +127,20 @@ int WhitespaceKind(int32_t cp) { return IsBlank(cp) ? 0 : 1; }
 bool IsAsciiUpper(char c) { return c >= 'A' && c <= 'Z'; }
 bool IsAsciiLowerOrDigit(char c) { return (c >= 'a' && c <= 'z') || (c >= '0' && c <= '9'); }
 
-// Calls `emit(std::string)` with each folded part of a word that has parts.
+// Calls `emit` with the folded word: a std::string_view that lives only for
+// the call. An ASCII word (most words) is lowered in `buffer`, without the
+// Unicode fold, which gives the same for ASCII.
+template <typename Emit>
+void EmitFolded(std::string_view word, std::string* buffer, const Emit& emit) {
+  if (IsAscii(word)) {
+    AsciiLowerInto(word, buffer);
+  } else {
+    *buffer = Fold(word, FoldMode::kSearch);
+  }
+  emit(std::string_view(*buffer));
+}
+
+// Calls `emit(std::string_view)` with each folded part of a word that has parts.
 template <typename Emit>
 void ForEachWordPart(std::string_view word, const Emit& emit) {
   std::vector<std::string_view> parts;  // allocated only for a word that has parts
@@ -140,7 +169,8 @@ void ForEachWordPart(std::string_view word, const Emit& emit) {
   }
   if (!split) return;  // a plain word
   if (start < word.size()) parts.push_back(word.substr(start));
-  for (const std::string_view part : parts) emit(Fold(part, FoldMode::kSearch));
+  std::string folded;
+  for (const std::string_view part : parts) EmitFolded(part, &folded, emit);
 }
 
 }  // namespace
@@ -202,9 +232,10 @@ void ForEachToken(Analyzer analyzer, std::string_view text, const Emit& emit) {
   }
   // Words are found before folding: the case of the letters marks where a
   // camelCase word's parts meet.
+  std::string folded;
   SplitRuns(text, StandardKind, [&](size_t begin, size_t end) {
     const std::string_view word = text.substr(begin, end - begin);
-    emit(Fold(word, FoldMode::kSearch));
+    EmitFolded(word, &folded, emit);
     ForEachWordPart(word, emit);
   });
 }
@@ -212,7 +243,7 @@ void ForEachToken(Analyzer analyzer, std::string_view text, const Emit& emit) {
 }  // namespace
 
 void AddWordParts(std::string_view word, std::vector<std::string>* tokens) {
-  ForEachWordPart(word, [tokens](std::string part) { tokens->push_back(std::move(part)); });
+  ForEachWordPart(word, [tokens](std::string_view part) { tokens->emplace_back(part); });
 }
 
 void Analyze(Analyzer analyzer, std::string_view text, std::vector<std::string>* tokens) {
