@@ -42,10 +42,26 @@ bool IsCjkCharacter(int32_t cp) {
          (cp >= 0x20000 && cp <= 0x3134F);    // CJK extensions B..G
 }
 
+// Which ASCII characters are word characters (1) or not (0), looked up
+// rather than worked out: most text is ASCII, and this runs for every
+// character. Its letters, digits and '_' are its only characters of the
+// categories IsWordCharacter takes.
+struct AsciiKinds {
+  unsigned char kind[0x80];
+};
+
+constexpr AsciiKinds MakeAsciiStandardKinds() {
+  AsciiKinds kinds{};
+  for (int cp = 0; cp < 0x80; ++cp) {
+    kinds.kind[cp] = cp == '_' || (cp >= '0' && cp <= '9') || ((cp | 0x20) >= 'a' && (cp | 0x20) <= 'z') ? 1 : 0;
+  }
+  return kinds;
+}
+
+constexpr AsciiKinds kAsciiStandardKinds = MakeAsciiStandardKinds();
+
 bool IsWordCharacter(int32_t cp) {
-  // ASCII, most of any text, without the table: its letters and digits are
-  // its only characters of the categories below.
-  if (cp < 0x80) return cp == '_' || (cp >= '0' && cp <= '9') || ((cp | 0x20) >= 'a' && (cp | 0x20) <= 'z');
+  if (cp < 0x80) return kAsciiStandardKinds.kind[cp] != 0;
   switch (utf8proc_category(cp)) {
     case UTF8PROC_CATEGORY_LU: case UTF8PROC_CATEGORY_LL: case UTF8PROC_CATEGORY_LT:
     case UTF8PROC_CATEGORY_LM: case UTF8PROC_CATEGORY_LO:
@@ -91,7 +107,14 @@ void SplitRuns(std::string_view text, Kind kind, const Visit& visit) {
   size_t word_start = std::string_view::npos;
   while (pos < text.size()) {
     const size_t here = pos;
-    const int32_t cp = NextCodePoint(text, &pos);
+    // ASCII, most characters, without the call.
+    const auto byte = static_cast<unsigned char>(text[pos]);
+    int32_t cp = byte;
+    if (byte < 0x80) {
+      ++pos;
+    } else {
+      cp = NextCodePoint(text, &pos);
+    }
     const int k = cp < 0 ? 1 : kind(cp);
     if (k == 1) {
       if (word_start == std::string_view::npos) word_start = here;
@@ -106,18 +129,9 @@ void SplitRuns(std::string_view text, Kind kind, const Visit& visit) {
   if (word_start != std::string_view::npos) visit(word_start, text.size());
 }
 
-// StandardKind of the ASCII characters, looked up rather than worked out:
-// most text is ASCII, and this runs for every character.
-struct AsciiStandardKinds {
-  unsigned char kind[0x80];
-  AsciiStandardKinds() : kind() {
-    for (int32_t cp = 0; cp < 0x80; ++cp) kind[cp] = IsWordCharacter(cp) ? 1 : 0;
-  }
-};
 
-int StandardKind(int32_t cp) {
-  static const AsciiStandardKinds ascii;
-  if (cp < 0x80) return ascii.kind[cp];
+inline int StandardKind(int32_t cp) {
+  if (cp < 0x80) return kAsciiStandardKinds.kind[cp];
   if (IsCjkCharacter(cp)) return 2;
   return IsWordCharacter(cp) ? 1 : 0;
 }
