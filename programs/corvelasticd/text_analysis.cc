@@ -16,16 +16,19 @@ bool IsAscii(std::string_view text) {
   return true;
 }
 
-// `text` lowered into `out`, whose buffer is reused from word to word.
-void AsciiLowerInto(std::string_view text, std::string* out) {
-  out->resize(text.size());
-  char* to = out->data();
-  for (const char c : text) *to++ = (c >= 'A' && c <= 'Z') ? static_cast<char>(c - 'A' + 'a') : c;
+// Lowers the ASCII letters of `text` in place; true when all of it is ASCII.
+bool LowerAscii(std::string* text) {
+  unsigned char bits = 0;
+  for (char& c : *text) {
+    bits |= static_cast<unsigned char>(c);
+    if (c >= 'A' && c <= 'Z') c = static_cast<char>(c - 'A' + 'a');
+  }
+  return bits < 0x80;
 }
 
 std::string AsciiLower(std::string_view text) {
-  std::string out;
-  AsciiLowerInto(text, &out);
+  std::string out(text);
+  LowerAscii(&out);
   return out;
 }
 
@@ -146,18 +149,15 @@ bool IsAsciiLowerOrDigit(char c) { return (c >= 'a' && c <= 'z') || (c >= '0' &&
 // Unicode fold, which gives the same for ASCII.
 template <typename Emit>
 void EmitFolded(std::string_view word, std::string* buffer, const Emit& emit) {
-  if (IsAscii(word)) {
-    AsciiLowerInto(word, buffer);
-  } else {
-    *buffer = Fold(word, FoldMode::kSearch);
-  }
+  buffer->assign(word.data(), word.size());
+  if (!LowerAscii(buffer)) *buffer = Fold(word, FoldMode::kSearch);
   emit(std::string_view(*buffer));
 }
 
-// Calls `emit(std::string_view)` with each folded part of a word that has parts.
+// Calls `emit(std::string_view)` with each folded part of a word that has
+// parts, in order, as each is found; `buffer` holds the folded part.
 template <typename Emit>
-void ForEachWordPart(std::string_view word, const Emit& emit) {
-  std::vector<std::string_view> parts;  // allocated only for a word that has parts
+void ForEachWordPart(std::string_view word, std::string* buffer, const Emit& emit) {
   bool split = false;
   size_t start = 0;
   for (size_t i = 0; i < word.size(); ++i) {
@@ -177,14 +177,11 @@ void ForEachWordPart(std::string_view word, const Emit& emit) {
     }
     if (skip || cut_before) {
       split = true;
-      if (i > start) parts.push_back(word.substr(start, i - start));
+      if (i > start) EmitFolded(word.substr(start, i - start), buffer, emit);
       start = skip ? i + 1 : i;
     }
   }
-  if (!split) return;  // a plain word
-  if (start < word.size()) parts.push_back(word.substr(start));
-  std::string folded;
-  for (const std::string_view part : parts) EmitFolded(part, &folded, emit);
+  if (split && start < word.size()) EmitFolded(word.substr(start), buffer, emit);
 }
 
 }  // namespace
@@ -250,14 +247,15 @@ void ForEachToken(Analyzer analyzer, std::string_view text, const Emit& emit) {
   SplitRuns(text, StandardKind, [&](size_t begin, size_t end) {
     const std::string_view word = text.substr(begin, end - begin);
     EmitFolded(word, &folded, emit);
-    ForEachWordPart(word, emit);
+    ForEachWordPart(word, &folded, emit);
   });
 }
 
 }  // namespace
 
 void AddWordParts(std::string_view word, std::vector<std::string>* tokens) {
-  ForEachWordPart(word, [tokens](std::string_view part) { tokens->emplace_back(part); });
+  std::string folded;
+  ForEachWordPart(word, &folded, [tokens](std::string_view part) { tokens->emplace_back(part); });
 }
 
 void Analyze(Analyzer analyzer, std::string_view text, std::vector<std::string>* tokens) {
