@@ -443,7 +443,7 @@ void IndexStore::Upsert(const std::string& doc_id, const Json::Value& input) {
     if (FindRow(key, &row)) {
       IndexEntries(row.rowid, DecodeDocument(key, row.stored), true);
       Statement& update = writer_->Cached("UPDATE docs SET doc = ? WHERE rowid = ?");
-      update.BindBlob(1, stored);
+      update.BindBlobInPlace(1, stored);  // `stored` outlives the reset below
       update.Bind(2, row.rowid);
       update.Step();
       update.Reset();
@@ -453,7 +453,7 @@ void IndexStore::Upsert(const std::string& doc_id, const Json::Value& input) {
     } else {
       Statement& insert = writer_->Cached("INSERT INTO docs(key, doc) VALUES(?, ?)");
       insert.BindText(1, key);
-      insert.BindBlob(2, stored);
+      insert.BindBlobInPlace(2, stored);  // `stored` outlives the reset below
       insert.Step();
       insert.Reset();
       transaction_bytes_ += static_cast<int64_t>(key.size() + stored.size());
