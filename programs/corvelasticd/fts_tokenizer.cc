@@ -1,5 +1,6 @@
 #include "programs/corvelasticd/fts_tokenizer.h"
 
+#include <cstring>
 #include <string>
 
 #include "programs/corvelasticd/daemon_error.h"
@@ -20,17 +21,19 @@ void BlankDelete(Fts5Tokenizer*) {}
 
 int BlankTokenize(Fts5Tokenizer*, void* context, int, const char* text, int length,
                   int (*emit)(void*, int, const char*, int, int, int)) {
-  int start = -1;
-  for (int i = 0; i <= length; ++i) {
-    if (i == length || text[i] == ' ') {
-      if (start >= 0) {
-        const int rc = emit(context, 0, text + start, i - start, start, i);
-        if (rc != SQLITE_OK) return rc;
-        start = -1;
-      }
-    } else if (start < 0) {
-      start = i;
+  // The runs between blanks; memchr finds the next blank faster than a
+  // loop over the characters of a megabyte text.
+  int start = 0;
+  while (start < length) {
+    if (text[start] == ' ') {
+      ++start;
+      continue;
     }
+    const void* blank = memchr(text + start, ' ', static_cast<size_t>(length - start));
+    const int end = blank != nullptr ? static_cast<int>(static_cast<const char*>(blank) - text) : length;
+    const int rc = emit(context, 0, text + start, end - start, start, end);
+    if (rc != SQLITE_OK) return rc;
+    start = end;
   }
   return SQLITE_OK;
 }

@@ -51,7 +51,18 @@ void ForEachValue(const Json::Value& value, Visit visit) {
   }
 }
 
-std::string ValueText(const Json::Value& value) { return value.isString() ? value.asString() : value.asString(); }
+// Calls `use` with a value's text: a string's own bytes (a content field
+// may be megabytes: not copied), another scalar's text form.
+template <typename Use>
+void WithValueText(const Json::Value& value, Use use) {
+  const char* begin = nullptr;
+  const char* end = nullptr;
+  if (value.isString() && value.getString(&begin, &end)) {
+    use(std::string_view(begin, static_cast<size_t>(end - begin)));
+  } else {
+    use(std::string_view(value.asString()));
+  }
+}
 
 // The next candidates, as many as one access check takes, with their rows;
 // false when the candidates ran out.
@@ -272,7 +283,9 @@ void IndexStore::IndexEntries(int64_t rowid, const Json::Value& document, bool r
   for (const FieldSpec* field : text_fields_) {
     std::string joined;
     ForEachValue(document[field->name], [&](const Json::Value& value) {
-      if (AnalyzeJoined(field->analyzer, ValueText(value), &joined)) any = true;
+      WithValueText(value, [&](std::string_view text) {
+        if (AnalyzeJoined(field->analyzer, text, &joined)) any = true;
+      });
     });
     columns.push_back(std::move(joined));
   }
@@ -283,7 +296,7 @@ void IndexStore::IndexEntries(int64_t rowid, const Json::Value& document, bool r
     std::string names;
     ForEachValue(document[field->name], [&](const Json::Value& value) {
       if (!names.empty()) names += '\n';
-      names += Fold(ValueText(value), FoldMode::kSearch);
+      WithValueText(value, [&](std::string_view text) { names += Fold(text, FoldMode::kSearch); });
     });
     any = any || !names.empty();
     columns.push_back(names);
@@ -430,7 +443,7 @@ void IndexStore::Upsert(const std::string& doc_id, const Json::Value& input) {
     if (FindRow(key, &row)) {
       IndexEntries(row.rowid, DecodeDocument(key, row.stored), true);
       Statement& update = writer_->Cached("UPDATE docs SET doc = ? WHERE rowid = ?");
-      update.BindBlob(1, stored);
+      update.BindBlobInPlace(1, stored);  // `stored` outlives the reset below
       update.Bind(2, row.rowid);
       update.Step();
       update.Reset();
@@ -440,7 +453,7 @@ void IndexStore::Upsert(const std::string& doc_id, const Json::Value& input) {
     } else {
       Statement& insert = writer_->Cached("INSERT INTO docs(key, doc) VALUES(?, ?)");
       insert.BindText(1, key);
-      insert.BindBlob(2, stored);
+      insert.BindBlobInPlace(2, stored);  // `stored` outlives the reset below
       insert.Step();
       insert.Reset();
       transaction_bytes_ += static_cast<int64_t>(key.size() + stored.size());
@@ -626,7 +639,9 @@ void IndexStore::UpdateSuggestions(const std::string& name) {
     while (scan->Step()) {
       const Json::Value document = DecodeDocument(scan->Text(0), scan->Bytes(1));
       std::vector<std::string> tokens;
-      ForEachValue(document[name], [&](const Json::Value& value) { Analyze(analyzer, ValueText(value), &tokens); });
+      ForEachValue(document[name], [&](const Json::Value& value) {
+        WithValueText(value, [&](std::string_view text) { Analyze(analyzer, text, &tokens); });
+      });
       std::sort(tokens.begin(), tokens.end());
       tokens.erase(std::unique(tokens.begin(), tokens.end()), tokens.end());
       for (const std::string& token : tokens) ++counts[token];

@@ -28,7 +28,8 @@ void PendingIndexWrites::ApplyTo(Database& db) {
   for (const Write& write : writes_) {
     Statement& stmt = db.Cached(*write.sql);
     stmt.Bind(1, write.rowid);
-    for (size_t i = 0; i < write.columns.size(); ++i) stmt.BindText(static_cast<int>(i + 2), write.columns[i]);
+    // The queue keeps the words until the statement is reset below.
+    for (size_t i = 0; i < write.columns.size(); ++i) stmt.BindTextInPlace(static_cast<int>(i + 2), write.columns[i]);
     stmt.Step();
     stmt.Reset();
   }

@@ -29,13 +29,17 @@ void Statement::Bind(int index, const SqlValue& value) {
   if (rc != SQLITE_OK) ThrowSqlite(db_, rc, "bind");
 }
 
-void Statement::BindText(int index, std::string_view text) {
-  const int rc = sqlite3_bind_text64(stmt_, index, text.data(), text.size(), SQLITE_TRANSIENT, SQLITE_UTF8);
-  if (rc != SQLITE_OK) ThrowSqlite(db_, rc, "bind");
-}
+void Statement::BindText(int index, std::string_view text) { BindBytes(index, text, true, SQLITE_TRANSIENT); }
 
-void Statement::BindBlob(int index, std::string_view bytes) {
-  const int rc = sqlite3_bind_blob64(stmt_, index, bytes.data(), bytes.size(), SQLITE_TRANSIENT);
+void Statement::BindBlob(int index, std::string_view bytes) { BindBytes(index, bytes, false, SQLITE_TRANSIENT); }
+
+void Statement::BindTextInPlace(int index, std::string_view text) { BindBytes(index, text, true, SQLITE_STATIC); }
+
+void Statement::BindBlobInPlace(int index, std::string_view bytes) { BindBytes(index, bytes, false, SQLITE_STATIC); }
+
+void Statement::BindBytes(int index, std::string_view bytes, bool text, sqlite3_destructor_type lifetime) {
+  const int rc = text ? sqlite3_bind_text64(stmt_, index, bytes.data(), bytes.size(), lifetime, SQLITE_UTF8)
+                      : sqlite3_bind_blob64(stmt_, index, bytes.data(), bytes.size(), lifetime);
   if (rc != SQLITE_OK) ThrowSqlite(db_, rc, "bind");
 }
 

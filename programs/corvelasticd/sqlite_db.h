@@ -29,6 +29,10 @@ class Statement {
   void Bind(int index, const SqlValue& value);
   void BindText(int index, std::string_view text);
   void BindBlob(int index, std::string_view bytes);
+  // Without SQLite's copy: the bytes must stay as they are until the
+  // statement is reset (a document's record and its words are megabytes).
+  void BindTextInPlace(int index, std::string_view text);
+  void BindBlobInPlace(int index, std::string_view bytes);
   // A pointer for an SQL function that asks for `type` (it must outlive the statement's run).
   void BindPointer(int index, void* pointer, const char* type);
   void BindAll(const std::vector<SqlValue>& values);
@@ -45,6 +49,9 @@ class Statement {
   std::string_view Bytes(int column) const;
 
  private:
+  // SQLITE_TRANSIENT: SQLite copies the bytes; SQLITE_STATIC: it reads ours.
+  void BindBytes(int index, std::string_view bytes, bool text, sqlite3_destructor_type lifetime);
+
   sqlite3* db_;
   sqlite3_stmt* stmt_;
   bool owned_;

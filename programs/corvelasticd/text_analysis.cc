@@ -16,11 +16,19 @@ bool IsAscii(std::string_view text) {
   return true;
 }
 
-std::string AsciiLower(std::string_view text) {
-  std::string out(text);
-  for (char& c : out) {
+// Lowers the ASCII letters of `text` in place; true when all of it is ASCII.
+bool LowerAscii(std::string* text) {
+  unsigned char bits = 0;
+  for (char& c : *text) {
+    bits |= static_cast<unsigned char>(c);
     if (c >= 'A' && c <= 'Z') c = static_cast<char>(c - 'A' + 'a');
   }
+  return bits < 0x80;
+}
+
+std::string AsciiLower(std::string_view text) {
+  std::string out(text);
+  LowerAscii(&out);
   return out;
 }
 
@@ -37,10 +45,26 @@ bool IsCjkCharacter(int32_t cp) {
          (cp >= 0x20000 && cp <= 0x3134F);    // CJK extensions B..G
 }
 
+// Which ASCII characters are word characters (1) or not (0), looked up
+// rather than worked out: most text is ASCII, and this runs for every
+// character. Its letters, digits and '_' are its only characters of the
+// categories IsWordCharacter takes.
+struct AsciiKinds {
+  unsigned char kind[0x80];
+};
+
+constexpr AsciiKinds MakeAsciiStandardKinds() {
+  AsciiKinds kinds{};
+  for (int cp = 0; cp < 0x80; ++cp) {
+    kinds.kind[cp] = cp == '_' || (cp >= '0' && cp <= '9') || ((cp | 0x20) >= 'a' && (cp | 0x20) <= 'z') ? 1 : 0;
+  }
+  return kinds;
+}
+
+constexpr AsciiKinds kAsciiStandardKinds = MakeAsciiStandardKinds();
+
 bool IsWordCharacter(int32_t cp) {
-  // ASCII, most of any text, without the table: its letters and digits are
-  // its only characters of the categories below.
-  if (cp < 0x80) return cp == '_' || (cp >= '0' && cp <= '9') || ((cp | 0x20) >= 'a' && (cp | 0x20) <= 'z');
+  if (cp < 0x80) return kAsciiStandardKinds.kind[cp] != 0;
   switch (utf8proc_category(cp)) {
     case UTF8PROC_CATEGORY_LU: case UTF8PROC_CATEGORY_LL: case UTF8PROC_CATEGORY_LT:
     case UTF8PROC_CATEGORY_LM: case UTF8PROC_CATEGORY_LO:
@@ -86,7 +110,14 @@ void SplitRuns(std::string_view text, Kind kind, const Visit& visit) {
   size_t word_start = std::string_view::npos;
   while (pos < text.size()) {
     const size_t here = pos;
-    const int32_t cp = NextCodePoint(text, &pos);
+    // ASCII, most characters, without the call.
+    const auto byte = static_cast<unsigned char>(text[pos]);
+    int32_t cp = byte;
+    if (byte < 0x80) {
+      ++pos;
+    } else {
+      cp = NextCodePoint(text, &pos);
+    }
     const int k = cp < 0 ? 1 : kind(cp);
     if (k == 1) {
       if (word_start == std::string_view::npos) word_start = here;
@@ -101,7 +132,9 @@ void SplitRuns(std::string_view text, Kind kind, const Visit& visit) {
   if (word_start != std::string_view::npos) visit(word_start, text.size());
 }
 
-int StandardKind(int32_t cp) {
+
+inline int StandardKind(int32_t cp) {
+  if (cp < 0x80) return kAsciiStandardKinds.kind[cp];
   if (IsCjkCharacter(cp)) return 2;
   return IsWordCharacter(cp) ? 1 : 0;
 }
@@ -111,10 +144,20 @@ int WhitespaceKind(int32_t cp) { return IsBlank(cp) ? 0 : 1; }
 bool IsAsciiUpper(char c) { return c >= 'A' && c <= 'Z'; }
 bool IsAsciiLowerOrDigit(char c) { return (c >= 'a' && c <= 'z') || (c >= '0' && c <= '9'); }
 
-// Calls `emit(std::string)` with each folded part of a word that has parts.
+// Calls `emit` with the folded word: a std::string_view that lives only for
+// the call. An ASCII word (most words) is lowered in `buffer`, without the
+// Unicode fold, which gives the same for ASCII.
 template <typename Emit>
-void ForEachWordPart(std::string_view word, const Emit& emit) {
-  std::vector<std::string_view> parts;  // allocated only for a word that has parts
+void EmitFolded(std::string_view word, std::string* buffer, const Emit& emit) {
+  buffer->assign(word.data(), word.size());
+  if (!LowerAscii(buffer)) *buffer = Fold(word, FoldMode::kSearch);
+  emit(std::string_view(*buffer));
+}
+
+// Calls `emit(std::string_view)` with each folded part of a word that has
+// parts, in order, as each is found; `buffer` holds the folded part.
+template <typename Emit>
+void ForEachWordPart(std::string_view word, std::string* buffer, const Emit& emit) {
   bool split = false;
   size_t start = 0;
   for (size_t i = 0; i < word.size(); ++i) {
@@ -134,13 +177,11 @@ void ForEachWordPart(std::string_view word, const Emit& emit) {
     }
     if (skip || cut_before) {
       split = true;
-      if (i > start) parts.push_back(word.substr(start, i - start));
+      if (i > start) EmitFolded(word.substr(start, i - start), buffer, emit);
       start = skip ? i + 1 : i;
     }
   }
-  if (!split) return;  // a plain word
-  if (start < word.size()) parts.push_back(word.substr(start));
-  for (const std::string_view part : parts) emit(Fold(part, FoldMode::kSearch));
+  if (split && start < word.size()) EmitFolded(word.substr(start), buffer, emit);
 }
 
 }  // namespace
@@ -202,17 +243,19 @@ void ForEachToken(Analyzer analyzer, std::string_view text, const Emit& emit) {
   }
   // Words are found before folding: the case of the letters marks where a
   // camelCase word's parts meet.
+  std::string folded;
   SplitRuns(text, StandardKind, [&](size_t begin, size_t end) {
     const std::string_view word = text.substr(begin, end - begin);
-    emit(Fold(word, FoldMode::kSearch));
-    ForEachWordPart(word, emit);
+    EmitFolded(word, &folded, emit);
+    ForEachWordPart(word, &folded, emit);
   });
 }
 
 }  // namespace
 
 void AddWordParts(std::string_view word, std::vector<std::string>* tokens) {
-  ForEachWordPart(word, [tokens](std::string part) { tokens->push_back(std::move(part)); });
+  std::string folded;
+  ForEachWordPart(word, &folded, [tokens](std::string_view part) { tokens->emplace_back(part); });
 }
 
 void Analyze(Analyzer analyzer, std::string_view text, std::vector<std::string>* tokens) {
