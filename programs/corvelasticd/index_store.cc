@@ -183,7 +183,10 @@ std::unique_ptr<IndexStore> IndexStore::Open(const std::string& directory) {
 }
 
 void IndexStore::LoadSchema() {
-  writer_->Exec("PRAGMA cache_size=-16384");
+  // 8 MiB: a first index of 16,000 files took the same CPU with half the
+  // pages cached (the kernel's page cache holds the rest), and the daemon's
+  // peak fell by about 20 MiB.
+  writer_->Exec("PRAGMA cache_size=-8192");
   LimitWriteAheadLog();
   Statement& stmt = writer_->Cached("SELECT value FROM meta WHERE name = 'mappings'");
   if (!stmt.Step() || !JsonFromString(mappings_, stmt.Text(0))) {
