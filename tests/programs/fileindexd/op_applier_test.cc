@@ -29,6 +29,7 @@ namespace fileindexd {
 namespace {
 namespace fs = std::filesystem;
 using testing_support::FakeAnswer;
+using Lines = std::vector<std::string>;
 
 class OpApplierTest : public ::testing::Test {
  protected:
@@ -64,6 +65,44 @@ class OpApplierTest : public ::testing::Test {
     return out;
   }
 
+  // The sorted paths of the upserts that reached the daemon inside
+  // compounds (a walk's documents travel so, from two threads), and how many
+  // requests carried them.
+  Lines Upserted(size_t* requests = nullptr) const {
+    Lines paths;
+    size_t compounds = 0;
+    for (const Json::Value& request : daemon_.Requests()) {
+      compounds += request.isMember("compound") ? 1 : 0;
+      for (const Json::Value& element : request["compound"]) {
+        if (element["command"] == "document_upsert_by_id") paths.push_back(element["data"]["doc_id"].asString());
+      }
+    }
+    std::sort(paths.begin(), paths.end());
+    if (requests != nullptr) *requests = compounds;
+    return paths;
+  }
+  // Answers each compound element by `element_fails` (its error, or null for
+  // success); other requests succeed.
+  void AnswerCompounds(const std::function<Json::Value(const Json::Value&)>& element_fails) {
+    daemon_.SetHandler([element_fails](const Json::Value& request) {
+      if (!request.isMember("compound")) return FakeAnswer::Success(Json::Value(Json::arrayValue));
+      Json::Value answer(Json::objectValue);
+      answer["success"] = true;
+      answer["has_fail"] = false;
+      for (const Json::Value& element : request["compound"]) {
+        Json::Value sub(Json::objectValue);
+        const Json::Value error = element_fails(element);
+        sub["success"] = error.isNull();
+        if (!error.isNull()) {
+          sub["error"] = error;
+          answer["has_fail"] = true;
+        }
+        answer["data"].append(sub);
+      }
+      return FakeAnswer::Json(answer);
+    });
+  }
+
   testing_support::Sandbox root_;
   testing_support::ScopedFakePlatform platform_;
   testing_support::LogCapture log_;
@@ -75,8 +114,6 @@ class OpApplierTest : public ::testing::Test {
   std::unique_ptr<SettleTracker> settle_;
   std::unique_ptr<OpApplier> applier_;
 };
-
-using Lines = std::vector<std::string>;
 
 // Each operation on one file: what reaches the search daemon, by what is on
 // disk and what the index answers.
@@ -266,14 +303,41 @@ TEST_F(OpApplierTest, AReindexStoresWhatChangedAndDeletesWhatIsGone) {
   ASSERT_GE(commands.size(), 3u);
   EXPECT_EQ(commands.front(), "document_get_by_query " + Docs("sub") + "/");
   EXPECT_EQ(commands.back(), "document_del_by_id " + Docs("sub/stale.c"));
-  Lines upserts;  // the walk's upserts travel in compounds, from two threads
-  for (const Json::Value& request : daemon_.Requests()) {
-    for (const Json::Value& element : request["compound"]) {
-      upserts.push_back(element["command"].asString() + " " + element["data"]["doc_id"].asString());
-    }
+  EXPECT_EQ(Upserted(), Lines({Docs("sub"), Docs("sub/new.c")}));
+}
+
+// A walk's documents travel several to a request; the answer of each counts
+// for its own file, and an index failure inside a compound stops the walk.
+TEST_F(OpApplierTest, AWalksDocumentsTravelTogetherAndEachAnswerCounts) {
+  root_.MakeDir("volume1/share/docs/sub");
+  Lines expected = {Docs("sub")};
+  for (int i = 0; i < 20; ++i) {
+    root_.WriteFile("volume1/share/docs/sub/f" + std::to_string(i) + ".c", "x");
+    expected.push_back(Docs("sub/f" + std::to_string(i) + ".c"));
   }
-  std::sort(upserts.begin(), upserts.end());
-  EXPECT_EQ(upserts, Lines({"document_upsert_by_id " + Docs("sub"), "document_upsert_by_id " + Docs("sub/new.c")}));
+  std::sort(expected.begin(), expected.end());
+  Json::Value refusal;
+  refusal["code"] = elasticd::kCodeBadArgument;
+  refusal["msg"] = "field of the wrong type";
+  AnswerCompounds([&](const Json::Value& element) {
+    return element["data"]["doc_id"] == Docs("sub/f7.c") ? refusal : Json::Value();
+  });
+  applier_->SetWalkThreads(2);
+  applier_->Reindex(Docs("sub"));
+  size_t requests = 0;
+  EXPECT_EQ(Upserted(&requests), expected);
+  EXPECT_LE(requests, expected.size());
+  EXPECT_EQ(progress_.Snapshot()["share"]["total_failed"].asUInt64(), 1u);
+  EXPECT_EQ(log_.Matching("upsert of " + Docs("sub/f7.c") + " skipped: code=" +
+                          std::to_string(elasticd::kCodeBadArgument)).size(), 1u);
+
+  Json::Value missing_index;
+  missing_index["code"] = elasticd::kCodeIndexNotFound;
+  missing_index["msg"] = "No index fileindex_share";
+  AnswerCompounds([&](const Json::Value&) { return missing_index; });
+  EXPECT_EQ(testing_support::ErrorOrNone([&] { applier_->Reindex(Docs("sub")); }).code,
+            elasticd::kCodeIndexNotFound);
+  EXPECT_EQ(progress_.Snapshot()["share"]["total_failed"].asUInt64(), 1u) << "no file is skipped for it";
 }
 
 TEST_F(OpApplierTest, OneFileFailsAloneButAnIndexFailureStopsTheBatch) {

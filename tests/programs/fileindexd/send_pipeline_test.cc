@@ -1,14 +1,14 @@
 // The walk's documents go to the search daemon on a sender thread, several to
 // a request: the queue between extraction and sending is bounded, keeps
-// order, loses nothing, and a failure of the daemon stops the walk; per file,
-// a document the daemon refuses is counted failed and the others are stored.
+// order, loses nothing, and a failure of the daemon stops the pushes. How a
+// walk counts each file's answer is in op_applier_test.cc.
 #include <gtest/gtest.h>
 
 #include <algorithm>
 #include <atomic>
 #include <chrono>
 #include <condition_variable>
-#include <filesystem>
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <stdexcept>
@@ -18,23 +18,13 @@
 
 #include "common/error.h"
 #include "fileindex/elastic/daemon_codes.h"
-#include "fileindex/state/folder_mgr.h"
 #include "programs/fileindexd/document_sender.h"
-#include "programs/fileindexd/index_rules.h"
-#include "programs/fileindexd/op_applier.h"
-#include "programs/fileindexd/progress.h"
-#include "programs/fileindexd/settle_tracker.h"
 #include "tests/fileindex/elastic/fake_search_daemon.h"
-#include "tests/support/fake_platform.h"
-#include "tests/support/log_capture.h"
-#include "tests/support/sandbox.h"
 
 namespace corvlumex {
 namespace fileindexd {
 namespace {
-namespace fs = std::filesystem;
 using Document = DocumentSender::Document;
-using testing_support::FakeAnswer;
 
 // Polls `done` for up to 30 s.
 bool Eventually(const std::function<bool()>& done) {
@@ -153,105 +143,6 @@ TEST(DocumentSenderTest, AFailedSendStopsThePushesAndTheFinish) {
   EXPECT_EQ(refused, elasticd::kCodeIndexNotFound);
   EXPECT_EQ(code_of([&] { sender.Finish(); }), elasticd::kCodeIndexNotFound);
   EXPECT_EQ(calls, 2) << "nothing is sent after a failure";
-}
-
-// A folder walk against a scripted search daemon: its documents travel as
-// compounds, and the answer of each element counts.
-class WalkSendTest : public ::testing::Test {
- protected:
-  void SetUp() override {
-    platform_->ParseFileHook = [](const std::string& path, const Json::Value&, Json::Value& document) {
-      document["CORVMDPath"] = path;
-      document["CORVMDFSName"] = fs::path(path).filename().string();
-    };
-    share_ = root_.AddShare("share");
-    root_.MakeDir("volume1/share/docs/sub");
-    for (int i = 0; i < 20; ++i) root_.WriteFile("volume1/share/docs/sub/f" + std::to_string(i) + ".c", "x");
-    root_.WriteFile("var/packages/CorvLumex/etc/fileindex.folders",
-                    R"([{"path": "/share/docs", "name": "docs", "document": true, "audio": true, "video": true, "photo": true}])");
-    folders_ = std::make_unique<fileindex::FolderMgr>();
-    rules_ = std::make_unique<IndexRules>(*folders_, share_);
-    settle_ = std::make_unique<SettleTracker>(root_.path() + "/settle", SettleOptions());
-    applier_ = std::make_unique<OpApplier>("share", *rules_, progress_, *settle_);
-    applier_->SetWalkThreads(2);
-  }
-
-  // The paths of the upserts the daemon received, and how many requests carried them.
-  std::vector<std::string> Upserted(size_t* requests) const {
-    std::vector<std::string> paths;
-    *requests = 0;
-    for (const Json::Value& request : daemon_.Requests()) {
-      if (!request.isMember("compound")) continue;
-      ++*requests;
-      for (const Json::Value& element : request["compound"]) {
-        if (element["command"] == "document_upsert_by_id") paths.push_back(element["data"]["doc_id"].asString());
-      }
-    }
-    return paths;
-  }
-
-  testing_support::Sandbox root_;
-  testing_support::ScopedFakePlatform platform_;
-  testing_support::LogCapture log_;
-  testing_support::FakeSearchDaemon daemon_;
-  std::string share_;
-  std::unique_ptr<fileindex::FolderMgr> folders_;
-  std::unique_ptr<IndexRules> rules_;
-  ProgressBoard progress_;
-  std::unique_ptr<SettleTracker> settle_;
-  std::unique_ptr<OpApplier> applier_;
-};
-
-TEST_F(WalkSendTest, AWalksDocumentsTravelTogetherAndEachAnswerCounts) {
-  const std::string refused = share_ + "/docs/sub/f7.c";
-  daemon_.SetHandler([&](const Json::Value& request) {
-    if (!request.isMember("compound")) return FakeAnswer::Success(Json::Value(Json::arrayValue));
-    Json::Value answer(Json::objectValue);
-    answer["success"] = true;
-    answer["has_fail"] = false;
-    for (const Json::Value& element : request["compound"]) {
-      Json::Value sub(Json::objectValue);
-      sub["success"] = element["data"]["doc_id"] != refused;
-      if (!sub["success"].asBool()) {
-        sub["error"]["code"] = elasticd::kCodeBadArgument;
-        sub["error"]["msg"] = "field of the wrong type";
-        answer["has_fail"] = true;
-      }
-      answer["data"].append(sub);
-    }
-    return FakeAnswer::Json(answer);
-  });
-  applier_->Reindex(share_ + "/docs/sub");
-  size_t requests = 0;
-  std::vector<std::string> upserted = Upserted(&requests);
-  std::sort(upserted.begin(), upserted.end());
-  std::vector<std::string> expected = {share_ + "/docs/sub"};
-  for (int i = 0; i < 20; ++i) expected.push_back(share_ + "/docs/sub/f" + std::to_string(i) + ".c");
-  std::sort(expected.begin(), expected.end());
-  EXPECT_EQ(upserted, expected);
-  EXPECT_LE(requests, expected.size());
-  const Json::Value board = progress_.Snapshot()["share"];
-  EXPECT_EQ(board["total_failed"].asUInt64(), 1u);
-  EXPECT_EQ(log_.Matching("upsert of " + refused + " skipped: code=" + std::to_string(elasticd::kCodeBadArgument)).size(),
-            1u);
-}
-
-TEST_F(WalkSendTest, AnIndexFailureInsideACompoundStopsTheWalk) {
-  daemon_.SetHandler([](const Json::Value& request) {
-    if (!request.isMember("compound")) return FakeAnswer::Success(Json::Value(Json::arrayValue));
-    Json::Value answer(Json::objectValue);
-    answer["success"] = true;
-    answer["has_fail"] = true;
-    for (Json::ArrayIndex i = 0; i < request["compound"].size(); ++i) {
-      answer["data"][i]["success"] = false;
-      answer["data"][i]["error"]["code"] = elasticd::kCodeIndexNotFound;
-      answer["data"][i]["error"]["msg"] = "No index fileindex_share";
-    }
-    return FakeAnswer::Json(answer);
-  });
-  EXPECT_EQ(testing_support::ErrorOrNone([&] { applier_->Reindex(share_ + "/docs/sub"); }).code,
-            elasticd::kCodeIndexNotFound);
-  EXPECT_EQ(progress_.Snapshot()["share"]["total_failed"].asUInt64(), 0u) << "no file is skipped for it";
 }
 
 }  // namespace
