@@ -5,10 +5,13 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <atomic>
+#include <chrono>
 #include <filesystem>
 #include <fstream>
 #include <functional>
 #include <memory>
+#include <thread>
 
 #include "common/error.h"
 #include "fileindex/elastic/daemon_codes.h"
@@ -16,7 +19,10 @@
 #include "fileindex/state/folder_mgr.h"
 #include "platform/linux/linux_platform.h"
 #include "tests/support/fake_platform.h"
+#include "fileindex/elastic/elastic_control.h"
+#include "fileindex/queue/custom_event.h"
 #include "programs/fileindexd/fresh_lane.h"
+#include "programs/fileindexd/share_worker.h"
 #include "programs/fileindexd/index_rules.h"
 #include "programs/fileindexd/op_applier.h"
 #include "programs/fileindexd/progress.h"
@@ -353,6 +359,56 @@ TEST_F(OpApplierTest, OneFileFailsAloneButAnIndexFailureStopsTheBatch) {
   } catch (const Error& error) {
     EXPECT_EQ(error.code, elasticd::kCodeIndexNotFound);
   }
+}
+
+// A round judges its batch by the folder settings read after it took the
+// queue over: a settings change saved (and its event queued) while the round
+// waited for the search daemon is applied with the new settings, not the old.
+TEST_F(OpApplierTest, ARoundAppliesASettingsChangeWithTheSettingsItSaved) {
+  const std::string folders_file = "var/packages/CorvLumex/etc/fileindex.folders";
+  const auto save_folder = [&](bool documents) {
+    root_.WriteFile(folders_file,
+                    std::string(R"([{"path": "/share/docs", "name": "docs", "document": )") +
+                        (documents ? "true" : "false") + R"(, "audio": true, "video": true, "photo": true}])");
+  };
+  save_folder(true);
+  root_.WriteFile("volume1/share/docs/notes.txt", "x");
+  std::atomic<int> probes{0};
+  daemon_.SetHandler([&](const Json::Value& request) {
+    if (request["command"] != "index_list") return testing_support::AnswerSuccess(request);
+    Json::Value opening(Json::arrayValue);
+    if (probes++ == 0) {
+      // What `folder set --document off` does, while the round waits.
+      save_folder(false);
+      Json::Value changed;
+      changed["document"] = true;
+      fileindex::AddCustomEvent(fileindex::kEventUpdateCfg, share_ + "/docs", "", changed);
+      opening[0]["id"] = fileindex::elastic::GetFileIndexID("share");
+      opening[0]["state"] = "opening";
+    }
+    return FakeAnswer::Success(opening);
+  });
+  PauseState pause;
+  WorkerOptions options;
+  options.reconnect_probe = std::chrono::milliseconds(10);
+  ShareWorker worker("share", options, pause, progress_);
+  worker.Start();
+  const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(30);
+  const auto sent_for_notes = [&] {
+    for (const std::string& line : Sent()) {
+      if (line.find(Docs("notes.txt")) != std::string::npos) return line;
+    }
+    for (const std::string& path : Upserted()) {
+      if (path == Docs("notes.txt")) return "document_upsert_by_id " + path;
+    }
+    return std::string();
+  };
+  while (sent_for_notes().empty() && std::chrono::steady_clock::now() < deadline) {
+    std::this_thread::sleep_for(std::chrono::milliseconds(10));
+  }
+  worker.Stop();
+  EXPECT_EQ(sent_for_notes(), "document_del_by_id " + Docs("notes.txt"))
+      << "requests: " << ::testing::PrintToString(Sent());
 }
 
 }  // namespace
