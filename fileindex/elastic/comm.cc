@@ -133,12 +133,11 @@ void SendRequestImpl(Json::Value& res, const Json::Value& req) {
   const std::string text = JsonToString(req);
   const std::vector<std::string_view> parts = {text};
   SendRequestImpl(res, parts);
-  const Json::Value& answer = res;
-  if (!CompoundHasFailure(req, answer)) return;
+  if (!CompoundHasFailure(req, res)) return;
 
   // A busy sub-request fails the whole request, so that it is sent again;
   // any other failed sub-request is only logged.
-  const Json::Value outcomes = CompoundOutcomes(answer, answer["data"].size());
+  const Json::Value outcomes = CompoundOutcomes(res, res["data"].size());
   const Json::Value& requests = req["compound"];
   for (Json::ArrayIndex i = 0; i < outcomes.size(); ++i) {
     if (outcomes[i]["success"].asBool()) continue;

@@ -132,7 +132,6 @@ void SplitRuns(std::string_view text, Kind kind, const Visit& visit) {
   if (word_start != std::string_view::npos) visit(word_start, text.size());
 }
 
-
 inline int StandardKind(int32_t cp) {
   if (cp < 0x80) return kAsciiStandardKinds.kind[cp];
   if (IsCjkCharacter(cp)) return 2;
